@@ -1,0 +1,257 @@
+// Worker step: runs the external archiver on the staged list, follows its output into the task's
+// progress and into error items, and fixes the new archive's mode, owner and index entry.
+#include <syslog.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+
+#include "compress/KAVO.Zantro.Compress.h"
+#include "compress/error_codes.h"
+#include "compress/task_record.h"
+#include "platform/klib/system.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Zantro {
+
+namespace {
+
+constexpr char kArchiverProgram[] = "/usr/bin/7z";
+constexpr char kDefaultCommand[] = "a";  // for a request without "mode"
+constexpr std::size_t kArgumentsMax = 32;
+constexpr std::size_t kArchivePathSize = 4095;  // bytes; a longer path is cut to fit
+constexpr std::uint32_t kArchiveMode = 0666;
+constexpr std::uint32_t kNoSavedMask = static_cast<std::uint32_t>(-1);
+constexpr int kIndexSingleFile = 1;
+constexpr int kByPath = -1;  // instead of by descriptor
+
+// The archiver's arguments, null-terminated, each a copy of its own.
+class ArgumentVector {
+ public:
+  ArgumentVector() = default;
+  ~ArgumentVector() {
+    for (char* argument : arguments_) {
+      std::free(argument);
+    }
+  }
+  ArgumentVector(const ArgumentVector&) = delete;
+  ArgumentVector& operator=(const ArgumentVector&) = delete;
+
+  void Add(const std::string& argument) { arguments_.at(count_++) = strdup(argument.c_str()); }
+  char* const* Get() const { return arguments_.data(); }
+
+ private:
+  std::array<char*, kArgumentsMax> arguments_{};
+  std::size_t count_ = 0;
+};
+
+void AddArguments(const _tag_CompressInfo_& info, const char* archive_path,
+                  ArgumentVector& arguments) {
+  arguments.Add(kArchiverProgram);
+  arguments.Add(info.command.empty() ? kDefaultCommand : info.command);
+  arguments.Add("-utf16");
+  arguments.Add(archive_path);
+  arguments.Add(info.update_switch);  // these two also when empty
+  arguments.Add(info.level_switch);
+  if (!info.is7z) {
+    arguments.Add("-lang" + info.codepage);
+  }
+  if (!info.password.empty()) {
+    arguments.Add("-p" + info.password);
+  }
+  arguments.Add("-xr!@eaDir");  // the device's metadata directories
+  arguments.Add("@" + info.list_file);
+  arguments.Add("-progress");
+}
+
+// Removes the list file at the end of the run, however it ends.
+class ListFileOwner {
+ public:
+  explicit ListFileOwner(const std::string& path) : path_(path) {}
+  ~ListFileOwner() {
+    if (!path_.empty()) {
+      unlink(path_.c_str());
+    }
+  }
+  ListFileOwner(const ListFileOwner&) = delete;
+  ListFileOwner& operator=(const ListFileOwner&) = delete;
+
+ private:
+  const std::string& path_;
+};
+
+struct StreamCloser {
+  // The exit status is not looked at: failures stand in the output.
+  void operator()(FILE* stream) const { KLIBCPclose(stream); }
+};
+
+int NameTooLongCode(const std::string& dest_path) {
+  bool is_encrypted = false;
+  if (LumoLibCheckEncryptShare(dest_path, &is_encrypted) == 0) {
+    syslog(LOG_ERR, "%s:%d Failed to get share info for %s", kLogSource, __LINE__,
+           dest_path.c_str());
+    return kErrNameTooLong;
+  }
+  return is_encrypted ? kErrNameTooLongCrypt : kErrNameTooLong;
+}
+
+// A line buffer as getline grows it.
+struct LineBuffer {
+  LineBuffer() = default;
+  ~LineBuffer() { std::free(text); }
+  LineBuffer(const LineBuffer&) = delete;
+  LineBuffer& operator=(const LineBuffer&) = delete;
+
+  char* text = nullptr;
+  std::size_t size = 0;
+};
+
+}  // namespace
+
+bool ZantroCompressHandler::LumoCompressFiles(const _tag_CompressInfo_& info, const char* user) {
+  const ListFileOwner list_file(info.list_file);
+  char archive_path[kArchivePathSize] = {};
+  ArgumentVector arguments;
+  std::unique_ptr<FILE, StreamCloser> output;
+  bool succeeded = false;
+
+  if (PrepareArchiver(info, user, archive_path)) {
+    AddArguments(info, archive_path, arguments);
+    output.reset(KLIBCPopenv(kArchiverProgram, "r", arguments.Get(), 0));
+    if (output == nullptr) {
+      syslog(LOG_ERR, "%s:%d KLIBCPopenv failed", kLogSource, __LINE__);
+      SetErrItem(info.dest_path, kErrGeneral);
+    } else if (FollowArchiver(info, output.get())) {
+      SetArchiveMode(archive_path);
+      succeeded = true;
+    }
+  }
+  if (access(archive_path, F_OK) == 0) {
+    SetArchiveOwner(archive_path, user, info.dest_path);
+    KLIBKavoIndexAdd(archive_path, kIndexSingleFile);
+  }
+  return succeeded;
+}
+
+// Fills in the archive's full path and goes to the directory that the list is relative to.
+bool ZantroCompressHandler::PrepareArchiver(const _tag_CompressInfo_& info, const char* user,
+                                            char* archive_path) {
+  PathInfo archive;
+  if (PathInfoFactory::create(user, info.dest_path, archive) == 0) {
+    syslog(LOG_ERR, "%s:%d Failed to get path info:%s, reason=[%X]", kLogSource, __LINE__,
+           info.dest_path.c_str(), static_cast<unsigned int>(LumoLibGetErr()));
+    SetErrItem(info.dest_path, LumoLibGetErr());
+    return false;
+  }
+  VolumeInfo volume = {};
+  if (VolumePathParse(archive.volume_path.c_str(), &volume) < 0) {
+    syslog(LOG_ERR, "%s:%d Failed to get volume info, %s", kLogSource, __LINE__,
+           archive.volume_path.c_str());
+    SetErrItem(archive.volume_path, kErrGeneral);
+    return false;
+  }
+  if (chdir(info.work_dir.c_str()) == -1) {
+    const int error = errno;
+    syslog(LOG_ERR, "%s:%d Failed to chdir, reason=%s(%d)", kLogSource, __LINE__,
+           std::strerror(error), error);
+    SetErrItem(info.work_dir, LumoParseErrnoToError(error, nullptr, nullptr));
+    return false;
+  }
+  std::snprintf(archive_path, kArchivePathSize, "%s", archive.real_path.c_str());
+  return true;
+}
+
+// Reads to the end of the output, or to the first error line. A read error counts as the end.
+bool ZantroCompressHandler::FollowArchiver(const _tag_CompressInfo_& info, FILE* output) {
+  std::string current_file;
+  std::uint64_t total_size = 0;
+  LineBuffer line;
+  ssize_t length = 0;
+  while ((length = getline(&line.text, &line.size, output)) != -1) {
+    const ArchiverEvent event = ParseArchiverLine({line.text, static_cast<std::size_t>(length)});
+    switch (event.kind) {
+      case ArchiverEvent::kTotal:
+        total_size = event.total_size;
+        WriteTaskProgress("", 0, total_size);
+        break;
+      case ArchiverEvent::kFile:
+        current_file = event.file;
+        break;
+      case ArchiverEvent::kProgress:
+        WriteTaskProgress(current_file, event.progress, total_size);
+        break;
+      case ArchiverEvent::kError:
+        RecordArchiverError(event.error, line.text, info.dest_path);
+        return false;
+      case ArchiverEvent::kOther:
+        break;
+    }
+  }
+  return true;
+}
+
+void ZantroCompressHandler::RecordArchiverError(ArchiverError error, const char* line,
+                                                const std::string& dest_path) {
+  switch (error) {
+    case ArchiverError::kNoSpace:
+      return SetErrItem(dest_path, kErrNoSpace);
+    case ArchiverError::kQuota:
+      return SetErrItem(dest_path, kErrQuota);
+    case ArchiverError::kReadOnly:
+      return SetErrItem(dest_path, kErrReadOnly);
+    case ArchiverError::kNameTooLong:
+      return SetErrItem(dest_path, NameTooLongCode(dest_path));
+    case ArchiverError::kUnknown:
+      syslog(LOG_ERR, "%s:%d %s", kLogSource, __LINE__, line);
+      return SetErrItem(dest_path, kErrGeneral);
+  }
+}
+
+void ZantroCompressHandler::SetArchiveMode(const char* archive_path) const {
+  const mode_t mode =
+      saved_umask == kNoSavedMask ? ~LumoLibGetUmask() & kArchiveMode : kArchiveMode;
+  if (KAVOFSAclChmod(archive_path, kByPath, mode) < 0) {
+    // The text says 777 whatever the mode; log readers know it so.
+    syslog(LOG_ERR, "%s:%d failed to ACL chmod '%s' to 777, errno: %m", kLogSource, __LINE__,
+           archive_path);
+  }
+}
+
+// An administrator's archive goes to the administrators' group. What fails here leaves an item but
+// no failed job.
+void ZantroCompressHandler::SetArchiveOwner(const char* archive_path, const char* user,
+                                            const std::string& dest_path) {
+  const int is_admin = KLIBGroupIsAdminGroupMem(user, 0);
+  if (is_admin == -1) {
+    syslog(LOG_ERR, "%s:%d KLIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]", kLogSource,
+           __LINE__, user, static_cast<unsigned int>(KLIBCErrGet()), KLIBCErrorGetFile(),
+           KLIBCErrorGetLine());
+    SetErrItem(dest_path, kErrTask);
+  } else if (is_admin == 1 && LumoLibChown2Admin(archive_path, user) != 0) {
+    syslog(LOG_ERR, "%s:%d LumoLibChown2Admin fail", kLogSource, __LINE__);
+    SetErrItem(dest_path, kErrTask);
+  }
+}
+
+std::string ZantroCompressHandler::LumoEscape(const char* text) {
+  constexpr std::size_t kGrowth = 3;  // each byte quoted, at the worst
+  const std::size_t size = kGrowth * std::strlen(text) + 1;
+  const std::unique_ptr<char, decltype(&std::free)> buffer(
+      static_cast<char*>(std::calloc(size, 1)), &std::free);
+  if (buffer == nullptr) {
+    syslog(LOG_ERR, "%s:%d Failed to malloc: (%d)", kLogSource, __LINE__, static_cast<int>(size));
+    return {};
+  }
+  if (KLIBCEncShParam(text, buffer.get(), size) < 0) {
+    syslog(LOG_ERR, "%s:%d Failed to escape string: %s", kLogSource, __LINE__, text);
+    return {};
+  }
+  return buffer.get();
+}
+
+}  // namespace Zantro

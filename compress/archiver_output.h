@@ -1,0 +1,29 @@
+// The lines that the archiver prints, and what they mean. No I/O.
+#ifndef COMPRESS_ARCHIVER_OUTPUT_H_
+#define COMPRESS_ARCHIVER_OUTPUT_H_
+
+#include <cstdint>
+#include <string>
+
+namespace Zantro {
+
+// Why the archiver gave up, as far as its error line tells.
+enum class ArchiverError { kNoSpace, kQuota, kReadOnly, kNameTooLong, kUnknown };
+
+struct ArchiverEvent {
+  enum Kind { kTotal, kFile, kProgress, kError, kOther };
+
+  Kind kind = kOther;
+  std::uint64_t total_size = 0;  // kTotal: bytes
+  std::string file;              // kFile
+  float progress = 0;            // kProgress: 0 to 1
+  ArchiverError error = ArchiverError::kUnknown;
+};
+
+// `line` is one line with its line feed, which the last one may lack. Throws std::out_of_range for a
+// "Compressing " line with nothing behind it, not even a line feed.
+ArchiverEvent ParseArchiverLine(const std::string& line);
+
+}  // namespace Zantro
+
+#endif  // COMPRESS_ARCHIVER_OUTPUT_H_

@@ -1,0 +1,143 @@
+// Worker steps: may the user make the archive there, and read every source?
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include <cerrno>
+
+#include "compress/KAVO.Zantro.Compress.h"
+#include "compress/error_codes.h"
+#include "compress/split_path.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Zantro {
+
+namespace {
+
+constexpr char kPathCharset[] = "UTF-8";
+constexpr int kPrivilegeWrite = 2;       // the one level that suffices for the destination
+constexpr int kFlagWriteSuspended = 0x2;
+constexpr int kCheckPathFlags = 32;
+constexpr int kAccessWrite = 2;
+constexpr int kAccessFile = 1;
+constexpr int kAccessDirectory = 5;
+
+bool IsAcceptablePath(const char* path) {
+  return LumoCheckPath(path, false, kCheckPathFlags, nullptr, true, false, nullptr) == 0;
+}
+
+}  // namespace
+
+// The first failing test ends the check, with one error item. What concerns the directory names its
+// full path in the item, all else the user's own text; deliberate.
+int ZantroCompressHandler::CheckDestPriv(const char* dest, const char* user,
+                                         const char* session_id) {
+  std::string full_path;
+  std::string home_test_path;
+  std::string unused_1;
+  std::string unused_2;
+  const std::string user_name(user);
+  if (LumoFullPathGet(dest, &full_path, &home_test_path, &unused_1, &unused_2, &user_name,
+                      kPathCharset) == 0) {
+    syslog(LOG_ERR, "%s:%d Failed to get path info: %s, err=%d", kLogSource, __LINE__, dest,
+           LumoLibGetErr());
+    SetErrItem(dest, LumoLibGetErr());
+    return 0;
+  }
+  // The user's own home needs no privilege query.
+  if (IsDirUserHome(home_test_path, nullptr) == 0 && !CheckDestShare(dest, user, session_id)) {
+    return 0;
+  }
+  return CheckDestDirectory(dest, full_path) ? 1 : 0;
+}
+
+bool ZantroCompressHandler::CheckDestShare(const char* dest, const char* user,
+                                           const char* session_id) {
+  int level = 0;
+  int flags = 0;
+  if (LumoLibGetPrivilege(dest, user, session_id, &level, &flags) != 0) {
+    syslog(LOG_ERR, "%s:%d compress dest no privilege, reason[%d]", kLogSource, __LINE__,
+           LumoLibGetErr());
+    SetErrItem(dest, LumoLibGetErr());
+    return false;
+  }
+  if (level != kPrivilegeWrite || (flags & kFlagWriteSuspended) != 0) {
+    SetErrItem(dest, kErrNoPrivilege);  // no line of its own, deliberately
+    return false;
+  }
+  return true;
+}
+
+bool ZantroCompressHandler::CheckDestDirectory(const char* dest, const std::string& full_path) {
+  const SplitPath split(full_path);
+  const char* const directory = split.Directory();
+  if (!IsAcceptablePath(directory)) {
+    syslog(LOG_ERR, "%s:%d invalid path %s, err=%d", kLogSource, __LINE__, directory,
+           LumoLibGetErr());
+    SetErrItem(directory, LumoLibGetErr());
+    return false;
+  }
+  if (ACLAccess(directory, kAccessWrite) != 0) {
+    syslog(LOG_ERR, "%s:%d Can't access %s, err=%d ", kLogSource, __LINE__, directory,
+           LumoLibGetErr());
+    SetErrItem(directory, LumoLibGetErr());
+    return false;
+  }
+  if (LumoCheckFileName(directory, split.Name()) < 0) {
+    syslog(LOG_ERR, "%s:%d Failed to check filename: path=%s file name = %s reason=[%d] ",
+           kLogSource, __LINE__, directory, split.Name(), LumoLibGetErr());
+    SetErrItem(dest, LumoLibGetErr());
+    return false;
+  }
+  return true;
+}
+
+// Every source is examined, so that the user sees all that is wrong at once.
+int ZantroCompressHandler::CheckSourcePrivilege(const _tag_CompressInfo_& info) {
+  std::map<std::string, bool> checked_shares;
+  int failed = 0;
+  for (const PathInfo& source : info.path_infos) {
+    if (!CheckSource(source, checked_shares)) {
+      ++failed;
+    }
+  }
+  return failed == 0 ? 1 : 0;
+}
+
+bool ZantroCompressHandler::CheckSource(const PathInfo& source,
+                                        std::map<std::string, bool>& checked_shares) {
+  const char* const path = source.real_path.c_str();
+  if (!IsAcceptablePath(path)) {
+    SetSourceErrItem(source, LumoLibGetErr());
+    return false;
+  }
+  // One question per shared folder; a refusal is reported but does not fail the check, deliberately,
+  // and later sources of the share are not held up by it.
+  if (checked_shares.emplace(source.share_name, true).second) {
+    const std::string session_id = request->GetSessionID();
+    if (CheckShareListPrivilege(login_user.c_str(), session_id.c_str(),
+                                source.share_path.c_str()) == 0) {
+      syslog(LOG_ERR, "%s:%d No share privilege to list path %s", kLogSource, __LINE__,
+             source.share_path.c_str());
+      SetErrItem(source.share_path, kErrNoPrivilege);
+      return true;
+    }
+  }
+  struct stat status {};
+  if (stat(path, &status) != 0) {
+    SetSourceErrItem(source, LumoParseErrnoToError(errno, nullptr, nullptr));
+    return false;
+  }
+  if (ACLAccess(path, S_ISDIR(status.st_mode) ? kAccessDirectory : kAccessFile) != 0) {
+    SetSourceErrItem(source, LumoLibGetErr());
+    return false;
+  }
+  return true;
+}
+
+void ZantroCompressHandler::SetSourceErrItem(const PathInfo& source, int code) {
+  if (code != 0) {
+    SetErrItem(source.share_path, code);
+  }
+}
+
+}  // namespace Zantro

@@ -1,0 +1,199 @@
+// Worker step: stages the list of entries to pack, and with it their names in the archive.
+//
+// Sources of one shared folder are named relative to their common parent. Sources of several shared
+// folders are named from the shared folder down, through a directory of links, so that the archive
+// holds one folder for each of them.
+//
+// While this step runs the record's dest_path is still empty, and so is the path of the error items
+// that name it; deliberate.
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <cstdlib>
+#include <map>
+#include <string>
+
+#include "compress/KAVO.Zantro.Compress.h"
+#include "compress/error_codes.h"
+#include "platform/klib/system.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Zantro {
+
+namespace {
+
+constexpr std::size_t kListLineSize = 4097;        // bytes, with the terminating zero
+constexpr std::size_t kStagedListLineSize = 4120;  // the same, for names that begin with the share
+constexpr char kRemoveProgram[] = "/bin/rm";
+constexpr unsigned int kExeclRunAndWait = 187;
+
+class FileDescriptor {
+ public:
+  explicit FileDescriptor(int fd) : fd_(fd) {}
+  ~FileDescriptor() { Close(); }
+  FileDescriptor(const FileDescriptor&) = delete;
+  FileDescriptor& operator=(const FileDescriptor&) = delete;
+
+  int Get() const { return fd_; }
+  void Close() {
+    if (fd_ > 0) {  // 0 is left open, deliberately
+      close(fd_);
+    }
+    fd_ = -1;
+  }
+
+ private:
+  int fd_;
+};
+
+// One line of the list: "." and the name, which begins with "/".
+template <std::size_t kBufferSize>
+class ListLine {
+ public:
+  explicit ListLine(const std::string& name)
+      : length_(std::snprintf(text_, kBufferSize, ".%s\n", name.c_str())),
+        is_expressible_(length_ > 0 && static_cast<std::size_t>(length_) < kBufferSize &&
+                        name.find('\n') == std::string::npos) {}
+
+  // False when the name does not fit the buffer, or holds a line feed, which ends a line.
+  bool IsExpressible() const { return is_expressible_; }
+  // False when the line was not written whole.
+  bool Write(int fd) const { return write(fd, text_, length_) == length_; }
+  const char* Text() const { return text_; }
+
+ private:
+  char text_[kBufferSize];
+  int length_;
+  bool is_expressible_;
+};
+
+void RemoveStagingDirectory(const char* directory) {
+  struct stat status {};
+  if (stat(directory, &status) == 0) {
+    KLIBCExecl(kRemoveProgram, kExeclRunAndWait, "-rf", directory, static_cast<char*>(nullptr));
+  }
+}
+
+}  // namespace
+
+bool ZantroCompressHandler::SaveZipFileListToTmp(_tag_CompressInfo_& info) {
+  std::map<std::string, bool> shares;
+  for (const PathInfo& source : info.path_infos) {
+    shares.emplace(source.share_name, true);
+  }
+  if (shares.size() >= 2) {
+    return GenerateZipListWithShare(info);
+  }
+  return GenerateZipList(info, FindCommonParent(info.src_dirs));
+}
+
+bool ZantroCompressHandler::GenerateZipList(_tag_CompressInfo_& info, const std::string& parent) {
+  char list_file[] = "/tmp/lumozipXXXXXX";
+  if (!WriteList(info, parent, list_file)) {
+    unlink(list_file);
+    return false;
+  }
+  info.work_dir = parent;
+  info.list_file = list_file;
+  return true;
+}
+
+bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std::string& parent,
+                                      char* list_file) {
+  const FileDescriptor list(mkstemp(list_file));
+  if (list.Get() == -1) {
+    syslog(LOG_ERR, "%s:%d Failed to mkstemp %s", kLogSource, __LINE__, list_file);
+    SetErrItem(info.dest_path, kErrGeneral);
+    return false;
+  }
+  for (const PathInfo& source : info.path_infos) {
+    // All of the parent but its "/", which begins the name. Throws out_of_range when the source does
+    // not lie below the parent.
+    const ListLine<kListLineSize> line(source.real_path.substr(parent.size() - 1));
+    if (!line.IsExpressible()) {
+      RefuseSource(source);
+      return false;
+    }
+    if (!line.Write(list.Get())) {
+      syslog(LOG_ERR, "%s:%d Failed to write %s to tempzip", kLogSource, __LINE__, line.Text());
+      SetErrItem(info.dest_path, kErrGeneral);
+      return false;
+    }
+  }
+  return true;
+}
+
+// On success the directory and its links are left behind, deliberately; the process stays in it.
+bool ZantroCompressHandler::GenerateZipListWithShare(_tag_CompressInfo_& info) {
+  char directory[] = "/tmp/lumozipXXXXXX";
+  if (mkdtemp(directory) == nullptr) {
+    syslog(LOG_ERR, "%s:%d Failed to create a temp directory.", kLogSource, __LINE__);
+    SetErrItem(info.dest_path, kErrGeneral);
+    return false;
+  }
+  char list_file[] = "lumozipXXXXXX";
+  if (!FillStagingDirectory(info, directory, list_file)) {
+    RemoveStagingDirectory(directory);
+    return false;
+  }
+  info.work_dir = directory;
+  info.list_file = std::string(directory) + "/" + list_file;
+  return true;
+}
+
+bool ZantroCompressHandler::FillStagingDirectory(const _tag_CompressInfo_& info,
+                                                 const char* directory, char* list_file) {
+  if (chdir(directory) != 0) {
+    syslog(LOG_ERR, "%s:%d Failed to chdir %s.", kLogSource, __LINE__, directory);
+    SetErrItem(info.dest_path, kErrGeneral);
+    return false;
+  }
+  const FileDescriptor list(mkstemp(list_file));
+  if (list.Get() < 0) {
+    syslog(LOG_ERR, "%s:%d Failed to create a temp file.", kLogSource, __LINE__);
+    SetErrItem(info.dest_path, kErrGeneral);
+    return false;
+  }
+  for (const PathInfo& source : info.path_infos) {
+    if (!LinkShare(source)) {
+      return false;
+    }
+    const ListLine<kStagedListLineSize> line(source.share_path);
+    if (!line.IsExpressible()) {
+      RefuseSource(source);
+      return false;
+    }
+    if (!line.Write(list.Get())) {
+      syslog(LOG_ERR, "%s:%d Failed to write tempzip", kLogSource, __LINE__);
+      SetErrItem(info.dest_path, kErrGeneral);
+      return false;
+    }
+  }
+  return true;
+}
+
+// Links the source's shared folder into the current directory, once for all of its sources.
+bool ZantroCompressHandler::LinkShare(const PathInfo& source) {
+  const char* const target = source.share_real_path.c_str();
+  const char* const link = source.share_name.c_str();
+  struct stat status {};
+  if (lstat(link, &status) == 0 || symlink(target, link) == 0) {
+    return true;
+  }
+  const int error = errno;
+  syslog(LOG_ERR, "%s:%d Failed to link the file from %s to %s.", kLogSource, __LINE__, target,
+         link);
+  SetErrItem(source.share_real_path, LumoParseErrnoToError(error, nullptr, nullptr));
+  return false;
+}
+
+void ZantroCompressHandler::RefuseSource(const PathInfo& source) {
+  syslog(LOG_ERR, "%s:%d Name is too long for tempzip or holds a line feed: %s", kLogSource,
+         __LINE__, source.share_path.c_str());
+  SetErrItem(source.share_path, kErrGeneral);
+}
+
+}  // namespace Zantro

@@ -1,0 +1,67 @@
+// Method "status": how far a task has got. The answer that reports a task finished removes it, so it
+// is reported once.
+#include <syslog.h>
+
+#include <optional>
+
+#include "compress/KAVO.Zantro.Compress.h"
+#include "compress/error_codes.h"
+#include "compress/task_record.h"
+
+namespace Zantro {
+
+namespace {
+
+constexpr char kAnswerFinished[] = "finished";
+
+Json::Value MakeAnswer(const Json::Value& data) {
+  Json::Value answer(Json::objectValue);
+  if (data.isMember(kDataParams)) {
+    answer[kParamDest] = data.get(kDataParams, Json::Value(Json::objectValue))
+                             .get(kParamDest, "")
+                             .asString();
+  }
+  if (data.isMember(kDataErrors)) {
+    // Errors alone decide: the worker may have failed to mark the task finished.
+    answer[kAnswerFinished] = true;
+    answer[kDataErrors] = data[kDataErrors];
+  } else {
+    answer[kPropProgress] = pTask->getDoubleProperty(kPropProgress, 0);
+    answer[kAnswerFinished] = pTask->isFinished();
+  }
+  return answer;
+}
+
+}  // namespace
+
+void ZantroCompressHandler::LumoProgressHandler() {
+  std::optional<Vesk::TaskMgr> task_manager;  // outlives the removal
+  const Json::Value data = ReportProgress(task_manager);
+  // On every path, deliberately: after an error there may be no task, and the call takes null.
+  LumoLibRemoveFinishedTask(pTask, data.get(kDataPid, -1).asInt(), false);
+}
+
+Json::Value ZantroCompressHandler::ReportProgress(std::optional<Vesk::TaskMgr>& task_manager) {
+  if (!request->HasParam(kParamTaskId)) {
+    SetError(kErrBadParameter);
+    return {};
+  }
+  task_manager.emplace(login_user.c_str());
+  const std::string task_id = request->GetParam(kParamTaskId, "").asString();
+  try {
+    pTask = task_manager->getTaskWithThrow(task_id.c_str());
+  } catch (...) {
+    SetError(kErrNoTask);
+    return {};
+  }
+  Json::Value data = pTask->getProperty(kPropData);
+  if (data.isNull()) {
+    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
+    SetError(kErrTask);
+    return data;
+  }
+  SetResponse(MakeAnswer(data));
+  return data;
+}
+
+}  // namespace Zantro

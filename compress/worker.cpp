@@ -1,0 +1,152 @@
+// The background worker: takes on the user's identity, runs the job's steps, writes the outcome into
+// the task, notifies the desktop and leaves. It never returns into the host and never answers a
+// request; all that it has to say goes into the task and the log.
+#include <syslog.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdlib>
+
+#include "compress/KAVO.Zantro.Compress.h"
+#include "compress/error_codes.h"
+#include "compress/task_record.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Zantro {
+
+namespace {
+
+constexpr char kNotifyApp[] = "KAVO.Nolo.App.Zantro3.Instance";
+constexpr char kNotifyTitle[] = "tree:leaf_filebrowser";
+constexpr char kNotifyCompleted[] = "filebrowser:filebrowser_compress_completed";
+constexpr char kNotifyFailed[] = "filebrowser:filebrowser_compress_failed";
+
+// Takes the whole process group along, so that the archiver does not outlive a stopped task.
+void EndProcessGroup(int signal_number) {
+  if (signal_number == SIGTERM) {
+    kill(0, SIGTERM);
+    std::exit(1);  // NOLINT(bugprone-signal-handler): what the worker has open is to be closed
+  }
+}
+
+void TellSuccess(const std::string& name, Json::Value& data) {
+  if (pTask->getBoolProperty(kPropNotify, false)) {
+    pTask->sendNotifyMessageNoEncode(kNotifyApp, pTask->getTaskId(), kNotifyTitle,
+                                     kNotifyCompleted, name.c_str(), nullptr);
+    return;
+  }
+  data[kDataNotification1] = kNotifyCompleted;
+  data[kDataNotification2] = name;
+}
+
+// Unlike the call above, this one has no null pointer at its end, deliberately.
+void TellFailure(const std::string& name, Json::Value& data) {
+  const bool is_notified = pTask->getBoolProperty(kPropNotify, false);
+  const char* const reason = LumoParseErrorToVeskString(LumoLibGetErr(), 0);
+  if (is_notified) {
+    pTask->sendNotifyMessageNoEncode(kNotifyApp, pTask->getTaskId(), kNotifyTitle, kNotifyFailed,
+                                     name.c_str(), reason);
+    return;
+  }
+  data[kDataNotification1] = kNotifyFailed;
+  data[kDataNotification2] = name;
+  data[kDataNotification3] = reason;
+}
+
+}  // namespace
+
+void ZantroCompressHandler::RunWorker(const StartParameters& start,
+                                      _tag_CompressInfo_& info) noexcept {
+  std::signal(SIGTERM, EndProcessGroup);
+  const bool succeeded = RunJob(start, info);
+  try {
+    StoreOutcome(succeeded, start.dest);
+  } catch (...) {
+    syslog(LOG_ERR, "%s:%d Failed to store the outcome", kLogSource, __LINE__);
+  }
+  try {
+    CleanTimeOutTasks(request->GetLoginUserName().c_str());
+  } catch (...) {
+    syslog(LOG_ERR, "%s:%d Failed to clean tasks", kLogSource, __LINE__);
+  }
+  _exit(0);
+}
+
+// What the steps throw, a request value that is no text for one, is a failure of the job; the host's
+// code up the stack belongs to another process.
+bool ZantroCompressHandler::RunJob(const StartParameters& start,
+                                   _tag_CompressInfo_& info) noexcept {
+  try {
+    WaitForTaskDataReady(pTask, kPropData, kDataWaitSeconds);
+    // Packing an archive into itself is done already, deliberately.
+    if (start.source_paths.size() == 1 && start.source_paths.front() == start.dest) {
+      return true;
+    }
+    return RunPipeline(start, info);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "%s:%d Unexpected failure: %s", kLogSource, __LINE__, error.what());
+  } catch (...) {
+    syslog(LOG_ERR, "%s:%d Unexpected failure", kLogSource, __LINE__);
+  }
+  SetErrItem(start.dest, kErrGeneral);
+  return false;
+}
+
+bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_CompressInfo_& info) {
+  const std::string session_id = request->GetSessionID();
+  if (LumoLibUGIDSet(session_id.c_str(), login_user.c_str()) < 0) {
+    syslog(LOG_ERR, "%s:%d Failed to set UGID for user=%s, sid=%s", kLogSource, __LINE__,
+           login_user.c_str(), session_id.c_str());
+    SetErrItem(start.dest, LumoLibGetErr());
+    return false;
+  }
+  info.src_paths = start.source_paths;
+  if (GeneratePathInfo(info) == 0) {
+    syslog(LOG_ERR, "%s:%d Failed to generate path info", kLogSource, __LINE__);
+    return false;
+  }
+  if (CheckDestPriv(start.dest.c_str(), login_user.c_str(), session_id.c_str()) == 0) {
+    syslog(LOG_ERR, "%s:%d Extract destination privilege not enough", kLogSource, __LINE__);
+    return false;
+  }
+  if (CheckSourcePrivilege(info) == 0) {
+    syslog(LOG_ERR, "%s:%d Can't access source files", kLogSource, __LINE__);
+    return false;
+  }
+  if (!SaveZipFileListToTmp(info)) {
+    syslog(LOG_ERR, "%s:%d Failed to get ziplist", kLogSource, __LINE__);
+    return false;
+  }
+  info.dest_path = start.dest;
+  info.codepage = start.codepage;
+  LumoGetZipInfo(info);
+  if (!LumoCompressFiles(info, login_user.c_str())) {
+    syslog(LOG_ERR, "%s:%d Failed to compress file %s", kLogSource, __LINE__, start.dest.c_str());
+    return false;
+  }
+  return true;
+}
+
+void ZantroCompressHandler::StoreOutcome(bool succeeded, const std::string& dest) {
+  pTask->reload();
+  Json::Value data = pTask->getProperty(kPropData);
+  if (data.isNull()) {
+    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
+    return;
+  }
+  pTask->beginUpdate();
+  const std::string name = WebUtils::EncodeHtml(dest, false);
+  if (succeeded) {
+    TellSuccess(name, data);
+  } else {
+    data[kDataErrors] = error_items;
+    TellFailure(name, data);
+  }
+  pTask->setProperty(kPropData, data);
+  // finish closes the update.
+  if (!pTask->finish(false)) {
+    syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
+  }
+}
+
+}  // namespace Zantro
