@@ -4,7 +4,6 @@
 #define COMPRESS_KAVO_ZANTRO_COMPRESS_H_
 
 #include <json/json.h>
-
 #include <sys/types.h>
 
 #include <cstdio>
@@ -30,9 +29,9 @@ inline constexpr char kLogSource[] = "KAVO.Zantro.Compress";
 
 // What "start" has made of the request before it forks; the worker inherits it.
 struct StartParameters {
-  Json::Value source_list;               // array of texts
-  std::string dest;                      // user path of the archive, without slashes at its end
-  std::string codepage;                  // may be empty
+  Json::Value source_list;                // array of texts
+  std::string dest;                       // user path of the archive, without slashes at its end
+  std::string codepage;                   // may be empty
   std::vector<std::string> source_paths;  // source_list as texts
 };
 
@@ -76,13 +75,13 @@ class ZantroCompressHandler final : public FileWebAPI {
   bool RunPipeline(const StartParameters& start, _tag_CompressInfo_& info);
   void StoreOutcome(bool succeeded, const std::string& dest);
 
-  // The worker's steps. Zero or false means failed: the step has recorded its error items and logged
-  // its line.
-  int GeneratePathInfo(_tag_CompressInfo_& info);                                   // path_info.cpp
-  int CheckDestPriv(const char* dest, const char* user, const char* session_id);   // privileges.cpp
-  int CheckSourcePrivilege(const _tag_CompressInfo_& info);                        // privileges.cpp
-  bool SaveZipFileListToTmp(_tag_CompressInfo_& info);                             // staging.cpp
-  void LumoGetZipInfo(_tag_CompressInfo_& info);                            // archive_options.cpp
+  // The worker's steps. Zero or false means failed: the step has recorded its error items and
+  // logged its line.
+  int GeneratePathInfo(_tag_CompressInfo_& info);                                 // path_info.cpp
+  int CheckDestPriv(const char* dest, const char* user, const char* session_id);  // privileges.cpp
+  int CheckSourcePrivilege(const _tag_CompressInfo_& info);                       // privileges.cpp
+  bool SaveZipFileListToTmp(_tag_CompressInfo_& info);                            // staging.cpp
+  void LumoGetZipInfo(_tag_CompressInfo_& info);                             // archive_options.cpp
   bool LumoCompressFiles(const _tag_CompressInfo_& info, const char* user);  // archiver.cpp
 
   // Parts of the destination check: the shared folder's privilege, then the directory and the name.
@@ -99,8 +98,7 @@ class ZantroCompressHandler final : public FileWebAPI {
   bool GenerateZipListWithShare(_tag_CompressInfo_& info);
   // Parts of the two. `list_file` is a template of mkstemp's and is filled in.
   bool WriteList(const _tag_CompressInfo_& info, const std::string& parent, char* list_file);
-  bool FillStagingDirectory(const _tag_CompressInfo_& info, const char* directory,
-                            char* list_file);
+  bool FillStagingDirectory(const _tag_CompressInfo_& info, const char* directory, char* list_file);
   bool LinkShare(const PathInfo& source);
   void RefuseSource(const PathInfo& source);
 

@@ -11,9 +11,9 @@ namespace {
 
 constexpr char kFormat7z[] = "7z";
 
-// The update switches use the archiver's own syntax: a state letter (q: only in the archive, r: only
-// on disk, y: older in the archive, z: unchanged, ...) and what becomes of it (0 ignore, 1 keep the
-// archive's copy, 2 compress from disk).
+// The update switches use the archiver's own syntax: a state letter (q: only in the archive, r:
+// only on disk, y: older in the archive, z: unchanged, ...) and what becomes of it (0 ignore, 1
+// keep the archive's copy, 2 compress from disk).
 struct ModeRow {
   const char* mode;
   const char* command;

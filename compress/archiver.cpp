@@ -241,8 +241,8 @@ void ZantroCompressHandler::SetArchiveOwner(const char* archive_path, const char
 std::string ZantroCompressHandler::LumoEscape(const char* text) {
   constexpr std::size_t kGrowth = 3;  // each byte quoted, at the worst
   const std::size_t size = kGrowth * std::strlen(text) + 1;
-  const std::unique_ptr<char, decltype(&std::free)> buffer(
-      static_cast<char*>(std::calloc(size, 1)), &std::free);
+  const std::unique_ptr<char, decltype(&std::free)> buffer(static_cast<char*>(std::calloc(size, 1)),
+                                                           &std::free);
   if (buffer == nullptr) {
     syslog(LOG_ERR, "%s:%d Failed to malloc: (%d)", kLogSource, __LINE__, static_cast<int>(size));
     return {};

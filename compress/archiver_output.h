@@ -20,8 +20,8 @@ struct ArchiverEvent {
   ArchiverError error = ArchiverError::kUnknown;
 };
 
-// `line` is one line with its line feed, which the last one may lack. Throws std::out_of_range for a
-// "Compressing " line with nothing behind it, not even a line feed.
+// `line` is one line with its line feed, which the last one may lack. Throws std::out_of_range for
+// a "Compressing " line with nothing behind it, not even a line feed.
 ArchiverEvent ParseArchiverLine(const std::string& line);
 
 }  // namespace Zantro

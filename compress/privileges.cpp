@@ -14,7 +14,7 @@ namespace Zantro {
 namespace {
 
 constexpr char kPathCharset[] = "UTF-8";
-constexpr int kPrivilegeWrite = 2;       // the one level that suffices for the destination
+constexpr int kPrivilegeWrite = 2;  // the one level that suffices for the destination
 constexpr int kFlagWriteSuspended = 0x2;
 constexpr int kCheckPathFlags = 32;
 constexpr int kAccessWrite = 2;
@@ -110,8 +110,8 @@ bool ZantroCompressHandler::CheckSource(const PathInfo& source,
     SetSourceErrItem(source, LumoLibGetErr());
     return false;
   }
-  // One question per shared folder; a refusal is reported but does not fail the check, deliberately,
-  // and later sources of the share are not held up by it.
+  // One question per shared folder; a refusal is reported but does not fail the check,
+  // deliberately, and later sources of the share are not held up by it.
   if (checked_shares.emplace(source.share_name, true).second) {
     const std::string session_id = request->GetSessionID();
     if (CheckShareListPrivilege(login_user.c_str(), session_id.c_str(),

@@ -12,7 +12,8 @@ namespace Zantro {
 
 inline constexpr std::size_t kPathBufferSize = 4096;  // bytes; a longer path is cut to fit
 
-// Both texts lie in the object's own buffer: dirname ends the directory part there, before the name.
+// Both texts lie in the object's own buffer: dirname ends the directory part there, before the
+// name.
 class SplitPath {
  public:
   explicit SplitPath(const std::string& path) {

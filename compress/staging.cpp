@@ -110,8 +110,8 @@ bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std:
     return false;
   }
   for (const PathInfo& source : info.path_infos) {
-    // All of the parent but its "/", which begins the name. Throws out_of_range when the source does
-    // not lie below the parent.
+    // All of the parent but its "/", which begins the name. Throws out_of_range when the source
+    // does not lie below the parent.
     const ListLine<kListLineSize> line(source.real_path.substr(parent.size() - 1));
     if (!line.IsExpressible()) {
       RefuseSource(source);

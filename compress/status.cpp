@@ -1,5 +1,5 @@
-// Method "status": how far a task has got. The answer that reports a task finished removes it, so it
-// is reported once.
+// Method "status": how far a task has got. The answer that reports a task finished removes it, so
+// it is reported once.
 #include <syslog.h>
 
 #include <optional>
@@ -17,9 +17,8 @@ constexpr char kAnswerFinished[] = "finished";
 Json::Value MakeAnswer(const Json::Value& data) {
   Json::Value answer(Json::objectValue);
   if (data.isMember(kDataParams)) {
-    answer[kParamDest] = data.get(kDataParams, Json::Value(Json::objectValue))
-                             .get(kParamDest, "")
-                             .asString();
+    answer[kParamDest] =
+        data.get(kDataParams, Json::Value(Json::objectValue)).get(kParamDest, "").asString();
   }
   if (data.isMember(kDataErrors)) {
     // Errors alone decide: the worker may have failed to mark the task finished.

@@ -1,5 +1,5 @@
-// Method "stop": kills a task's worker, and with it the archiver, and removes the task. A part of an
-// archive that the archiver leaves is not cleaned up here.
+// Method "stop": kills a task's worker, and with it the archiver, and removes the task. A part of
+// an archive that the archiver leaves is not cleaned up here.
 #include <syslog.h>
 
 #include "compress/KAVO.Zantro.Compress.h"

@@ -44,7 +44,8 @@ inline constexpr char kParamTaskId[] = "taskid";
 inline constexpr int kDataWaitSeconds = 60;
 
 // Stores the archiver's current file, the progress (0 to 1) and the total size in bytes in the
-// present task. A task that cannot be read or stored is logged and nothing more: the archiver goes on.
+// present task. A task that cannot be read or stored is logged and nothing more: the archiver goes
+// on.
 void WriteTaskProgress(const std::string& file, float progress, std::uint64_t total_size);
 
 }  // namespace Zantro

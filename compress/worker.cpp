@@ -1,6 +1,6 @@
-// The background worker: takes on the user's identity, runs the job's steps, writes the outcome into
-// the task, notifies the desktop and leaves. It never returns into the host and never answers a
-// request; all that it has to say goes into the task and the log.
+// The background worker: takes on the user's identity, runs the job's steps, writes the outcome
+// into the task, notifies the desktop and leaves. It never returns into the host and never answers
+// a request; all that it has to say goes into the task and the log.
 #include <syslog.h>
 #include <unistd.h>
 
@@ -31,8 +31,8 @@ void EndProcessGroup(int signal_number) {
 
 void TellSuccess(const std::string& name, Json::Value& data) {
   if (pTask->getBoolProperty(kPropNotify, false)) {
-    pTask->sendNotifyMessageNoEncode(kNotifyApp, pTask->getTaskId(), kNotifyTitle,
-                                     kNotifyCompleted, name.c_str(), nullptr);
+    pTask->sendNotifyMessageNoEncode(kNotifyApp, pTask->getTaskId(), kNotifyTitle, kNotifyCompleted,
+                                     name.c_str(), nullptr);
     return;
   }
   data[kDataNotification1] = kNotifyCompleted;
@@ -72,8 +72,8 @@ void ZantroCompressHandler::RunWorker(const StartParameters& start,
   _exit(0);
 }
 
-// What the steps throw, a request value that is no text for one, is a failure of the job; the host's
-// code up the stack belongs to another process.
+// What the steps throw, a request value that is no text for one, is a failure of the job; the
+// host's code up the stack belongs to another process.
 bool ZantroCompressHandler::RunJob(const StartParameters& start,
                                    _tag_CompressInfo_& info) noexcept {
   try {

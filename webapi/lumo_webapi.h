@@ -1,6 +1,6 @@
 // The base of every web API handler of the file manager: one object serves one request. It takes on
-// the signed-in user's identity, lets the derived handler do its work and hands exactly one outcome,
-// an error code with a JSON value, to the host.
+// the signed-in user's identity, lets the derived handler do its work and hands exactly one
+// outcome, an error code with a JSON value, to the host.
 #ifndef WEBAPI_LUMO_WEBAPI_H_
 #define WEBAPI_LUMO_WEBAPI_H_
 
@@ -33,8 +33,8 @@ class FileWebAPI {
   // Not virtual, deliberately: a handler is destroyed under its own type, never through its base.
   ~FileWebAPI();
 
-  // Does the request's work and records its outcome with the operations below; what is recorded last
-  // counts. Recording nothing means code 0 without data.
+  // Does the request's work and records its outcome with the operations below; what is recorded
+  // last counts. Recording nothing means code 0 without data.
   virtual void Process() = 0;
 
   // Records success with its data.

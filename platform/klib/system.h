@@ -18,8 +18,8 @@ int KLIBCErrGet();
 const char* KLIBCErrorGetFile();
 int KLIBCErrorGetLine();
 
-// Like fork: negative on failure, 0 in the child, the child's process id in the parent. The child is
-// the leader of a session and process group of its own.
+// Like fork: negative on failure, 0 in the child, the child's process id in the parent. The child
+// is the leader of a session and process group of its own.
 pid_t KLIBCProcFork();
 
 // Starts a program with the null-terminated argument vector, no shell between, and returns a stream
@@ -42,8 +42,8 @@ int KLIBCEncShParam(const char* text, char* buffer, size_t size);
 // is 0.
 int KLIBGroupIsAdminGroupMem(const char* user, int reserved);
 
-// Enters a file (full path) in the device's file index. The second argument, 1, means a single file.
-// Negative on failure.
+// Enters a file (full path) in the device's file index. The second argument, 1, means a single
+// file. Negative on failure.
 int KLIBKavoIndexAdd(const char* path, int scope);
 
 // Sets the mode bits of a file (full path), keeping its access list; -1 as the second argument

@@ -21,7 +21,8 @@ int LumoLibGetErr();
 // The web API error code for a system error number; 0 for 0. The texts name what was worked on and
 // may be null.
 int LumoParseErrnoToError(int error_number, const char* source, const char* destination);
-// The desktop's text for a web API error code. Static storage, never null. The second argument is 0.
+// The desktop's text for a web API error code. Static storage, never null. The second argument is
+// 0.
 const char* LumoParseErrorToVeskString(int code, int reserved);
 
 // ---- Identity and file-creation mask of the process
@@ -37,7 +38,8 @@ std::uint32_t LumoLibGetUmask();
 
 // ---- Paths
 
-// One resolved path. Exactly these seven texts in this order: the layout is shared with the library.
+// One resolved path. Exactly these seven texts in this order: the layout is shared with the
+// library.
 struct PathInfo {
   std::string share_path;       // user path: /share/dir/name
   std::string aux_1;            // filled by the factory; no caller here reads it
@@ -90,7 +92,8 @@ int LumoLibGetPrivilege(const char* path, const char* user, const char* session_
 // Non-zero when the user may list that user path's shared folder, 0 when not. No error channel.
 int CheckShareListPrivilege(const char* user, const char* session_id, const char* path);
 // Access test on a full path under the process's effective identity, access lists included. Mode is
-// a sum of 1 (read or list), 2 (write), 4 (run or pass through). 0 when granted, non-zero otherwise.
+// a sum of 1 (read or list), 2 (write), 4 (run or pass through). 0 when granted, non-zero
+// otherwise.
 int ACLAccess(const char* path, int mode);
 // Tells whether a user path lies on an encrypted shared folder. Zero on failure.
 int LumoLibCheckEncryptShare(const std::string& path, bool* encrypted);
@@ -99,9 +102,9 @@ int LumoLibChown2Admin(const char* path, const char* user);
 
 // ---- Texts
 
-// Splits a request parameter into a JSON array of texts, by the rules of that API version: a text at
-// the separators, empty pieces left out. An empty array when the value is nothing that can be split.
-// The last argument is false.
+// Splits a request parameter into a JSON array of texts, by the rules of that API version: a text
+// at the separators, empty pieces left out. An empty array when the value is nothing that can be
+// split. The last argument is false.
 Json::Value StringExplodeEx(const Json::Value& value, const std::string& separator, int version,
                             bool reserved);
 

@@ -41,8 +41,8 @@ class Task {
   // Reads the task again, as other processes may have written it.
   void reload();
 
-  // Marks the task finished and closes an open update, storing what was gathered in it. The argument
-  // is false. False when the task could not be stored as finished.
+  // Marks the task finished and closes an open update, storing what was gathered in it. The
+  // argument is false. False when the task could not be stored as finished.
   bool finish(bool reserved);
   bool isFinished() const;
 
@@ -56,11 +56,11 @@ class Task {
   void sendNotifyMessageNoEncode(const char* app, const char* task_id, const char* title,
                                  const char* message, ...);
 
+  State* state;  // the task manager's own; no module looks inside
+
  private:
   friend class TaskMgr;
-  explicit Task(State* state);
-
-  State* state_;
+  explicit Task(State* task_state);
 };
 
 // The tasks of one user.
@@ -99,8 +99,8 @@ int WaitForTaskDataKeyReady(Vesk::Task* task, const char* property, const char* 
 Json::Value LumoLibBkgTaskInfoCreate(const Json::Value& data, const std::string& kind);
 
 // Removes the task from the store if, as this process last read it, it has finished or holds
-// "errors", or if its process, the worker `pid`, ended without a result. `task` may be null: nothing
-// happens then. `pid` is -1 when unknown. The last argument is false.
+// "errors", or if its process, the worker `pid`, ended without a result. `task` may be null:
+// nothing happens then. `pid` is -1 when unknown. The last argument is false.
 void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved);
 
 // Removes the user's stale tasks.

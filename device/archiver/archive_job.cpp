@@ -1,0 +1,164 @@
+#include "device/archiver/archive_job.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <iterator>
+#include <memory>
+#include <unordered_set>
+
+#include "device/archiver/code_page.h"
+#include "device/archiver/failure.h"
+#include "device/archiver/links.h"
+#include "device/archiver/list_file.h"
+#include "device/archiver/output_file.h"
+#include "device/archiver/password.h"
+#include "device/archiver/stock_7z.h"
+#include "device/archiver/switches.h"
+#include "device/archiver/work_place.h"
+#include "device/archiver/zip_names.h"
+
+namespace Archiver {
+namespace {
+
+constexpr mode_t kFileMode = 0666;  // the umask takes its share
+
+UniqueFd Open(const std::string& path, int flags) {
+  UniqueFd fd(open(path.c_str(), flags | O_CLOEXEC, kFileMode));
+  if (!fd.Valid()) {
+    throw SystemFailure("cannot open", path, errno);
+  }
+  return fd;
+}
+
+// Hands `use` the bytes of `path` piece by piece.
+template <typename Use>
+void ReadFile(const std::string& path, Use use) {
+  const UniqueFd fd = Open(path, O_RDONLY);
+  std::array<char, 64 * 1024> buffer{};
+  while (const ssize_t size = read(fd.Get(), buffer.data(), buffer.size())) {
+    if (size > 0) {
+      use(buffer.data(), static_cast<size_t>(size));
+    } else if (errno != EINTR) {
+      throw SystemFailure("cannot read", path, errno);
+    }
+  }
+}
+
+void CopyFile(const std::string& from, const std::string& to, const Cancel& cancel) {
+  const UniqueFd out = Open(to, O_WRONLY | O_CREAT | O_EXCL);
+  ReadFile(from, [&](const char* bytes, size_t size) {
+    cancel.Check();
+    while (size > 0) {
+      const ssize_t written = write(out.Get(), bytes, size);
+      if (written < 0 && errno != EINTR) {
+        throw SystemFailure("cannot write", to, errno);
+      }
+      const size_t done = written > 0 ? static_cast<size_t>(written) : 0;
+      bytes += done;
+      size -= done;
+    }
+  });
+}
+
+std::vector<std::string> Sources(const Request& request) {
+  std::string list;
+  ReadFile(request.list_path, [&](const char* bytes, size_t size) { list.append(bytes, size); });
+  const std::vector<std::string> sources = ReadSources(list, request.list_path);
+  if (std::all_of(sources.begin(), sources.end(),
+                  [&](const std::string& source) { return IsExcluded(request, source); })) {
+    throw NamedFailure("nothing to pack", sources.front(), "all sources are excluded");
+  }
+  return sources;
+}
+
+void Pack(const Request& request, PackRun run, const std::string& folder, const Cancel& cancel,
+          Report& report) {
+  const UniqueFd sources = UnnamedFile(run.sources.list);
+  const UniqueFd left_out = UnnamedFile(run.left_out.list);
+  const UniqueFd password = PasswordInput(request);
+  run.sources_file = "/proc/self/fd/" + std::to_string(sources.Get());
+  run.left_out_file = "/proc/self/fd/" + std::to_string(left_out.Get());
+  Child7z child;
+  child.arguments = SwitchesFor7z(request, run);
+  child.folder = folder;
+  child.input_fd = password.Get();
+  child.kept_fds = {sources.Get(), left_out.Get()};
+  Run7z(child, cancel, report);
+}
+
+// Where only following links leads to the sources, the other links are left out of that run, and
+// then added from a copy of them, so that they end as links like everywhere else.
+void PackFollowingShares(const Request& request, PackRun run, std::vector<std::string> left_out,
+                         const std::vector<std::string>& sources, const WorkPlace& place,
+                         const Cancel& cancel, Report& report) {
+  const std::vector<std::string> links = FindLinks(sources);
+  const std::unordered_set<std::string> known(links.begin(), links.end());
+  std::vector<std::string> others;
+  std::copy_if(sources.begin(), sources.end(), std::back_inserter(others),
+               [&](const std::string& source) { return known.count(source) == 0; });
+  if (!others.empty()) {
+    left_out.insert(left_out.end(), links.begin(), links.end());
+    run.sources = DivideNames(others);
+    run.left_out = DivideNames(left_out);
+    run.follow_links = true;
+    Pack(request, run, place.folder, cancel, report);
+    if (FindLinks(sources) != links) {
+      throw Failure("symbolic links changed while they were packed");
+    }
+    run.archive = run.new_archive.empty() ? run.archive : run.new_archive;
+    run.new_archive.clear();
+  }
+  if (!links.empty()) {
+    const LinkMirror mirror(links);
+    run.sources = DivideNames(links);
+    run.left_out = {};
+    run.follow_links = false;
+    Pack(request, run, mirror.Path(), cancel, report);
+  }
+}
+
+}  // namespace
+
+void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
+  CheckPassword(request);
+  const bool recode = request.zip && !CodePage::IsUtf8(request.code_page);
+  const auto page = recode ? std::make_unique<CodePage>(request.code_page) : nullptr;
+  const std::vector<std::string> listed = Sources(request);
+  const WorkPlace place = FindWorkPlace(listed, request.list_path);
+  CheckSources(place, listed);
+  const std::vector<std::string> sources = WithoutNested(listed);
+  const bool exists = ArchiveExists(request.archive);
+  const WorkFolder work(request.archive);
+
+  PackRun run;
+  run.archive = work.Result();
+  run.sources = DivideNames(sources);
+  if (exists && page && HasNamesIn(*page, request.archive)) {
+    CopyFile(request.archive, work.Result(), cancel);
+    NamesToUtf8(*page, work.Result(), cancel);
+  } else if (exists) {
+    run.archive = request.archive;
+    run.new_archive = work.Result();
+  }
+  std::vector<std::string> left_out = NamesWithin(place, request.archive);
+  const std::vector<std::string> own = NamesWithin(place, work.Path());
+  left_out.insert(left_out.end(), own.begin(), own.end());
+  if (place.shares.empty()) {
+    run.left_out = DivideNames(left_out);
+    Pack(request, run, place.folder, cancel, report);
+  } else {
+    PackFollowingShares(request, run, left_out, sources, place, cancel, report);
+  }
+  if (page) {
+    NamesToCodePage(*page, work.Result(), cancel);
+  }
+  cancel.Check();
+  work.Publish();
+  report.Done();
+}
+
+}  // namespace Archiver

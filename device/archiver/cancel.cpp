@@ -1,0 +1,39 @@
+#include "device/archiver/cancel.h"
+
+#include <poll.h>
+#include <sys/signalfd.h>
+
+#include <cerrno>
+#include <csignal>
+
+#include "device/archiver/failure.h"
+
+namespace Archiver {
+
+Cancel::Cancel(int report_fd) : report_fd_(report_fd) {
+  signal(SIGPIPE, SIG_IGN);
+  sigset_t stops;
+  sigemptyset(&stops);
+  for (const int number : {SIGTERM, SIGINT, SIGHUP}) {
+    sigaddset(&stops, number);
+  }
+  sigprocmask(SIG_BLOCK, &stops, nullptr);
+  signals_ = UniqueFd(signalfd(-1, &stops, SFD_CLOEXEC | SFD_NONBLOCK));
+  if (!signals_.Valid()) {
+    throw SystemFailure("cannot watch", "signals", errno);
+  }
+}
+
+bool Cancel::Requested() const {
+  pollfd watched[] = {{signals_.Get(), POLLIN, 0}, {report_fd_, 0, 0}};
+  poll(watched, 2, 0);
+  return (watched[0].revents & POLLIN) != 0 || (watched[1].revents & POLLERR) != 0;
+}
+
+void Cancel::Check() const {
+  if (Requested()) {
+    throw Cancelled();
+  }
+}
+
+}  // namespace Archiver

@@ -1,0 +1,25 @@
+#pragma once
+
+#include "device/archiver/unique_fd.h"
+
+namespace Archiver {
+
+// Turns SIGTERM, SIGINT and SIGHUP, and a report that nobody reads any more, into a condition which
+// the job checks at its own pace. While it lives these signals and SIGPIPE have no other effect.
+class Cancel {
+ public:
+  explicit Cancel(int report_fd);
+
+  bool Requested() const;
+  // Throws Cancelled when requested.
+  void Check() const;
+
+  int SignalFd() const { return signals_.Get(); }
+  int ReportFd() const { return report_fd_; }
+
+ private:
+  int report_fd_;
+  UniqueFd signals_;
+};
+
+}  // namespace Archiver

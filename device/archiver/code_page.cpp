@@ -1,0 +1,78 @@
+#include "device/archiver/code_page.h"
+
+#include <strings.h>
+
+#include <algorithm>
+#include <cctype>
+
+#include "device/archiver/failure.h"
+
+namespace Archiver {
+namespace {
+
+constexpr char kUtf8[] = "UTF-8";
+
+iconv_t Unopened() { return reinterpret_cast<iconv_t>(-1); }  // NOLINT(performance-no-int-to-ptr)
+
+// iconv takes options after a slash and more charsets after a comma; neither is a code page.
+std::string IconvName(const std::string& name) {
+  const bool plain = std::all_of(name.begin(), name.end(), [](unsigned char c) {
+    return std::isalnum(c) != 0 || c == '-' || c == '_' || c == '.' || c == ':' || c == '+';
+  });
+  const bool digits =
+      std::all_of(name.begin(), name.end(), [](unsigned char c) { return std::isdigit(c) != 0; });
+  return plain ? (digits ? "CP" + name : name) : std::string("?");
+}
+
+std::optional<std::string> Convert(iconv_t converter, std::string text) {
+  std::string result(text.size() * 4 + 16, '\0');
+  char* in = text.data();
+  size_t in_left = text.size();
+  char* out = result.data();
+  size_t out_left = result.size();
+  iconv(converter, nullptr, nullptr, nullptr, nullptr);
+  // Any result but 0 means characters that were replaced, or could not be.
+  if (iconv(converter, &in, &in_left, &out, &out_left) != 0 ||
+      iconv(converter, nullptr, nullptr, &out, &out_left) != 0) {
+    return std::nullopt;
+  }
+  result.resize(result.size() - out_left);
+  return result;
+}
+
+}  // namespace
+
+CodePage::CodePage(const std::string& name)
+    : encoder_(iconv_open(IconvName(name).c_str(), kUtf8)),
+      decoder_(iconv_open(kUtf8, IconvName(name).c_str())) {
+  const std::string path = "/ABCXYZabcxyz0189.-_+@";
+  if (encoder_ == Unopened() || decoder_ == Unopened() || Encode(path) != path) {
+    CodePage::~CodePage();
+    throw NamedFailure("unknown code page", name, "not one for names in a zip archive");
+  }
+}
+
+CodePage::~CodePage() {
+  for (const iconv_t converter : {encoder_, decoder_}) {
+    if (converter != Unopened()) {
+      iconv_close(converter);
+    }
+  }
+}
+
+std::optional<std::string> CodePage::Encode(const std::string& utf8) const {
+  std::optional<std::string> bytes = Convert(encoder_, utf8);
+  return bytes && Convert(decoder_, *bytes) == utf8 ? bytes : std::nullopt;
+}
+
+std::optional<std::string> CodePage::Decode(const std::string& bytes) const {
+  return Convert(decoder_, bytes);
+}
+
+bool CodePage::IsUtf8(const std::string& name) {
+  return name.empty() || strcasecmp(name.c_str(), kUtf8) == 0 ||
+         strcasecmp(name.c_str(), "UTF8") == 0 || strcasecmp(name.c_str(), "CP65001") == 0 ||
+         name == "65001";
+}
+
+}  // namespace Archiver

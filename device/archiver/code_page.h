@@ -1,0 +1,31 @@
+#pragma once
+
+#include <iconv.h>
+
+#include <optional>
+#include <string>
+
+namespace Archiver {
+
+// A character set that agrees with ASCII on what makes a path, by its IANA name or as "CPnnn".
+class CodePage {
+ public:
+  // Throws Failure for a name that is unknown or cannot serve in file names.
+  explicit CodePage(const std::string& name);
+  ~CodePage();
+  CodePage(const CodePage&) = delete;
+  CodePage& operator=(const CodePage&) = delete;
+
+  // Nothing when `utf8` cannot go to the code page and come back unchanged.
+  std::optional<std::string> Encode(const std::string& utf8) const;
+  std::optional<std::string> Decode(const std::string& bytes) const;
+
+  // Whether names stand as they are: no code page given, or UTF-8.
+  static bool IsUtf8(const std::string& name);
+
+ private:
+  iconv_t encoder_;
+  iconv_t decoder_;
+};
+
+}  // namespace Archiver

@@ -1,0 +1,122 @@
+#include "device/archiver/list_file.h"
+
+#include <unordered_set>
+
+#include "device/archiver/failure.h"
+
+namespace Archiver {
+namespace {
+
+constexpr char kCannotPack[] = "cannot pack";
+
+// Calls `use` for each part of `text` between separators, the last one included.
+template <typename Use>
+void ForEachPart(const std::string& text, char separator, Use use) {
+  for (size_t begin = 0; begin <= text.size();) {
+    const size_t end = std::min(text.find(separator, begin), text.size());
+    use(text.substr(begin, end - begin));
+    begin = end + 1;
+  }
+}
+
+std::string Normalize(const std::string& line) {
+  if (line[0] == '/') {
+    throw NamedFailure(kCannotPack, line, "not relative to the working directory");
+  }
+  if (line.find('\0') != std::string::npos) {
+    throw NamedFailure(kCannotPack, line, "the name holds a zero byte");
+  }
+  std::string path;
+  ForEachPart(line, '/', [&](const std::string& part) {
+    if (part == "..") {
+      throw NamedFailure(kCannotPack, line, "leads out of the working directory");
+    }
+    if (!part.empty() && part != ".") {
+      path += (path.empty() ? "" : "/") + part;
+    }
+  });
+  if (path.empty()) {
+    throw NamedFailure(kCannotPack, line, "the working directory itself is no source");
+  }
+  return path;
+}
+
+bool HasAncestorIn(const std::unordered_set<std::string>& names, const std::string& path) {
+  for (size_t at = path.rfind('/'); at != std::string::npos; at = path.rfind('/', at - 1)) {
+    if (names.count(path.substr(0, at)) != 0) {
+      return true;
+    }
+  }
+  return false;
+}
+
+}  // namespace
+
+std::vector<std::string> ReadSources(const std::string& text, const std::string& list_path) {
+  std::vector<std::string> listed;
+  std::unordered_set<std::string> known;
+  ForEachPart(text, '\n', [&](const std::string& line) {
+    if (!line.empty()) {
+      std::string path = Normalize(line);
+      if (known.insert(path).second) {
+        listed.push_back(std::move(path));
+      }
+    }
+  });
+  if (listed.empty()) {
+    throw NamedFailure("nothing to pack in list", list_path, "it names no files");
+  }
+  return listed;
+}
+
+std::vector<std::string> WithoutNested(const std::vector<std::string>& sources) {
+  const std::unordered_set<std::string> names(sources.begin(), sources.end());
+  std::vector<std::string> result;
+  for (const std::string& source : sources) {
+    if (!HasAncestorIn(names, source)) {
+      result.push_back(source);
+    }
+  }
+  return result;
+}
+
+NamesFor7z DivideNames(const std::vector<std::string>& names) {
+  NamesFor7z result;
+  for (const std::string& name : names) {
+    if (IsUtf8(name) && name.find_first_of("\r\n") == std::string::npos) {
+      result.list += '"' + name + "\"\n";
+    } else {
+      result.arguments.push_back(name);
+    }
+  }
+  return result;
+}
+
+bool IsUtf8(const std::string& text) {
+  for (size_t i = 0; i < text.size();) {
+    const auto lead = static_cast<unsigned char>(text[i++]);
+    if (lead < 0x80) {
+      continue;
+    }
+    const int more = lead >= 0xF0 ? 3 : lead >= 0xE0 ? 2 : 1;
+    if (lead < 0xC2 || lead > 0xF4 || text.size() - i < static_cast<size_t>(more)) {
+      return false;
+    }
+    unsigned code = lead & (0x3FU >> more);
+    for (int k = 0; k < more; ++k) {
+      const auto byte = static_cast<unsigned char>(text[i++]);
+      if ((byte & 0xC0U) != 0x80) {
+        return false;
+      }
+      code = code << 6U | (byte & 0x3FU);
+    }
+    const bool surrogate = code >= 0xD800 && code < 0xE000;
+    if (surrogate || code > 0x10FFFF || (more == 2 && code < 0x800) ||
+        (more == 3 && code < 0x10000)) {
+      return false;
+    }
+  }
+  return true;
+}
+
+}  // namespace Archiver

@@ -1,0 +1,38 @@
+// kavo-7z: the archiver of the device, on top of a stock 7z.
+//
+// It takes the device's switches (-utf16, -lang, -progress, empty arguments), reports to its caller
+// in lines of its own, and keeps the promise that a file under the archive's name is a whole
+// archive.
+
+#include <unistd.h>
+
+#include <exception>
+#include <new>
+#include <string>
+#include <vector>
+
+#include "device/archiver/archive_job.h"
+#include "device/archiver/cancel.h"
+#include "device/archiver/command_line.h"
+#include "device/archiver/failure.h"
+#include "device/archiver/report.h"
+
+int main(int argc, char** argv) {
+  const std::vector<std::string> arguments(argv + (argc > 0 ? 1 : 0), argv + argc);
+  Archiver::HidePassword(argc, argv);
+  try {
+    const Archiver::Cancel cancel(STDOUT_FILENO);
+    Archiver::Report report(cancel);
+    try {
+      Archiver::PackArchive(Archiver::ParseCommandLine(arguments), cancel, report);
+      return 0;
+    } catch (const Archiver::Cancelled&) {
+      throw;
+    } catch (const std::exception& e) {
+      report.Error(e.what());
+    }
+  } catch (const std::exception&) {
+    // Cancelled, or there is nobody left to tell.
+  }
+  return 1;
+}

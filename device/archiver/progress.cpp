@@ -1,0 +1,83 @@
+#include "device/archiver/progress.h"
+
+#include <algorithm>
+#include <cstring>
+
+namespace Archiver {
+namespace {
+
+constexpr char kWipe = '\b';
+constexpr char kTotal[] = "Add new data to archive: ";
+
+// The number that ends right before `end`; false when there is none.
+bool NumberBefore(std::string_view text, size_t end, uint64_t* number) {
+  size_t begin = std::min(end, text.size());
+  end = begin;
+  while (begin > 0 && text[begin - 1] >= '0' && text[begin - 1] <= '9') {
+    --begin;
+  }
+  if (begin == end || end - begin > 19) {
+    return false;
+  }
+  *number = std::stoull(std::string(text.substr(begin, end - begin)));
+  return true;
+}
+
+// A progress text is "  0M Scan " or " 84% 12": it starts with blanks or digits, as no line does.
+bool StartsProgress(std::string_view text) {
+  return !text.empty() && (text[0] == ' ' || (text[0] >= '0' && text[0] <= '9')) &&
+         text.find_first_of("%M") != std::string::npos;
+}
+
+}  // namespace
+
+std::vector<Event> OutputParser::Feed(const std::string& bytes) {
+  std::vector<Event> events;
+  pending_ += bytes;
+  std::string_view rest = pending_;
+  for (bool more = true; more;) {
+    const size_t line_end = std::min(rest.find('\n'), rest.size());
+    const std::string_view line = rest.substr(0, line_end);
+    const size_t wiped = TakeProgress(line, &events);
+    more = wiped > 0 || line_end < rest.size();
+    if (wiped > 0) {
+      rest.remove_prefix(wiped);
+    } else if (more) {
+      TakeLine(std::string(line), &events);
+      rest.remove_prefix(line_end + 1);
+    }
+    percent_seen_ = percent_seen_ && !more;
+  }
+  pending_ = std::string(rest);
+  return events;
+}
+
+// Reports the percentage that `line` starts with at once, for 7z wipes a progress text only when it
+// has a new one. Returns the length of the text and its wiping, 0 while that is not complete.
+size_t OutputParser::TakeProgress(std::string_view line, std::vector<Event>* events) {
+  const std::string_view text = line.substr(0, line.find(kWipe));
+  if (!StartsProgress(text)) {
+    return 0;
+  }
+  uint64_t percent = 0;
+  const size_t sign = text.find('%');
+  if (!percent_seen_ && sign != std::string::npos && NumberBefore(text, sign, &percent)) {
+    percent_seen_ = true;
+    events->push_back({Event::Kind::kPercent, percent, {}});
+  }
+  const std::string back(text.size(), kWipe);
+  const std::string wiping = back + std::string(text.size(), ' ') + back;
+  return line.compare(text.size(), wiping.size(), wiping) == 0 ? text.size() + wiping.size() : 0;
+}
+
+void OutputParser::TakeLine(const std::string& line, std::vector<Event>* events) {
+  uint64_t bytes = 0;
+  if (line.compare(0, 2, "+ ") == 0 || line.compare(0, 2, "U ") == 0) {
+    events->push_back({Event::Kind::kFile, 0, line.substr(2)});
+  } else if (line.compare(0, std::strlen(kTotal), kTotal) == 0 &&
+             NumberBefore(line, line.find(" byte"), &bytes)) {
+    events->push_back({Event::Kind::kTotal, bytes, {}});
+  }
+}
+
+}  // namespace Archiver

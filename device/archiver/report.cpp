@@ -1,0 +1,57 @@
+#include "device/archiver/report.h"
+
+#include <poll.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <climits>
+
+#include "device/archiver/failure.h"
+
+namespace Archiver {
+
+void Report::Total(uint64_t bytes) {
+  if (!has_total_) {
+    has_total_ = true;
+    Line("Total: " + std::to_string(bytes));
+  }
+}
+
+void Report::Compressing(const std::string& name) { Line("Compressing " + Printable(name)); }
+
+void Report::Progress(uint64_t percent) {
+  Percent(static_cast<int>(std::min<uint64_t>(percent, 99)));
+}
+
+void Report::Done() { Percent(100); }
+
+void Report::Error(const std::string& reason) { Line("Error: " + Printable(reason)); }
+
+void Report::Percent(int percent) {
+  if (percent > percent_) {
+    percent_ = percent;
+    Line("Progress: " + std::to_string(percent));
+  }
+}
+
+void Report::Line(const std::string& text) {
+  const std::string line = text + '\n';
+  for (size_t done = 0; done < line.size();) {
+    pollfd watched[] = {{cancel_.ReportFd(), POLLOUT, 0}, {cancel_.SignalFd(), POLLIN, 0}};
+    if (poll(watched, 2, -1) < 0 && errno == EINTR) {
+      continue;
+    }
+    cancel_.Check();
+    // A pipe that polls writable takes PIPE_BUF bytes without blocking, and promises no more.
+    const ssize_t written = write(cancel_.ReportFd(), line.data() + done,
+                                  std::min<size_t>(line.size() - done, PIPE_BUF));
+    if (written > 0) {
+      done += static_cast<size_t>(written);
+    } else if (written < 0 && errno != EINTR && errno != EAGAIN) {
+      throw Cancelled();
+    }
+  }
+}
+
+}  // namespace Archiver

@@ -1,0 +1,34 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+
+#include "device/archiver/cancel.h"
+
+namespace Archiver {
+
+// The lines which the caller reads. Each leaves at once; a caller that is slow to read holds up the
+// job but never its cancellation.
+class Report {
+ public:
+  explicit Report(const Cancel& cancel) : cancel_(cancel) {}
+
+  // Only the first call counts: a job reports one sum.
+  void Total(uint64_t bytes);
+  void Compressing(const std::string& name);
+  // Never goes backwards, and leaves 100 to Done().
+  void Progress(uint64_t percent);
+  // The archive stands under its final name.
+  void Done();
+  void Error(const std::string& reason);
+
+ private:
+  void Line(const std::string& text);
+  void Percent(int percent);
+
+  const Cancel& cancel_;
+  bool has_total_ = false;
+  int percent_ = -1;
+};
+
+}  // namespace Archiver

@@ -1,0 +1,28 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "device/archiver/command_line.h"
+#include "device/archiver/list_file.h"
+
+namespace Archiver {
+
+// One run of the stock 7z.
+struct PackRun {
+  std::string archive;       // what 7z opens or creates
+  std::string new_archive;   // where the result goes when `archive` must stay as it is
+  NamesFor7z sources;        // relative to the run's folder
+  NamesFor7z left_out;       // likewise; each stands for one file or folder
+  std::string sources_file;  // path under which 7z finds the text of sources.list
+  std::string left_out_file;
+  bool follow_links = false;
+};
+
+// The argument vector of `run`, without the program's name.
+std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& run);
+
+// Whether the request leaves out `path`: some part of it bears an excluded name.
+bool IsExcluded(const Request& request, const std::string& path);
+
+}  // namespace Archiver

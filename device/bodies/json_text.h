@@ -1,0 +1,19 @@
+// JSON values to one line of text and back. Texts keep their bytes, also those that are not UTF-8.
+#ifndef DEVICE_BODIES_JSON_TEXT_H_
+#define DEVICE_BODIES_JSON_TEXT_H_
+
+#include <json/json.h>
+
+#include <string>
+
+namespace Device {
+
+std::string ToText(const Json::Value& value);
+
+// Throws std::runtime_error, with line and reason, for a text that is no JSON. Comments, trailing
+// commas and repeated keys are refused.
+Json::Value ParseJson(const std::string& text);
+
+}  // namespace Device
+
+#endif  // DEVICE_BODIES_JSON_TEXT_H_

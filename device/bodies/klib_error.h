@@ -1,0 +1,14 @@
+// The error channel of the system library.
+#ifndef DEVICE_BODIES_KLIB_ERROR_H_
+#define DEVICE_BODIES_KLIB_ERROR_H_
+
+namespace Device {
+
+void SetKlibError(int error_number, const char* file, int line);
+
+}  // namespace Device
+
+// Leaves an error number with the place where it arose.
+#define KLIB_ERROR(error_number) Device::SetKlibError((error_number), __FILE__, __LINE__)
+
+#endif  // DEVICE_BODIES_KLIB_ERROR_H_

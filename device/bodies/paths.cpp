@@ -1,0 +1,260 @@
+#include "device/bodies/paths.h"
+
+#include <climits>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+
+#include "device/bodies/errors.h"
+#include "device/bodies/operations.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+namespace {
+
+constexpr std::size_t kNameMax = 255;  // bytes
+constexpr std::size_t kEncryptedNameMax = 143;
+
+// The path's parts. False when ".." leads above the first of them, the shared folder.
+bool SplitPath(const std::string& path, std::vector<std::string>& parts) {
+  std::size_t begin = 0;
+  while (begin < path.size()) {
+    const std::size_t end = std::min(path.find('/', begin), path.size());
+    const std::string part = path.substr(begin, end - begin);
+    begin = end + 1;
+    if (part == "..") {
+      if (parts.size() <= 1) {
+        return false;
+      }
+      parts.pop_back();
+    } else if (!part.empty() && part != ".") {
+      parts.push_back(part);
+    }
+  }
+  return true;
+}
+
+// Fills in the shared folder's fields. False when there is none of that name, or no such user.
+bool FindShareFolder(const OpenDevice& device, const std::string& user, ResolvedPath& resolved) {
+  if (resolved.share_name == kHomeShare) {
+    const User* const owner = device.config.FindUser(user);
+    if (owner == nullptr) {
+      return false;
+    }
+    resolved.volume_path = device.VolumePath(owner->home);
+    resolved.share_real_path = device.HomePath(*owner);
+    return true;
+  }
+  resolved.share = device.config.FindShare(resolved.share_name);
+  if (resolved.share == nullptr) {
+    return false;
+  }
+  resolved.volume_path = device.VolumePath(resolved.share->volume);
+  resolved.share_real_path = resolved.volume_path + "/" + resolved.share->name;
+  return true;
+}
+
+// Where the path leads when links are followed; of one that does not exist, its nearest parent that
+// does. Empty, with errno set, when that cannot be told.
+std::string FollowLinks(std::string path) {
+  for (;;) {
+    const std::unique_ptr<char, void (*)(void*)> followed(realpath(path.c_str(), nullptr),
+                                                          std::free);
+    if (followed != nullptr) {
+      return followed.get();
+    }
+    if (errno != ENOENT || path.size() <= 1) {
+      return {};
+    }
+    path.resize(std::max<std::size_t>(path.rfind('/'), 1));
+  }
+}
+
+bool IsOnVolumes(const std::string& path) {
+  const OpenDevice& device = TheDevice();
+  for (const std::string& volume : device.config.volumes) {
+    const std::string real_volume = FollowLinks(device.VolumePath(volume));
+    if (!real_volume.empty() && IsWithin(path, real_volume)) {
+      return true;
+    }
+  }
+  return false;
+}
+
+int CheckPath(const char* path) {
+  const std::string followed = FollowLinks(path);
+  if (followed.empty()) {
+    SetLastErrno(errno);
+    return -1;
+  }
+  if (!IsOnVolumes(followed)) {
+    SetLastError(kErrOutsideShare);
+    return -1;
+  }
+  return 0;
+}
+
+int CheckFileName(const std::string& directory, const std::string& name) {
+  if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos) {
+    SetLastError(kErrBadName);
+    return -1;
+  }
+  const Share* const share = ShareOfRealPath(TheDevice(), directory);
+  const bool is_encrypted = share != nullptr && share->encrypted;
+  if (name.size() > (is_encrypted ? kEncryptedNameMax : kNameMax)) {
+    SetLastError(is_encrypted ? kErrNameTooLongCrypt : kErrNameTooLong);
+    return -1;
+  }
+  return 0;
+}
+
+// The common leading part of two folders that end in "/".
+std::string CommonFolder(const std::string& one, const std::string& other) {
+  std::size_t end = 0;
+  for (std::size_t at = 0; at < std::min(one.size(), other.size()) && one[at] == other[at]; ++at) {
+    if (one[at] == '/') {
+      end = at + 1;
+    }
+  }
+  return one.substr(0, end);
+}
+
+}  // namespace
+
+ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const std::string& path) {
+  ResolvedPath resolved;
+  std::vector<std::string> parts;
+  if (path.empty() || path[0] != '/' || path.find('\0') != std::string::npos) {
+    resolved.error = kErrBadName;
+  } else if (path.size() >= PATH_MAX) {
+    resolved.error = kErrNameTooLong;
+  } else if (!SplitPath(path, parts)) {
+    resolved.error = kErrOutsideShare;
+  } else if (parts.empty()) {
+    resolved.error = kErrNotFound;
+  } else {
+    resolved.share_name = parts.front();
+    resolved.error = FindShareFolder(device, user, resolved) ? 0 : kErrNotFound;
+    resolved.user_path = "/" + parts.front();
+    resolved.real_path = resolved.share_real_path;
+    for (std::size_t part = 1; part < parts.size(); ++part) {
+      resolved.user_path += "/" + parts[part];
+      resolved.real_path += "/" + parts[part];
+    }
+    if (resolved.error == 0 && resolved.real_path.size() >= PATH_MAX) {
+      resolved.error = kErrNameTooLong;
+    }
+  }
+  return resolved;
+}
+
+Access AccessOf(const ResolvedPath& path, const std::string& user) {
+  if (path.share == nullptr) {
+    return Access::kReadWrite;  // the user's own home
+  }
+  const auto found = path.share->access.find(user);
+  return found == path.share->access.end() ? Access::kNone : found->second;
+}
+
+bool IsWithin(const std::string& path, const std::string& folder) {
+  return path.compare(0, folder.size(), folder) == 0 &&
+         (path.size() == folder.size() || path[folder.size()] == '/');
+}
+
+const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_path) {
+  for (const Share& share : device.config.shares) {
+    if (IsWithin(real_path, device.VolumePath(share.volume) + "/" + share.name)) {
+      return &share;
+    }
+  }
+  return nullptr;
+}
+
+}  // namespace Device
+
+using Device::Operation;
+
+int PathInfoFactory::create(const char* user, const std::string& path, PathInfo& out) {
+  return Operation("PathInfoFactory::create", user, path).Run([&] {
+    Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), user, path);
+    if (resolved.error == 0 && Device::AccessOf(resolved, user) == Device::Access::kNone) {
+      resolved.error = Device::kErrNoPrivilege;  // the user does not even see the shared folder
+    }
+    if (resolved.error != 0) {
+      Device::SetLastError(resolved.error);
+      return 0;
+    }
+    out.share_path = resolved.user_path;
+    out.aux_1 = resolved.user_path.substr(1 + resolved.share_name.size());
+    out.real_path = resolved.real_path;
+    out.share_name = resolved.share_name;
+    out.volume_path = resolved.volume_path;
+    out.share_real_path = resolved.share_real_path;
+    out.aux_6 = user;
+    return 1;
+  });
+}
+
+int LumoFullPathGet(const char* path, std::string* full_path, std::string* home_test_path,
+                    std::string* aux_1, std::string* aux_2, const std::string* user,
+                    const char* charset) {
+  return Operation("LumoFullPathGet", path, *user, charset).Run([&] {
+    const Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), *user, path);
+    if (resolved.error != 0) {
+      Device::SetLastError(resolved.error);
+      return 0;
+    }
+    *full_path = resolved.real_path;
+    *home_test_path = resolved.real_path;
+    *aux_1 = resolved.share_name;
+    *aux_2 = resolved.volume_path;
+    return 1;
+  });
+}
+
+int IsDirUserHome(const std::string& path, const char* reserved) {
+  return Operation("IsDirUserHome", path, reserved).Run([&] {
+    const Device::OpenDevice& device = Device::TheDevice();
+    const Device::User* const user = device.config.FindUser(device.current_user);
+    return user != nullptr && Device::IsWithin(path, device.HomePath(*user)) ? 1 : 0;
+  });
+}
+
+int LumoCheckPath(const char* path, bool option_1, int flags, std::string* out, bool option_2,
+                  bool option_3, const char* reserved) {
+  return Operation("LumoCheckPath", path, option_1, flags, out, option_2, option_3, reserved)
+      .Run([&] { return Device::CheckPath(path); });
+}
+
+int LumoCheckFileName(const char* directory, const char* name) {
+  return Operation("LumoCheckFileName", directory, name).Run([&] {
+    return Device::CheckFileName(directory, name);
+  });
+}
+
+std::string FindCommonParent(std::vector<std::string> directories) {
+  return Operation("FindCommonParent", directories).Run([&] {
+    std::string parent = directories.empty() ? "/" : directories.front();
+    for (const std::string& directory : directories) {
+      parent = Device::CommonFolder(parent, directory);
+    }
+    return parent;
+  });
+}
+
+int VolumePathParse(const char* volume_path, VolumeInfo* out) {
+  return Operation("VolumePathParse", volume_path).Run([&] {
+    const Device::OpenDevice& device = Device::TheDevice();
+    std::uint32_t index = 0;
+    for (const std::string& volume : device.config.volumes) {
+      if (device.VolumePath(volume) == volume_path) {
+        *out = {{index, 0}};
+        return 0;
+      }
+      ++index;
+    }
+    Device::SetLastError(Device::kErrNotFound);
+    return -1;
+  });
+}

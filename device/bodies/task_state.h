@@ -1,0 +1,30 @@
+// What is behind a Vesk::Task: the row as this process knows it, and the writes that are gathered.
+// The task manager's own operations work on this, so that a trace shows the module's calls alone.
+#ifndef DEVICE_BODIES_TASK_STATE_H_
+#define DEVICE_BODIES_TASK_STATE_H_
+
+#include <json/json.h>
+
+#include <map>
+#include <string>
+
+#include "device/bodies/task_store.h"
+#include "platform/vesk/task_manager.h"
+
+struct Vesk::Task::State {
+  // Null when the task has none of that name.
+  Json::Value Get(const std::string& name) const;
+  // Stores at once, or gathers when an update is open. False when it is not stored.
+  bool Set(const std::string& name, const Json::Value& value);
+  // Stores what is gathered and closes the update. False, and a line logged, when it is not stored.
+  bool Store(bool is_finished);
+  void Reload();
+  void Remove();
+
+  std::string user;
+  Device::TaskRow row;
+  bool is_updating = false;
+  std::map<std::string, std::string> pending;  // name to JSON text
+};
+
+#endif  // DEVICE_BODIES_TASK_STATE_H_

@@ -1,0 +1,78 @@
+// The store of one user's tasks, notifications, workers and index entries: an SQLite database in
+// WAL mode in the user's own folder. Processes share it; a connection belongs to one process.
+#ifndef DEVICE_BODIES_TASK_STORE_H_
+#define DEVICE_BODIES_TASK_STORE_H_
+
+#include <sqlite3.h>
+#include <sys/types.h>
+
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace Device {
+
+// A task as the store has it.
+struct TaskRow {
+  std::string id;
+  bool finished = false;
+  std::int64_t updated = 0;                       // seconds since 1970
+  std::map<std::string, std::string> properties;  // name to JSON text
+};
+
+struct NotificationRow {
+  std::int64_t time = 0;  // seconds since 1970
+  std::string app;
+  std::string task;
+  std::string title;
+  std::string message;
+  std::vector<std::string> arguments;
+};
+
+// Every operation throws std::runtime_error, with the database's own reason, when it fails.
+class TaskStore {
+ public:
+  // Opens the user's store, and makes it when it is not there yet.
+  explicit TaskStore(const std::string& user);
+
+  void AddTask(const std::string& id);
+  std::optional<TaskRow> FindTask(const std::string& id);
+  std::vector<TaskRow> AllTasks();
+  // Stores the properties and the finished state together. False when there is no such task.
+  bool UpdateTask(const std::string& id, const std::map<std::string, std::string>& properties,
+                  bool finished);
+  void RemoveTask(const std::string& id);
+
+  // Worker processes, each with the time at which it started, in the kernel's ticks since boot, so
+  // that a process id that another process has taken over is not mistaken for it.
+  void AddWorker(pid_t pid, std::uint64_t start_time);
+  std::optional<std::uint64_t> FindWorker(pid_t pid);
+  std::vector<pid_t> AllWorkers();
+  void RemoveWorker(pid_t pid);
+
+  void AddNotification(const NotificationRow& row);
+  std::vector<NotificationRow> AllNotifications();
+
+  void AddToIndex(const std::string& path);
+
+ private:
+  class Statement;
+
+  void InTransaction(const std::function<void()>& body);
+  void ReadProperties(TaskRow& row);
+
+  std::unique_ptr<sqlite3, int (*)(sqlite3*)> database_;
+};
+
+// This process's connection to a user's store.
+TaskStore& StoreOf(const std::string& user);
+// Closes this process's connections. To be called before a fork: none may cross it.
+void CloseStores();
+
+}  // namespace Device
+
+#endif  // DEVICE_BODIES_TASK_STORE_H_

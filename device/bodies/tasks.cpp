@@ -1,0 +1,217 @@
+// Vesk::Task and Vesk::TaskMgr over the task store.
+#include <syslog.h>
+
+#include <cstdarg>
+#include <cstdint>
+#include <ctime>
+#include <memory>
+#include <stdexcept>
+#include <utility>
+
+#include "device/bodies/device.h"
+#include "device/bodies/json_text.h"
+#include "device/bodies/operations.h"
+#include "device/bodies/random_id.h"
+#include "device/bodies/task_state.h"
+
+using Device::Operation;
+
+namespace Vesk {
+
+struct TaskMgr::State {
+  std::string user;
+};
+
+namespace {
+
+constexpr std::size_t kTaskIdBytes = 8;
+constexpr char kPropNotify[] = "blMsg";
+
+// How many arguments follow a message key.
+struct MessageRow {
+  const char* key;
+  std::size_t arguments;
+};
+constexpr MessageRow kMessages[] = {
+    {"filebrowser:filebrowser_compress_completed", 1},
+    {"filebrowser:filebrowser_compress_failed", 2},
+};
+
+std::size_t ArgumentCount(const std::string& message) {
+  for (const MessageRow& row : kMessages) {
+    if (message == row.key) {
+      return row.arguments;
+    }
+  }
+  return 0;
+}
+
+void LogFailure(const char* operation, const std::exception& error) {
+  syslog(LOG_ERR, "%s: %s", operation, error.what());
+}
+
+}  // namespace
+
+Json::Value Task::State::Get(const std::string& name) const {
+  const auto found = row.properties.find(name);
+  return found == row.properties.end() ? Json::Value() : Device::ParseJson(found->second);
+}
+
+bool Task::State::Set(const std::string& name, const Json::Value& value) {
+  const std::string text = Device::ToText(value);
+  row.properties[name] = text;
+  pending[name] = text;
+  return is_updating || Store(false);
+}
+
+bool Task::State::Store(bool is_finished) {
+  is_updating = false;
+  const std::map<std::string, std::string> writes = std::exchange(pending, {});
+  try {
+    const bool is_stored = Device::StoreOf(user).UpdateTask(row.id, writes, is_finished);
+    row.finished = row.finished || (is_stored && is_finished);
+    return is_stored;
+  } catch (const std::exception& error) {
+    LogFailure("store task", error);
+    return false;
+  }
+}
+
+void Task::State::Reload() {
+  try {
+    std::optional<Device::TaskRow> stored = Device::StoreOf(user).FindTask(row.id);
+    // A task that was removed meanwhile has no properties.
+    row.properties.clear();
+    if (stored) {
+      row = std::move(*stored);
+    }
+  } catch (const std::exception& error) {
+    LogFailure("reload task", error);
+  }
+}
+
+void Task::State::Remove() {
+  try {
+    Device::StoreOf(user).RemoveTask(row.id);
+  } catch (const std::exception& error) {
+    LogFailure("remove task", error);
+  }
+}
+
+Task::Task(const char* user, const char* task_id) : state(nullptr) {
+  Operation("Vesk::Task::Task", user, task_id).Run([&] {
+    auto task_state = std::make_unique<State>();
+    task_state->user = user;
+    task_state->row.id = task_id;
+    Device::StoreOf(user).AddTask(task_id);
+    // Nobody watches the task: the desktop is to be told of its end.
+    if (!task_state->Set(kPropNotify, !Device::TheDevice().is_followed)) {
+      throw std::runtime_error("task '" + task_state->row.id + "' is not stored");
+    }
+    state = task_state.release();
+  });
+}
+
+Task::Task(State* task_state) : state(task_state) {}
+
+Task::~Task() { delete state; }
+
+const char* Task::getTaskId() const {
+  return Operation("Vesk::Task::getTaskId").Run([&] { return state->row.id.c_str(); });
+}
+
+void Task::beginUpdate() {
+  Operation("Vesk::Task::beginUpdate").Run([&] { state->is_updating = true; });
+}
+
+bool Task::endUpdate() {
+  return Operation("Vesk::Task::endUpdate").Run([&] { return state->Store(false); });
+}
+
+bool Task::setProperty(const char* name, const Json::Value& value) {
+  return Operation("Vesk::Task::setProperty", name, value).Run([&] {
+    return state->Set(name, value);
+  });
+}
+
+Json::Value Task::getProperty(const char* name) const {
+  return Operation("Vesk::Task::getProperty", name).Run([&] { return state->Get(name); });
+}
+
+bool Task::getBoolProperty(const char* name, bool fallback) const {
+  return Operation("Vesk::Task::getBoolProperty", name, fallback).Run([&] {
+    const Json::Value value = state->Get(name);
+    return value.isBool() ? value.asBool() : fallback;
+  });
+}
+
+double Task::getDoubleProperty(const char* name, double fallback) const {
+  return Operation("Vesk::Task::getDoubleProperty", name, fallback).Run([&] {
+    const Json::Value value = state->Get(name);
+    return value.isNumeric() ? value.asDouble() : fallback;
+  });
+}
+
+void Task::reload() {
+  Operation("Vesk::Task::reload").Run([&] { state->Reload(); });
+}
+
+bool Task::finish(bool reserved) {
+  return Operation("Vesk::Task::finish", reserved).Run([&] { return state->Store(true); });
+}
+
+bool Task::isFinished() const {
+  return Operation("Vesk::Task::isFinished").Run([&] { return state->row.finished; });
+}
+
+void Task::remove() {
+  Operation("Vesk::Task::remove").Run([&] { state->Remove(); });
+}
+
+void Task::sendNotifyMessageNoEncode(const char* app, const char* task_id, const char* title,
+                                     const char* message, ...) {
+  Device::NotificationRow row{std::time(nullptr), app, task_id, title, message, {}};
+  va_list arguments;
+  va_start(arguments, message);
+  for (std::size_t count = ArgumentCount(message); count > 0; --count) {
+    const char* const argument = va_arg(arguments, const char*);
+    row.arguments.emplace_back(argument == nullptr ? "" : argument);
+  }
+  va_end(arguments);
+  Operation("Vesk::Task::sendNotifyMessageNoEncode", app, task_id, title, message, row.arguments)
+      .Run([&] {
+        try {
+          Device::StoreOf(state->user).AddNotification(row);
+        } catch (const std::exception& error) {
+          LogFailure("send notification", error);
+        }
+      });
+}
+
+TaskMgr::TaskMgr(const char* user) : state_(nullptr) {
+  Operation("Vesk::TaskMgr::TaskMgr", user).Run([&] { state_ = new State{user}; });
+}
+
+TaskMgr::~TaskMgr() { delete state_; }
+
+std::string TaskMgr::getUniqueTaskId(const char* prefix) {
+  return Operation("Vesk::TaskMgr::getUniqueTaskId", prefix).Run([&] {
+    std::string id;
+    do {
+      id = prefix + Device::RandomId(kTaskIdBytes);
+    } while (Device::StoreOf(state_->user).FindTask(id));
+    return id;
+  });
+}
+
+Task* TaskMgr::getTaskWithThrow(const char* task_id) {
+  return Operation("Vesk::TaskMgr::getTaskWithThrow", task_id).Run([&] {
+    std::optional<Device::TaskRow> row = Device::StoreOf(state_->user).FindTask(task_id);
+    if (!row) {
+      throw std::runtime_error("no task '" + std::string(task_id) + "'");
+    }
+    return new Task(new Task::State{state_->user, std::move(*row), false, {}});
+  });
+}
+
+}  // namespace Vesk

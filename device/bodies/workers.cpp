@@ -1,0 +1,134 @@
+#include "device/bodies/workers.h"
+
+#include <dirent.h>
+#include <poll.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cctype>
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <fstream>
+#include <memory>
+#include <optional>
+#include <sstream>
+#include <stdexcept>
+
+#include "device/bodies/file_descriptor.h"
+#include "device/bodies/task_store.h"
+
+namespace Device {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr std::chrono::seconds kGrace(5);
+constexpr std::chrono::milliseconds kGroupPoll(5);
+
+struct ProcessStat {
+  char state = 0;  // as in /proc/PID/stat: 'Z' for a zombie
+  pid_t group = 0;
+  std::uint64_t start_time = 0;  // ticks since boot
+};
+
+std::optional<ProcessStat> ReadStat(pid_t pid) {
+  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
+  std::string text;
+  if (!std::getline(file, text, '\0')) {
+    return std::nullopt;
+  }
+  // The second field, the program's name, may hold blanks and brackets.
+  std::istringstream fields(text.substr(std::min(text.rfind(')'), text.size() - 1) + 1));
+  constexpr int kFieldsBetween = 16;  // from session to the one before start_time
+  ProcessStat stat;
+  pid_t parent = 0;
+  fields >> stat.state >> parent >> stat.group;
+  std::string skipped;
+  for (int field = 0; field < kFieldsBetween; ++field) {
+    fields >> skipped;
+  }
+  fields >> stat.start_time;
+  return fields ? std::optional<ProcessStat>(stat) : std::nullopt;
+}
+
+bool HasEnded(const ProcessStat& stat) { return stat.state == 'Z' || stat.state == 'X'; }
+
+bool IsGroupAlive(pid_t group) {
+  const std::unique_ptr<DIR, int (*)(DIR*)> processes(opendir("/proc"), closedir);
+  while (const dirent* const entry = processes ? readdir(processes.get()) : nullptr) {
+    if (std::isdigit(static_cast<unsigned char>(entry->d_name[0])) != 0) {
+      const std::optional<ProcessStat> stat = ReadStat(std::atoi(entry->d_name));
+      if (stat && stat->group == group && !HasEnded(*stat)) {
+        return true;
+      }
+    }
+  }
+  return false;
+}
+
+bool WaitForGroup(pid_t group, Clock::time_point deadline) {
+  while (IsGroupAlive(group)) {
+    if (Clock::now() >= deadline) {
+      return false;
+    }
+    poll(nullptr, 0, static_cast<int>(kGroupPoll.count()));
+  }
+  return true;
+}
+
+void WaitForProcess(const FileDescriptor& process, Clock::time_point deadline) {
+  const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
+  pollfd ended = {process.Get(), POLLIN, 0};
+  poll(&ended, 1, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
+}
+
+}  // namespace
+
+void RegisterWorker(const std::string& user, pid_t pid) {
+  const std::optional<ProcessStat> stat = ReadStat(pid);
+  if (!stat) {
+    throw std::runtime_error("no process " + std::to_string(pid));
+  }
+  StoreOf(user).AddWorker(pid, stat->start_time);
+}
+
+bool IsWorkerAlive(const std::string& user, pid_t pid) {
+  const std::optional<std::uint64_t> start_time = StoreOf(user).FindWorker(pid);
+  const std::optional<ProcessStat> stat = ReadStat(pid);
+  return start_time && stat && stat->start_time == *start_time && !HasEnded(*stat);
+}
+
+bool EndWorker(const std::string& user, pid_t pid) {
+  if (!StoreOf(user).FindWorker(pid)) {
+    return false;
+  }
+  // The descriptor holds on to the process that has the id now; whether that is the worker is asked
+  // after, so that no other can slip in between.
+  const FileDescriptor process(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
+  if (!process || !IsWorkerAlive(user, pid)) {
+    return true;  // it has ended already
+  }
+  const Clock::time_point deadline = Clock::now() + kGrace;
+  if (syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) != 0) {
+    return false;
+  }
+  WaitForProcess(process, deadline);
+  if (WaitForGroup(pid, deadline)) {
+    return true;
+  }
+  kill(-pid, SIGKILL);
+  return WaitForGroup(pid, Clock::now() + kGrace);
+}
+
+void ForgetEndedWorkers(const std::string& user) {
+  for (const pid_t pid : StoreOf(user).AllWorkers()) {
+    if (!IsWorkerAlive(user, pid)) {
+      StoreOf(user).RemoveWorker(pid);
+    }
+  }
+}
+
+}  // namespace Device

@@ -1,0 +1,27 @@
+// Worker processes of a user: known by process id and start time, so that one that has taken over a
+// process id is never taken for a worker.
+#ifndef DEVICE_BODIES_WORKERS_H_
+#define DEVICE_BODIES_WORKERS_H_
+
+#include <sys/types.h>
+
+#include <string>
+
+namespace Device {
+
+// Enters a process that has just been forked. Throws std::runtime_error.
+void RegisterWorker(const std::string& user, pid_t pid);
+
+// True if the process is a worker of the user's and has not ended; a zombie has.
+bool IsWorkerAlive(const std::string& user, pid_t pid);
+
+// Ends a worker of the user's and all that runs in its process group: asks first, and insists after
+// a grace of 5 s. False when it is none, or could not be ended.
+bool EndWorker(const std::string& user, pid_t pid);
+
+// Forgets the workers that have ended.
+void ForgetEndedWorkers(const std::string& user);
+
+}  // namespace Device
+
+#endif  // DEVICE_BODIES_WORKERS_H_

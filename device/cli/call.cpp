@@ -1,0 +1,54 @@
+// "call": one request through the module.
+#include <iostream>
+#include <stdexcept>
+
+#include "device/bodies/device.h"
+#include "device/bodies/json_text.h"
+#include "device/cli/commands.h"
+#include "device/host/launcher.h"
+
+namespace Device {
+
+namespace {
+
+// NAME:=JSON, or NAME=TEXT.
+void AddParam(const std::string& text, Json::Value& params) {
+  const std::size_t equals = text.find('=');
+  if (equals == std::string::npos || equals == 0) {
+    throw std::runtime_error("parameter '" + text + "': expected NAME=TEXT or NAME:=JSON");
+  }
+  const std::string value = text.substr(equals + 1);
+  if (text[equals - 1] != ':') {
+    params[text.substr(0, equals)] = value;
+    return;
+  }
+  const std::string name = text.substr(0, equals - 1);
+  try {
+    params[name] = ParseJson(value);
+  } catch (const std::exception& error) {
+    throw std::runtime_error("parameter '" + name + "': " + error.what());
+  }
+}
+
+}  // namespace
+
+int CallCommand(const CallOptions& options) {
+  Open(options.folder);
+  Launcher launcher;
+  Request request;
+  request.api = options.api;
+  request.method = options.method;
+  request.version = options.version;
+  request.user = options.user;
+  request.session_id = SignIn(options.user);
+  for (const std::string& param : options.params) {
+    AddParam(param, request.params);
+  }
+  const Outcome outcome = launcher.Call(request);
+  // Built by hand, so that the code comes first.
+  std::cout << R"({"code":)" << outcome.code << R"(,"data":)" << ToText(outcome.data) << "}\n"
+            << std::flush;
+  return outcome.code == 0 ? kExitDone : kExitFailed;
+}
+
+}  // namespace Device

@@ -1,0 +1,185 @@
+// "compress": one job from start to end, with its progress.
+#include <poll.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cmath>
+#include <csignal>
+#include <iostream>
+#include <stdexcept>
+
+#include "device/bodies/device.h"
+#include "device/bodies/errors.h"
+#include "device/bodies/json_text.h"
+#include "device/bodies/text_file.h"
+#include "device/cli/commands.h"
+#include "device/cli/progress_display.h"
+#include "device/host/launcher.h"
+
+namespace Device {
+
+namespace {
+
+constexpr char kApi[] = "KAVO.Zantro.Compress";
+constexpr int kApiVersion = 3;
+constexpr int kFirstPauseMs = 10;
+constexpr int kLongestPauseMs = 250;
+
+volatile std::sig_atomic_t is_interrupted = 0;
+
+void NoteInterrupt(int /*signal_number*/) { is_interrupted = 1; }
+
+// Paths as the text of a JSON array, so that a name may hold a comma.
+std::string ListText(std::vector<std::string>::const_iterator begin,
+                     std::vector<std::string>::const_iterator end) {
+  Json::Value list(Json::arrayValue);
+  std::for_each(begin, end, [&](const std::string& path) { list.append(path); });
+  return ToText(list);
+}
+
+bool EndsWith(const std::string& text, const std::string& ending) {
+  return text.size() >= ending.size() &&
+         text.compare(text.size() - ending.size(), ending.size(), ending) == 0;
+}
+
+Json::Value StartParams(const CompressOptions& options) {
+  const auto dest = options.paths.end() - 1;
+  Json::Value params(Json::objectValue);
+  params["path"] = ListText(options.paths.begin(), dest);
+  params["dest_file_path"] = ListText(dest, options.paths.end());
+  params["format"] = !options.format.empty()  ? options.format
+                     : EndsWith(*dest, ".7z") ? "7z"
+                                              : "zip";
+  if (!options.level.empty()) {
+    params["level"] = options.level;
+  }
+  if (!options.mode.empty()) {
+    params["mode"] = options.mode;
+  }
+  if (!options.codepage.empty()) {
+    params["codepage"] = options.codepage;
+  }
+  if (!options.password_file.empty()) {
+    const std::string text = ReadTextFile(options.password_file);
+    const std::string password = text.substr(0, text.find_first_of("\r\n"));
+    if (password.empty()) {
+      throw std::runtime_error("password file '" + options.password_file + "' has an empty line");
+    }
+    params["password"] = password;
+  }
+  return params;
+}
+
+void PrintError(const std::string& path, int code) {
+  std::cout << path << ": " << code << ' ' << ErrorText(code) << '\n';
+}
+
+// One job: the requests that a client of the API makes.
+class Job {
+ public:
+  explicit Job(const CompressOptions& options)
+      : dest_(options.paths.back()), params_(StartParams(options)), user_(options.user) {
+    session_id_ = SignIn(user_);
+  }
+
+  int Run() {
+    const Outcome started = Ask("start", params_);
+    if (started.code != 0) {
+      PrintError(dest_, started.code);
+      return kExitFailed;
+    }
+    task_id_ = started.data["taskid"].asString();
+    return Follow();
+  }
+
+ private:
+  Outcome Ask(const std::string& method, const Json::Value& params) {
+    Request request;
+    request.api = kApi;
+    request.method = method;
+    request.version = kApiVersion;
+    request.params = params;
+    request.user = user_;
+    request.session_id = session_id_;
+    request.is_followed = true;
+    return launcher_.Call(request);
+  }
+
+  Outcome AskAboutTask(const std::string& method) {
+    Json::Value params(Json::objectValue);
+    params["taskid"] = task_id_;
+    return Ask(method, params);
+  }
+
+  int Follow() {
+    ProgressDisplay display;
+    int pause = kFirstPauseMs;
+    for (;;) {
+      if (is_interrupted != 0) {
+        display.Clear();
+        return Stop();
+      }
+      const Outcome outcome = AskAboutTask("status");
+      if (outcome.code != 0 || outcome.data["finished"].asBool()) {
+        display.Clear();
+        Launcher::Reap();
+        return Report(outcome);
+      }
+      display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
+      Launcher::Reap();
+      poll(nullptr, 0, pause);
+      pause = std::min(2 * pause, kLongestPauseMs);
+    }
+  }
+
+  int Stop() {
+    const Outcome outcome = AskAboutTask("stop");
+    if (outcome.code != 0) {
+      PrintError(dest_, outcome.code);
+    } else {
+      std::cout << dest_ << ": stopped\n";
+    }
+    return kExitFailed;
+  }
+
+  int Report(const Outcome& outcome) const {
+    if (outcome.code != 0) {
+      // The task is gone though its end was never reported: its process died.
+      PrintError(dest_, outcome.code);
+      return kExitFailed;
+    }
+    if (!outcome.data.isMember("errors")) {
+      std::cout << dest_ << '\n';
+      return kExitDone;
+    }
+    const Json::Value& errors = outcome.data["errors"];
+    for (const Json::Value& item : errors) {
+      const std::string path = item["path"].asString();
+      PrintError(path.empty() ? dest_ : path, item["code"].asInt());
+    }
+    if (errors.empty()) {
+      std::cout << dest_ << ": failed without a reason\n";
+    }
+    return kExitFailed;
+  }
+
+  const std::string dest_;
+  const Json::Value params_;
+  const std::string user_;
+  std::string session_id_;
+  std::string task_id_;
+  Launcher launcher_;
+};
+
+}  // namespace
+
+int CompressCommand(const CompressOptions& options) {
+  Open(options.folder);
+  Job job(options);
+  for (const int signal_number : {SIGINT, SIGTERM, SIGHUP}) {
+    std::signal(signal_number, NoteInterrupt);
+  }
+  return job.Run();
+}
+
+}  // namespace Device

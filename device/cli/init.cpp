@@ -1,0 +1,134 @@
+// "init": makes a device, with sample files when nothing else is asked for.
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+#include <random>
+#include <stdexcept>
+
+#include "device/bodies/config.h"
+#include "device/bodies/device.h"
+#include "device/bodies/text_file.h"
+#include "device/cli/commands.h"
+
+namespace Device {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr char kSampleConfig[] = R"({
+  "volumes": ["vol1", "vol2"],
+  "users": [
+    { "name": "alice", "uid": 65001, "admin": true, "home": "vol1" },
+    { "name": "bob", "uid": 65002, "home": "vol1", "codepage": "CP932" },
+    { "name": "carol", "uid": 65003, "home": "vol2" }
+  ],
+  "shares": [
+    { "name": "photo", "volume": "vol1",
+      "access": { "alice": "rw", "bob": "rw", "carol": "ro" } },
+    { "name": "music", "volume": "vol1",
+      "access": { "alice": "rw", "bob": "ro", "carol": "list-denied" } },
+    { "name": "video", "volume": "vol2",
+      "access": { "alice": "rw", "bob": "rw" } },
+    { "name": "vault", "volume": "vol2", "encrypted": true,
+      "access": { "alice": "rw" } },
+    { "name": "attic", "volume": "vol1", "read_only": true,
+      "access": { "alice": "rw", "bob": "rw" } }
+  ]
+}
+)";
+constexpr char kSampleOwner[] = "alice";
+
+constexpr std::size_t kKiB = 1024;
+constexpr std::size_t kMiB = 1024 * kKiB;
+
+struct SampleFile {
+  const char* path;
+  std::size_t size;  // bytes
+};
+constexpr SampleFile kSampleFiles[] = {
+    {"vol1/photo/cat.jpg", 300 * kKiB},
+    {"vol1/photo/trip/day1/a.jpg", 3 * kMiB},
+    {"vol1/photo/trip/day1/b, the second.jpg", 2 * kMiB},
+    {"vol1/photo/trip/day1/@eaDir/a.jpg/thumb.jpg", 20 * kKiB},
+    {"vol1/photo/trip/日の出.jpg", 4 * kMiB},
+    {"vol1/music/album/01 Été.mp3", 5 * kMiB},
+    {"vol1/music/album/02.mp3", 6 * kMiB},
+    {"vol1/attic/old.txt", kKiB},
+    {"vol2/video/clip.mp4", 12 * kMiB},
+    {"vol2/vault/letter.txt", kKiB},
+    {"vol1/homes/alice/notes.txt", kKiB},
+};
+constexpr char kSampleEmptyFolder[] = "vol1/photo/trip/empty";
+
+struct SampleLink {
+  const char* path;
+  const char* target;
+};
+constexpr SampleLink kSampleLinks[] = {
+    {"vol1/photo/trip/best.jpg", "day1/a.jpg"},  // inside the shared folder
+    {"vol1/photo/host", "/etc"},                 // off the device
+};
+
+// Bytes that do not compress, the same in every device.
+void WriteNoise(const fs::path& path, std::size_t size) {
+  std::mt19937_64 noise(std::hash<std::string>{}(path.filename().string()));
+  std::ofstream file(path, std::ios::binary);
+  for (std::size_t at = 0; at < size; at += sizeof(std::uint64_t)) {
+    const std::uint64_t word = noise();
+    file.write(reinterpret_cast<const char*>(&word), std::min(sizeof word, size - at));
+  }
+  if (!file.flush()) {
+    throw std::runtime_error("sample file '" + path.string() + "': " + std::strerror(errno));
+  }
+}
+
+// Gives what the sample put below a folder of the device to its owner, not the folder itself.
+void GiveToOwner(const fs::path& folder) {
+  const User* const owner = ParseConfig(kSampleConfig).FindUser(kSampleOwner);
+  if (geteuid() != 0 || owner == nullptr) {
+    return;
+  }
+  for (const fs::directory_entry& entry : fs::recursive_directory_iterator(folder)) {
+    if (lchown(entry.path().c_str(), owner->uid, kUsersGroup) != 0) {
+      throw std::runtime_error("owner of '" + entry.path().string() + "': " + std::strerror(errno));
+    }
+  }
+}
+
+void AddSampleFiles(const fs::path& root) {
+  for (const SampleFile& file : kSampleFiles) {
+    fs::create_directories((root / file.path).parent_path());
+    WriteNoise(root / file.path, file.size);
+  }
+  fs::create_directories(root / kSampleEmptyFolder);
+  for (const SampleLink& link : kSampleLinks) {
+    fs::create_symlink(link.target, root / link.path);
+  }
+  for (const char* folder :
+       {"vol1/photo", "vol1/music", "vol1/attic", "vol2/video", "vol2/vault", "vol1/homes/alice"}) {
+    GiveToOwner(root / folder);
+  }
+}
+
+}  // namespace
+
+int InitCommand(const std::string& folder, const std::string& config_file) {
+  umask(0022);
+  if (!config_file.empty()) {
+    Make(folder, ReadTextFile(config_file));
+  } else {
+    Make(folder, kSampleConfig);
+    AddSampleFiles(folder);
+  }
+  std::cout << "made device '" << folder << "'\n";
+  return kExitDone;
+}
+
+}  // namespace Device

@@ -1,0 +1,105 @@
+// "tasks" and "notifications": what the device keeps for a user, read under that user's identity.
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <ctime>
+#include <functional>
+#include <iostream>
+#include <stdexcept>
+
+#include "device/bodies/device.h"
+#include "device/bodies/json_text.h"
+#include "device/bodies/task_store.h"
+#include "device/bodies/workers.h"
+#include "device/cli/commands.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+namespace {
+
+// Runs the body in a process that has the user's identity.
+int RunAs(const std::string& user, const std::function<void()>& body) {
+  if (TheDevice().config.FindUser(user) == nullptr) {
+    throw std::runtime_error("no user '" + user + "'");
+  }
+  const pid_t pid = fork();
+  if (pid == 0) {
+    try {
+      if (LumoLibUGIDSet(nullptr, user.c_str()) < 0) {
+        throw std::runtime_error("cannot take on the identity of '" + user + "'");
+      }
+      body();
+      std::cout.flush();
+      CloseStores();
+      _exit(kExitDone);
+    } catch (const std::exception& error) {
+      std::cerr << "kavo-device: " << error.what() << '\n';
+      _exit(kExitFailed);
+    }
+  }
+  int status = 0;
+  if (pid < 0 || waitpid(pid, &status, 0) < 0 || !WIFEXITED(status)) {
+    throw std::runtime_error("cannot run a process as '" + user + "'");
+  }
+  return WEXITSTATUS(status);
+}
+
+Json::Value Property(const TaskRow& row, const std::string& name) {
+  const auto found = row.properties.find(name);
+  return found == row.properties.end() ? Json::Value() : ParseJson(found->second);
+}
+
+std::string StateOf(const TaskRow& row, const Json::Value& data, const std::string& user) {
+  if (data.isObject() && data.isMember("errors")) {
+    return "failed";
+  }
+  if (row.finished) {
+    return "finished";
+  }
+  const bool has_pid = data.isObject() && data["pid"].isInt();
+  return !has_pid || IsWorkerAlive(user, data["pid"].asInt()) ? "running" : "dead";
+}
+
+void PrintTask(const TaskRow& row, const std::string& user) {
+  const Json::Value data = Property(row, "data");
+  const Json::Value progress = Property(row, "progress");
+  const int percent = progress.isNumeric() ? static_cast<int>(progress.asDouble() * 100 + 0.5) : 0;
+  const Json::Value dest = data.isObject() ? data["params"]["dest_file_path"] : Json::Value();
+  std::cout << row.id << '\t' << StateOf(row, data, user) << '\t' << percent << " %\t"
+            << (dest.isString() ? dest.asString() : "") << '\n';
+}
+
+std::string TimeText(std::time_t time) {
+  std::tm local{};
+  char text[sizeof "2000-01-01 00:00:00"];
+  localtime_r(&time, &local);
+  std::strftime(text, sizeof text, "%F %T", &local);
+  return text;
+}
+
+}  // namespace
+
+int TasksCommand(const std::string& folder, const std::string& user) {
+  Open(folder);
+  return RunAs(user, [&] {
+    for (const TaskRow& row : StoreOf(user).AllTasks()) {
+      PrintTask(row, user);
+    }
+  });
+}
+
+int NotificationsCommand(const std::string& folder, const std::string& user) {
+  Open(folder);
+  return RunAs(user, [&] {
+    for (const NotificationRow& row : StoreOf(user).AllNotifications()) {
+      std::cout << TimeText(row.time) << '\t' << row.task << '\t' << row.message;
+      for (const std::string& argument : row.arguments) {
+        std::cout << '\t' << argument;
+      }
+      std::cout << '\n';
+    }
+  });
+}
+
+}  // namespace Device

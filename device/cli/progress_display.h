@@ -1,0 +1,23 @@
+// A job's progress on standard output: a bar on a terminal, a line per change elsewhere.
+#ifndef DEVICE_CLI_PROGRESS_DISPLAY_H_
+#define DEVICE_CLI_PROGRESS_DISPLAY_H_
+
+namespace Device {
+
+class ProgressDisplay {
+ public:
+  ProgressDisplay();
+
+  // `percent` from 0 to 100. Draws nothing when it has not changed.
+  void Show(int percent);
+  // Takes the bar off the terminal.
+  void Clear() const;
+
+ private:
+  bool is_terminal_;
+  int shown_ = -1;
+};
+
+}  // namespace Device
+
+#endif  // DEVICE_CLI_PROGRESS_DISPLAY_H_

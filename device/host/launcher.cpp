@@ -1,0 +1,188 @@
+#include "device/host/launcher.h"
+
+#include <dlfcn.h>
+#include <fcntl.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <stdexcept>
+
+#include "device/bodies/device.h"
+#include "device/bodies/errors.h"
+#include "device/bodies/json_text.h"
+#include "device/bodies/random_id.h"
+#include "device/bodies/task_store.h"
+#include "device/host/request_state.h"
+
+namespace Device {
+
+namespace {
+
+constexpr std::size_t kSessionIdBytes = 16;
+constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
+
+std::string DlError() {
+  const char* const reason = dlerror();
+  return reason == nullptr ? "unknown reason" : reason;
+}
+
+void* LoadModule() {
+  const std::filesystem::path path =
+      std::filesystem::read_symlink("/proc/self/exe").parent_path() / kModuleName;
+  void* const module = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+  if (module == nullptr) {
+    throw std::runtime_error("cannot load module: " + DlError());
+  }
+  return module;
+}
+
+const ApiRow* GetTable(void* module) {
+  auto* const get_table = reinterpret_cast<void* (*)()>(dlsym(module, "GetAPITable"));
+  if (get_table == nullptr) {
+    throw std::runtime_error("cannot load module: " + DlError());
+  }
+  return static_cast<const ApiRow*>(get_table());
+}
+
+// The outcome travels as a frame: its length, then its JSON text. Whoever else still holds the pipe
+// does not matter then.
+bool WriteFrame(int fd, const Outcome& outcome) {
+  Json::Value frame(Json::objectValue);
+  frame["code"] = outcome.code;
+  frame["data"] = outcome.data;
+  const std::string text = ToText(frame);
+  const auto length = static_cast<std::uint32_t>(text.size());
+  std::string bytes(reinterpret_cast<const char*>(&length), sizeof length);
+  bytes += text;
+  for (std::size_t at = 0; at < bytes.size();) {
+    const ssize_t written = write(fd, bytes.data() + at, bytes.size() - at);
+    if (written < 0 && errno != EINTR) {
+      return false;
+    }
+    at += written < 0 ? 0 : static_cast<std::size_t>(written);
+  }
+  return true;
+}
+
+bool ReadAll(int fd, char* to, std::size_t size) {
+  for (std::size_t at = 0; at < size;) {
+    const ssize_t got = read(fd, to + at, size - at);
+    if (got == 0 || (got < 0 && errno != EINTR)) {
+      return false;
+    }
+    at += got < 0 ? 0 : static_cast<std::size_t>(got);
+  }
+  return true;
+}
+
+// False when the other side is gone without a frame.
+bool ReadFrame(int fd, Outcome& outcome) {
+  std::uint32_t length = 0;
+  if (!ReadAll(fd, reinterpret_cast<char*>(&length), sizeof length)) {
+    return false;
+  }
+  std::string text(length, '\0');
+  if (!ReadAll(fd, text.data(), text.size())) {
+    return false;
+  }
+  const Json::Value frame = ParseJson(text);
+  outcome = {frame["code"].asInt(), frame["data"]};
+  return true;
+}
+
+}  // namespace
+
+Launcher::Launcher() : module_(LoadModule(), dlclose), table_(GetTable(module_.get())) {
+  prctl(PR_SET_CHILD_SUBREAPER, 1);
+}
+
+const ApiRow* Launcher::FindRow(const Request& request, int& code) const {
+  code = kErrNoApi;
+  for (const ApiRow* row = table_; row->api != nullptr; ++row) {
+    if (request.api != row->api) {
+      continue;
+    }
+    if (request.method != row->method) {
+      code = code == kErrNoApi ? kErrNoMethod : code;
+      continue;
+    }
+    if (row->version == request.version) {
+      return row;
+    }
+    code = kErrNoVersion;
+  }
+  return nullptr;
+}
+
+Outcome Launcher::CallHere(const Request& request) {
+  Outcome outcome;
+  const ApiRow* const row = FindRow(request, outcome.code);
+  if (row == nullptr) {
+    return outcome;
+  }
+  TheDevice().is_followed = request.is_followed;
+  KAVO::APIRequest::State request_state{request};
+  KAVO::APIResponse::State response_state;
+  KAVO::APIRequest api_request{&request_state};
+  KAVO::APIResponse api_response{&response_state};
+  row->handler(&api_request, &api_response);
+  return response_state.outcome;
+}
+
+Outcome Launcher::Call(const Request& request) {
+  Outcome outcome;
+  if (FindRow(request, outcome.code) == nullptr) {
+    return outcome;
+  }
+  int ends[2];
+  if (pipe2(ends, O_CLOEXEC) != 0) {
+    return {kErrInternal, Json::Value()};
+  }
+  const FileDescriptor read_end(ends[0]);
+  FileDescriptor write_end(ends[1]);
+  const pid_t pid = fork();
+  if (pid < 0) {
+    syslog(LOG_ERR, "cannot fork request process: %m");
+    return {kErrInternal, Json::Value()};
+  }
+  if (pid == 0) {
+    TheDevice().outcome = std::move(write_end);
+    try {
+      outcome = CallHere(request);
+    } catch (const Json::Exception& error) {
+      syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
+      outcome = {kErrBadParameter, Json::Value()};
+    } catch (const std::exception& error) {
+      syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
+      outcome = {kErrInternal, Json::Value()};
+    }
+    CloseStores();
+    _exit(WriteFrame(TheDevice().outcome.Get(), outcome) ? 0 : 1);
+  }
+  write_end.Close();
+  if (!ReadFrame(read_end.Get(), outcome)) {
+    syslog(LOG_ERR, "request process %d ended without an outcome", static_cast<int>(pid));
+    outcome = {kErrInternal, Json::Value()};
+  }
+  while (waitpid(pid, nullptr, 0) < 0 && errno == EINTR) {
+  }
+  return outcome;
+}
+
+void Launcher::Reap() {
+  while (waitpid(-1, nullptr, WNOHANG) > 0) {
+  }
+}
+
+std::string SignIn(const std::string& user) {
+  std::string id = RandomId(kSessionIdBytes);
+  TheDevice().sessions[id] = user;
+  return id;
+}
+
+}  // namespace Device

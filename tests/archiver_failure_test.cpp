@@ -1,0 +1,240 @@
+#include <grp.h>
+#include <sched.h>
+#include <sys/file.h>
+#include <sys/mount.h>
+#include <sys/prctl.h>
+
+#include "device/archiver/cancel.h"
+#include "device/archiver/failure.h"
+#include "device/archiver/report.h"
+#include "device/archiver/stock_7z.h"
+#include "tests/archiver_test_support.h"
+
+namespace ArchiverTest {
+namespace {
+
+constexpr uint64_t kHuge = 5ULL << 30U;  // sparse: it takes seconds to pack, and no room
+
+class Failing : public ArchiverFixture {
+ protected:
+  void Bad(const Outcome& outcome, const std::string& cause) {
+    EXPECT_NE(outcome.status, 0);
+    EXPECT_EQ(outcome.Last().rfind("Error: ", 0), 0U) << outcome.text;
+    EXPECT_NE(outcome.Last().find(cause), std::string::npos) << outcome.text;
+    EXPECT_EQ(outcome.text.find("Error:"), outcome.text.rfind("Error:")) << outcome.text;
+    EXPECT_EQ(outcome.Count("Progress: 100"), 0);
+  }
+  void MakeHuge() {
+    WriteFile(share / "huge", "");
+    fs::resize_file(share / "huge", kHuge);
+  }
+};
+
+TEST_F(Failing, NamesWhatIsMissingAndLeavesTheOldArchive) {
+  WriteFile(share / "a", "a");
+  ASSERT_EQ(Pack(out / "old", {"a"}).status, 0);
+  const std::string old = ReadFile(out / "old");
+  for (const char* target : {"new", "old"}) {
+    Bad(Pack(out / target, {"a", "mis*sing"}), "mis*sing");
+    Bad(Pack(out / target, {"a", "a/below"}), "a/below");
+  }
+  EXPECT_EQ(InOut(), Strings{"old"});
+  EXPECT_EQ(ReadFile(out / "old"), old);
+}
+
+TEST_F(Failing, NamesWhatCannotBeRead) {
+  WriteFile(share / "d/a", "a");
+  WriteFile(share / "d/closed/b", "b");
+  const auto as_nobody = [] {
+    if (geteuid() == 0 &&
+        (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(65534) != 0)) {
+      _exit(125);
+    }
+  };
+  fs::permissions(out, fs::perms::all);
+  for (const char* closed : {"d/closed", "d/a", "d/closed/b"}) {
+    const fs::perms before = fs::status(share / closed).permissions();
+    fs::permissions(share / closed, fs::perms::none);
+    const Strings argv = CommandLine(out / "new", {"d"});
+    const Outcome outcome = Execute(argv, folder, as_nobody);
+    Bad(outcome, "Permission denied");
+    EXPECT_NE(outcome.Last().find(closed), std::string::npos) << outcome.text;
+    fs::permissions(share / closed, before);
+  }
+  EXPECT_EQ(InOut(), Strings{});
+}
+
+TEST_F(Failing, RefusesTargetsThatAreNoArchiveOfTheType) {
+  WriteFile(share / "a", "a");
+  WriteFile(out / "junk", "no archive");
+  WriteFile(out / "empty", "");
+  ASSERT_EQ(Pack(out / "seven", {"a"}).status, 0);
+  fs::create_symlink("seven", out / "link");
+  fs::create_directory(out / "folder");
+  Options zip;
+  zip.code_page = "CP932";
+  const Strings before = InOut();
+  for (const std::string& name : before) {
+    const bool file = fs::is_regular_file(fs::symlink_status(out / name));
+    const std::string content = file ? ReadFile(out / name) : "";
+    Bad(Pack(out / name, {"a"}, zip), "");
+    EXPECT_EQ(file ? ReadFile(out / name) : "", content);
+  }
+  Bad(Pack(out / "link", {"a"}), "link");
+  Bad(Pack(out / std::string(256, 'n'), {"a"}), "File name too long");
+  Bad(Pack(root / "missing/new", {"a"}), "No such file");
+  EXPECT_EQ(InOut(), before);
+  EXPECT_FALSE(fs::exists(root / "missing"));
+}
+
+TEST_F(Failing, SaysWhyARequestCannotBeMet) {
+  WriteFile(share / "a", "a");
+  const struct {
+    const char *page, *password;
+    Strings sources;
+    const char* cause;
+  } cases[] = {{nullptr, "", {}, "names no files"},
+               {"CP9x32", "", {"a"}, "unknown code page 'CP9x32'"},
+               {"", "pä", {"a"}, "ASCII"},
+               {nullptr, "a\nb", {"a"}, "line break"},
+               {nullptr, "", {"@eaDir/x"}, "excluded"},
+               {nullptr, "", {"../share/a"}, "../share/a"}};
+  for (const auto& c : cases) {
+    Options options;
+    options.code_page = c.page;
+    options.password = c.password;
+    Bad(Pack(out / "new", c.sources, options), c.cause);
+  }
+  Bad(Execute({KAVO_7Z_PATH, "", out / "new"}, folder), "command");
+  EXPECT_EQ(InOut(), Strings{});
+}
+
+// Packs into a small tmpfs of a private mount namespace; "left" gets the names that remain in it.
+TEST_F(Failing, ReportsAFullDiskInPackingAndInRecoding) {
+  WriteFile(share / "日", std::string(900 * 1024, 'x'));
+  Options zip;
+  zip.code_page = "CP932";
+  zip.level = "-mx0";
+  for (const char* size : {"size=500k", "size=1500k"}) {  // the second has room for one copy
+    const Strings argv = CommandLine(out / "new", {"日"}, zip);
+    const Outcome outcome = Execute(argv, folder, [&] {
+      const std::string uid = std::to_string(geteuid());
+      if (unshare(CLONE_NEWNS | (geteuid() == 0 ? 0 : CLONE_NEWUSER)) != 0) {
+        _exit(77);
+      }
+      if (uid != "0") {
+        WriteFile("/proc/self/uid_map", uid + " " + uid + " 1");
+      }
+      mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr);
+      if (mount("none", out.c_str(), "tmpfs", 0, size) != 0) {
+        _exit(77);
+      }
+      const pid_t packing = fork();
+      if (packing != 0) {
+        int status = 0;
+        waitpid(packing, &status, 0);
+        std::string left;
+        for (const std::string& name : InOut()) {
+          left += name + '\n';
+        }
+        WriteFile(root / "left", left);
+        _exit(WIFEXITED(status) ? WEXITSTATUS(status) : 124);
+      }
+    });
+    if (outcome.status == 77) {
+      GTEST_SKIP() << "no private mounts here";
+    }
+    Bad(outcome, "No space left on device");
+    EXPECT_EQ(ReadFile(root / "left"), "");
+  }
+}
+
+TEST_F(Failing, StopsAtOnceAndLeavesNothing) {
+  MakeHuge();
+  ASSERT_EQ(prctl(PR_SET_CHILD_SUBREAPER, 1), 0);
+  for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGKILL, 0}) {  // 0: nobody reads any more
+    Program program(CommandLine(out / "new", {"huge"}), folder);
+    ASSERT_TRUE(program.ReadUntil("Compressing huge\n"));
+    EXPECT_NE(program.Seen().find("Total: 5368709120\n"), std::string::npos) << program.Seen();
+    EXPECT_EQ(InOut().size(), 1U);
+    EXPECT_FALSE(fs::exists(out / "new"));
+    const auto start = std::chrono::steady_clock::now();
+    if (signal == 0) {
+      program.CloseOutput();
+    } else {
+      kill(signal == SIGKILL ? program.Pid() : -program.Pid(), signal);
+    }
+    EXPECT_EQ(program.Wait(), signal == SIGKILL ? -SIGKILL : 1);
+    int status = 0;
+    if (signal == SIGKILL) {  // 7z, an orphan now, dies with it
+      EXPECT_GT(waitpid(-1, &status, 0), 0);
+      EXPECT_TRUE(WIFSIGNALED(status));
+      EXPECT_EQ(InOut().size(), 1U);
+    } else {
+      EXPECT_EQ(InOut(), Strings{});
+    }
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(1));
+    EXPECT_EQ(waitpid(-1, &status, WNOHANG), -1);
+    WriteFile(share / "a", "a");
+    EXPECT_EQ(Pack(out / "other", {"a"}).status, 0);  // sweeps what SIGKILL has left
+    EXPECT_EQ(InOut(), Strings{"other"});
+    fs::remove(out / "other");
+  }
+}
+
+TEST_F(Failing, SparesTheFolderOfARunThatIsAlive) {
+  MakeHuge();
+  WriteFile(share / "a", "a");
+  Program program(CommandLine(out / "new", {"huge"}), folder);
+  ASSERT_TRUE(program.ReadUntil("Compressing huge\n"));
+  ASSERT_EQ(InOut().size(), 1U);
+  const std::string alive = InOut().front();
+  EXPECT_EQ(Pack(out / "other", {"a"}).status, 0);
+  EXPECT_EQ(InOut(), (Strings{alive, "other"}));
+}
+
+TEST_F(Failing, HidesThePasswordFromOtherUsers) {
+  MakeHuge();
+  Options options;
+  options.password = "geheim";
+  Program program(CommandLine(out / "new", {"huge"}, options), folder);
+  ASSERT_TRUE(program.ReadUntil("Compressing huge\n"));
+  size_t processes = 0;
+  for (const auto& entry : fs::directory_iterator("/proc")) {
+    const std::string command = ReadFile(entry.path() / "cmdline");
+    processes += command.find(list.string()) != std::string::npos ||
+                         command.find(out.string()) != std::string::npos
+                     ? 1
+                     : 0;
+    EXPECT_EQ(command.find("geheim"), std::string::npos) << command;
+  }
+  EXPECT_EQ(processes, 2U);
+}
+
+TEST_F(Failing, TellsHowThe7zEnded) {
+  const struct {
+    const char *program, *script, *cause;
+  } cases[] = {
+      {"/nonexistent/7z", "", "cannot start '/nonexistent/7z': No such file"},
+      {"/bin/sh", "kill -9 $$", "killed by signal 9"},
+      {"/bin/sh", "exit 2", "status 2"},
+      {"/bin/sh", "echo 'ERROR: oops' >&2", "oops"},
+      {"/bin/sh", "printf 'WARNING: errno=2 : Gone\\na\\n' >&2; exec sleep 60", "Gone; a"}};
+  for (const auto& c : cases) {
+    const Archiver::Cancel cancel(STDOUT_FILENO);
+    Archiver::Report report(cancel);
+    Archiver::Child7z child;
+    child.program = c.program;
+    child.arguments = {"-c", c.script};
+    child.folder = "/";
+    try {
+      Archiver::Run7z(child, cancel, report);
+      ADD_FAILURE() << "succeeded: " << c.script;
+    } catch (const Archiver::Failure& failure) {
+      EXPECT_NE(std::string(failure.what()).find(c.cause), std::string::npos) << failure.what();
+    }
+  }
+}
+
+}  // namespace
+}  // namespace ArchiverTest

@@ -1,0 +1,221 @@
+#include <zip.h>
+
+#include "tests/archiver_test_support.h"
+
+namespace ArchiverTest {
+namespace {
+
+class Packing : public ArchiverFixture {
+ protected:
+  void Good(const Outcome& outcome) {
+    EXPECT_EQ(outcome.status, 0) << outcome.text;
+    EXPECT_EQ(outcome.text.find("Error:"), std::string::npos) << outcome.text;
+    EXPECT_EQ(outcome.Last(), "Progress: 100");
+    EXPECT_EQ(outcome.Count("Total: "), 1);
+  }
+  // A staging folder with links to shares, as the caller makes one for several shares.
+  void Stage(const std::map<std::string, fs::path>& shares) {
+    folder = root / "stage";
+    fs::create_directory(folder);
+    list = folder / "list";
+    for (const auto& [name, target] : shares) {
+      fs::create_directory_symlink(target, folder / name);
+    }
+  }
+  // "d/bytes|flag" of each entry; the flag says that the name is marked as UTF-8.
+  Strings RawNames(const fs::path& archive) {
+    zip_t* zip = zip_open(archive.c_str(), ZIP_RDONLY, nullptr);
+    Strings names;
+    for (zip_int64_t i = 0; zip != nullptr && i < zip_get_num_entries(zip, 0); ++i) {
+      const auto index = static_cast<zip_uint64_t>(i);
+      const std::string raw = zip_get_name(zip, index, ZIP_FL_ENC_RAW);
+      const bool utf8 = raw == zip_get_name(zip, index, ZIP_FL_ENC_STRICT);
+      names.push_back(raw + (utf8 ? "|utf8" : "|raw"));
+    }
+    zip_discard(zip);
+    std::sort(names.begin(), names.end());
+    return names;
+  }
+};
+
+TEST_F(Packing, KeepsEveryNameWhateverItHolds) {
+  const Strings names = {"*",         "a?[b]",  "\"q\"",     "\"",   "-p",     "@at",
+                         " lead",     "trail ", "tab\t",     "cr\r", "new\\n", "bad\xFF.txt",
+                         "esc\x1B[m", "é日",    "e\xCC\x81", "...",  "!x",     "\xED\xA0\x80"};
+  for (const char* page : {static_cast<const char*>(nullptr), ""}) {
+    std::map<std::string, std::string> expected = {{"d", "/"}, {"d/sub", "/"}, {"d/sub/e", "/"}};
+    for (const std::string& name : names) {
+      WriteFile(share / name, name);
+      WriteFile(share / "d/sub" / name, name);
+      expected[name] = expected["d/sub/" + name] = name;
+    }
+    WriteFile(share / "xother", "matched by a pattern only");
+    fs::create_directories(share / "d/sub/e");
+    Strings sources = names;
+    sources.insert(sources.end(), {"d/sub", "d", "*"});
+    Options options;
+    options.code_page = page;
+    const fs::path archive = out / (page == nullptr ? "a*b" : "zip!");
+    const Outcome outcome = Pack(archive, sources, options);
+    Good(outcome);
+    EXPECT_EQ(outcome.Count("Compressing "), static_cast<long>(2 * names.size()));
+    EXPECT_EQ(Unpacked(archive), expected);
+    EXPECT_EQ(ReadFile(archive).substr(0, 2), page == nullptr ? "7z" : "PK");
+  }
+}
+
+TEST_F(Packing, LetsNoFileNameForgeALine) {
+  WriteFile(share / "Error: No space left on device", "x");
+  WriteFile(share / "d/a\nError: b", "x");
+  const Outcome outcome = Pack(out / "a", {"Error: No space left on device", "d"});
+  EXPECT_EQ(outcome.status, 0);
+  EXPECT_EQ(outcome.Count("Error:"), 0);
+  EXPECT_EQ(outcome.Count("Compressing Error: No space left on device"), 1);
+  EXPECT_EQ(outcome.Last(), "Progress: 100");
+}
+
+TEST_F(Packing, LeavesOutExcludedNamesAtAnyDepthAndItself) {
+  WriteFile(share / "d/@eaDir/x", "x");
+  WriteFile(share / "d/e/@eaDir/x", "x");
+  WriteFile(share / "d/e/a*b", "old");
+  WriteFile(share / "d/e/aXb", "x");
+  fs::remove(share / "d/e/a*b");
+  for (int round = 0; round < 2; ++round) {
+    Good(Pack(share / "d/e/a*b", {"d", "d/@eaDir/x"}));
+    EXPECT_EQ(Names(share / "d/e/a*b"), (Strings{"d", "d/e", "d/e/aXb"}));
+  }
+}
+
+TEST_F(Packing, StoresLinksOfAShareAsLinks) {
+  WriteFile(root / "outside/secret", "secret");
+  WriteFile(share / "d/a", "a");
+  fs::create_symlink(root / "outside", share / "d/l");
+  fs::create_symlink("d/a", share / "listed");
+  Good(Pack(out / "a", {"d", "listed"}));
+  EXPECT_EQ(ReadFile(out / "a").find("secret"), std::string::npos);
+  EXPECT_EQ(Names(out / "a"), (Strings{"d", "d/a", "d/l", "listed"}));
+}
+
+TEST_F(Packing, PacksSeveralSharesUnderTheirNamesWithLinksKept) {
+  for (const char* second : {"music", "elsewhere/tunes"}) {  // in one folder, and scattered
+    SetUp();
+    WriteFile(share / "photo/trip/a.jpg", "a");
+    WriteFile(share / "photo/trip/unlisted/b", "b");
+    WriteFile(share / second / "song", "s");
+    WriteFile(root / "outside/secret", "secret");
+    fs::create_symlink("../..", share / second / "loop");
+    fs::create_symlink("nowhere", share / "photo/trip/broken");
+    fs::create_directory_symlink(root / "outside", share / "photo/trip/out\xFF");
+    Stage({{"photo", share / "photo"}, {"music", share / second}});
+    const Strings sources = {"photo/trip/a.jpg", "photo/trip/broken", "photo/trip/out\xFF",
+                             "music"};
+    Good(Pack(out / "a", sources));
+    EXPECT_EQ(fs::exists(share / "a"), false);
+    const auto listed = Execute({"/usr/bin/7z", "l", "-ba", "-slt", out / "a"}, root).text;
+    const std::map<std::string, std::string> expected = {{"photo", "/"},
+                                                         {"photo/trip", "/"},
+                                                         {"photo/trip/a.jpg", "a"},
+                                                         {"photo/trip/broken", "-> nowhere"},
+                                                         {"music", "/"},
+                                                         {"music/song", "s"}};
+    auto found = Unpacked(out / "a");
+    // 7z does not unpack links that lead out of its folder, but it lists them.
+    EXPECT_NE(listed.find("Path = music/loop\n"), std::string::npos) << listed;
+    EXPECT_NE(listed.find("Path = photo/trip/out\xFF\n"), std::string::npos) << listed;
+    found.erase("music/loop");
+    found.erase("photo/trip/out\xFF");
+    EXPECT_EQ(found, expected);
+    EXPECT_EQ(listed.find("secret"), std::string::npos);
+    TearDown();
+  }
+}
+
+TEST_F(Packing, UpdatesAsTheActionsSay) {
+  const std::string file_name(255, 'n');
+  const struct {
+    const char *command, *actions;
+    std::map<std::string, std::string> expected;
+  } cases[] = {
+      {"a", "", {{"d", "/"}, {"d/gone", "1"}, {"d/new", "2"}, {"d/same", "2"}}},
+      {"u", "-up1q1r0x1y2z1w2", {{"d", "/"}, {"d/gone", "1"}, {"d/same", "2"}}},
+      {"u", "-up1q0r2x1y2z1w2", {{"d", "/"}, {"d/new", "2"}, {"d/same", "2"}}},
+  };
+  for (const char* page : {static_cast<const char*>(nullptr), "CP932"}) {
+    for (const auto& c : cases) {
+      fs::remove_all(share / "d");
+      fs::remove(out / file_name);
+      WriteFile(share / "d/gone", "1");
+      WriteFile(share / "d/same", "1");
+      fs::last_write_time(share / "d/same",
+                          fs::file_time_type::clock::now() - std::chrono::hours(1));
+      Options options;
+      options.code_page = page;
+      Good(Pack(out / file_name, {"d"}, options));
+      fs::remove(share / "d/gone");
+      WriteFile(share / "d/same", "2");
+      WriteFile(share / "d/new", "2");
+      options.command = c.command;
+      options.actions = c.actions;
+      Good(Pack(out / file_name, {"d"}, options));
+      EXPECT_EQ(Unpacked(out / file_name), c.expected) << c.command << c.actions;
+      EXPECT_EQ(InOut(), Strings{file_name});
+    }
+  }
+}
+
+TEST_F(Packing, StoresZipNamesInTheCodePageAndFindsThemAgain) {
+  WriteFile(share / "d/日本ソ", "1");
+  WriteFile(share / "d/가", "cannot go to the code page");
+  WriteFile(share / "d/plain", "1");
+  Options options;
+  options.code_page = "CP932";
+  options.password = "pass word";
+  const Strings expected = {"d/plain|utf8", "d/\x93\xFA\x96\x7B\x83\x5C|raw", "d/|utf8",
+                            "d/가|utf8"};
+  for (const char* content : {"1", "2"}) {
+    WriteFile(share / "d/日本ソ", content);
+    Good(Pack(out / "a.zip", {"d"}, options));
+    Strings names = RawNames(out / "a.zip");
+    Strings sorted = expected;
+    std::sort(sorted.begin(), sorted.end());
+    EXPECT_EQ(names, sorted);
+    const Strings unzip = {"/usr/bin/unzip", "-O", "CP932",       "-P",
+                           options.password, "-p", out / "a.zip", "d/日*"};
+    EXPECT_EQ(Execute(unzip, root, [] { setenv("LC_ALL", "C.UTF-8", 1); }).text, content);
+  }
+  EXPECT_EQ(InOut(), Strings{"a.zip"});
+}
+
+TEST_F(Packing, EncryptsWithThePasswordWhateverItHolds) {
+  WriteFile(share / "a", "content");
+  for (const std::string password : {" lead", "pä日\"'\\", "-p", "rogress", "tab\tend\r"}) {
+    for (const bool old_header : {false, true}) {  // which asks for the password once more
+      const fs::path archive = out / "a";
+      fs::remove(archive);
+      if (old_header) {
+        Execute({"/usr/bin/7z", "a", "-t7z", "-sae", "-mhe", "-p" + password, archive, "a"}, share);
+      }
+      Options options;
+      options.password = password;
+      Good(Pack(archive, {"a"}, options));
+      const auto test = [&](const std::string& tried) {
+        return Execute({"/usr/bin/7z", "t", "-p" + tried, archive}, root).status;
+      };
+      EXPECT_EQ(test(password), 0) << password;
+      EXPECT_NE(test("other"), 0) << password;
+    }
+  }
+}
+
+TEST_F(Packing, MakesAnArchiveOfTheUmasksMode) {
+  WriteFile(share / "a", "a");
+  for (const mode_t mask : {022U, 077U}) {
+    const Strings argv = CommandLine(out / "a", {"a"});
+    Good(Execute(argv, folder, [mask] { umask(mask); }));
+    EXPECT_EQ(fs::status(out / "a").permissions(), static_cast<fs::perms>(0666 & ~mask));
+    fs::remove(out / "a");
+  }
+}
+
+}  // namespace
+}  // namespace ArchiverTest
