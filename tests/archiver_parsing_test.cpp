@@ -141,7 +141,8 @@ TEST(CodePage, ConvertsOnlyWhatComesBackUnchanged) {
 }
 
 TEST(CodePage, RefusesWhatCannotServeInPaths) {
-  for (const char* name : {"CP9x32", "UTF-16", "UTF-7", "CP037", "CP932//IGNORE", "CP932,ASCII"}) {
+  for (const char* name :
+       {"CP9x32", "UTF-16", "UTF-7", "CP037", "CP932//IGNORE", "CP932,ASCII", "-"}) {
     EXPECT_THROW(CodePage{name}, Failure) << name;
   }
 }

@@ -175,8 +175,8 @@ class ArchiverFixture : public testing::Test {
                                               const std::string& password = "none") {
     const fs::path to = root / "unpacked";
     fs::remove_all(to);
-    EXPECT_EQ(Execute({"/usr/bin/7z", "x", "-y", "-spd", "-snld20", "-bsp0", "-bso0", "-p" + password,
-                       "-o" + to.string(), archive},
+    EXPECT_EQ(Execute({"/usr/bin/7z", "x", "-y", "-spd", "-snld20", "-bsp0", "-bso0",
+                       "-p" + password, "-o" + to.string(), archive},
                       root)
                   .status,
               0);

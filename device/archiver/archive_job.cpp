@@ -12,10 +12,10 @@
 
 #include "device/archiver/code_page.h"
 #include "device/archiver/failure.h"
-#include "device/archiver/links.h"
 #include "device/archiver/list_file.h"
 #include "device/archiver/output_file.h"
 #include "device/archiver/password.h"
+#include "device/archiver/special_files.h"
 #include "device/archiver/stock_7z.h"
 #include "device/archiver/switches.h"
 #include "device/archiver/work_place.h"
@@ -38,7 +38,7 @@ UniqueFd Open(const std::string& path, int flags) {
 template <typename Use>
 void ReadFile(const std::string& path, Use use) {
   const UniqueFd fd = Open(path, O_RDONLY);
-  std::array<char, 64 * 1024> buffer{};
+  std::array<char, 65536> buffer{};
   while (const ssize_t size = read(fd.Get(), buffer.data(), buffer.size())) {
     if (size > 0) {
       use(buffer.data(), static_cast<size_t>(size));
@@ -67,7 +67,7 @@ void CopyFile(const std::string& from, const std::string& to, const Cancel& canc
 std::vector<std::string> Sources(const Request& request) {
   std::string list;
   ReadFile(request.list_path, [&](const char* bytes, size_t size) { list.append(bytes, size); });
-  const std::vector<std::string> sources = ReadSources(list, request.list_path);
+  std::vector<std::string> sources = ReadSources(list, request.list_path);
   if (std::all_of(sources.begin(), sources.end(),
                   [&](const std::string& source) { return IsExcluded(request, source); })) {
     throw NamedFailure("nothing to pack", sources.front(), "all sources are excluded");
@@ -90,31 +90,31 @@ void Pack(const Request& request, PackRun run, const std::string& folder, const 
   Run7z(child, cancel, report);
 }
 
-// Where only following links leads to the sources, the other links are left out of that run, and
-// then added from a copy of them, so that they end as links like everywhere else.
-void PackFollowingShares(const Request& request, PackRun run, std::vector<std::string> left_out,
-                         const std::vector<std::string>& sources, const WorkPlace& place,
-                         const Cancel& cancel, Report& report) {
-  const std::vector<std::string> links = FindLinks(sources);
-  const std::unordered_set<std::string> known(links.begin(), links.end());
+// The special files are left out of the main run and then added from harmless copies of them, so
+// that links end as links and the rest as empty files, as they do when 7z meets them on its own.
+void PackWithSpecials(const Request& request, PackRun run, std::vector<std::string> left_out,
+                      const std::vector<std::string>& sources, const WorkPlace& place,
+                      const Cancel& cancel, Report& report) {
+  const std::vector<std::string> specials = FindSpecials(place, sources, request.exclude);
+  const std::unordered_set<std::string> known(specials.begin(), specials.end());
   std::vector<std::string> others;
   std::copy_if(sources.begin(), sources.end(), std::back_inserter(others),
                [&](const std::string& source) { return known.count(source) == 0; });
   if (!others.empty()) {
-    left_out.insert(left_out.end(), links.begin(), links.end());
+    left_out.insert(left_out.end(), specials.begin(), specials.end());
     run.sources = DivideNames(others);
     run.left_out = DivideNames(left_out);
-    run.follow_links = true;
+    run.follow_links = !place.shares.empty();
     Pack(request, run, place.folder, cancel, report);
-    if (FindLinks(sources) != links) {
+    if (run.follow_links && FindSpecials(place, sources, request.exclude) != specials) {
       throw Failure("symbolic links changed while they were packed");
     }
     run.archive = run.new_archive.empty() ? run.archive : run.new_archive;
     run.new_archive.clear();
   }
-  if (!links.empty()) {
-    const LinkMirror mirror(links);
-    run.sources = DivideNames(links);
+  if (!specials.empty()) {
+    const SpecialsMirror mirror(place, specials);
+    run.sources = DivideNames(specials);
     run.left_out = {};
     run.follow_links = false;
     Pack(request, run, mirror.Path(), cancel, report);
@@ -147,11 +147,11 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
   std::vector<std::string> left_out = NamesWithin(place, request.archive);
   const std::vector<std::string> own = NamesWithin(place, work.Path());
   left_out.insert(left_out.end(), own.begin(), own.end());
-  if (place.shares.empty()) {
+  if (place.shares.empty() && !request.zip) {  // a 7z archive has empty files without opening them
     run.left_out = DivideNames(left_out);
     Pack(request, run, place.folder, cancel, report);
   } else {
-    PackFollowingShares(request, run, left_out, sources, place, cancel, report);
+    PackWithSpecials(request, run, left_out, sources, place, cancel, report);
   }
   if (page) {
     NamesToCodePage(*page, work.Result(), cancel);

@@ -14,14 +14,20 @@ constexpr char kUtf8[] = "UTF-8";
 
 iconv_t Unopened() { return reinterpret_cast<iconv_t>(-1); }  // NOLINT(performance-no-int-to-ptr)
 
-// iconv takes options after a slash and more charsets after a comma; neither is a code page.
+// iconv takes options after a slash, more charsets after a comma, and nothing for the locale's.
+bool IsPlain(const std::string& name) {
+  return std::isalnum(static_cast<unsigned char>(name[0])) != 0 &&
+         std::all_of(name.begin(), name.end(), [](unsigned char c) {
+           return std::isalnum(c) != 0 || c == '-' || c == '_' || c == '.' || c == ':';
+         });
+}
+
 std::string IconvName(const std::string& name) {
-  const bool plain = std::all_of(name.begin(), name.end(), [](unsigned char c) {
-    return std::isalnum(c) != 0 || c == '-' || c == '_' || c == '.' || c == ':' || c == '+';
-  });
-  const bool digits =
-      std::all_of(name.begin(), name.end(), [](unsigned char c) { return std::isdigit(c) != 0; });
-  return plain ? (digits ? "CP" + name : name) : std::string("?");
+  if (!IsPlain(name)) {
+    return "none such";
+  }
+  const bool number = name.find_first_not_of("0123456789") == std::string::npos;
+  return number ? "CP" + name : name;
 }
 
 std::optional<std::string> Convert(iconv_t converter, std::string text) {
@@ -53,7 +59,7 @@ CodePage::CodePage(const std::string& name)
 }
 
 CodePage::~CodePage() {
-  for (const iconv_t converter : {encoder_, decoder_}) {
+  for (iconv_t converter : {encoder_, decoder_}) {
     if (converter != Unopened()) {
       iconv_close(converter);
     }

@@ -20,9 +20,8 @@ bool IsPassword(const std::string& argument, bool last) {
 }
 
 bool IsActions(const std::string& text) {
-  static const std::string kStates = "pqrxyzw";
   for (size_t i = 0; i < text.size(); i += 2) {
-    if (kStates.find(text[i]) == std::string::npos || i + 1 == text.size() || text[i + 1] < '0' ||
+    if (std::strchr("pqrxyzw", text[i]) == nullptr || i + 1 == text.size() || text[i + 1] < '0' ||
         text[i + 1] > '3') {
       return false;
     }

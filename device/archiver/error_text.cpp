@@ -8,7 +8,7 @@
 namespace Archiver {
 namespace {
 
-constexpr size_t kEnough = 16 * 1024;
+constexpr size_t kEnough = 16384;
 
 std::string WithoutHeading(const std::string& line) {
   for (const std::string heading : {"ERROR:", "Error:", "System ERROR:", "ERRORS:", "WARNING:",

@@ -31,9 +31,9 @@ std::string Printable(const std::string& text) {
 }
 
 std::string NameInError(const std::string& name) {
-  static const char* const kMeaningful[] = {"Error:", "No space left on device",
-                                            "Disk quota exceeded", "Read-only file system",
-                                            "File name too long"};
+  static constexpr const char* kMeaningful[] = {"Error:", "No space left on device",
+                                                "Disk quota exceeded", "Read-only file system",
+                                                "File name too long"};
   std::string result = Printable(name);
   for (const char* text : kMeaningful) {
     for (size_t at = result.find(text); at != std::string::npos; at = result.find(text, at)) {

@@ -87,6 +87,7 @@ struct Streams {
 
 std::vector<char*> Pointers(const std::vector<std::string>& texts) {
   std::vector<char*> result;
+  result.reserve(texts.size() + 1);
   for (const std::string& text : texts) {
     result.push_back(const_cast<char*>(text.c_str()));
   }
@@ -107,7 +108,7 @@ std::vector<std::string> Environment() {
 }
 
 std::string ReadSome(UniqueFd& fd) {
-  std::array<char, 64 * 1024> buffer{};
+  std::array<char, 65536> buffer{};
   ssize_t size = 0;
   do {
     size = read(fd.Get(), buffer.data(), buffer.size());

@@ -11,7 +11,7 @@ void AddNames(const std::string& mark, const NamesFor7z& names, const std::strin
     switches->push_back(mark + "@" + file);
   }
   for (const std::string& name : names.arguments) {
-    switches->push_back(mark + "!" + name);
+    switches->push_back(std::string(mark).append("!").append(name));
   }
 }
 

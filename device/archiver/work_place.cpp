@@ -108,7 +108,7 @@ std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& 
   }
   for (const auto& [share, folder] : place.shares) {
     if (const std::string name = Below(folder, real); !name.empty()) {
-      names.push_back(share + "/" + name);
+      names.push_back(std::string(share).append("/").append(name));
     }
   }
   return names;

@@ -33,12 +33,14 @@ int SwitchTo(const char* session_id, const char* name) {
   const User* const user = name == nullptr ? nullptr : device.config.FindUser(name);
   if (user == nullptr) {
     SetLastError(kErrNoUser);
+    errno = ENOENT;
     return -1;
   }
   if (session_id != nullptr) {
     const auto session = device.sessions.find(session_id);
     if (session == device.sessions.end() || session->second != user->name) {
       SetLastError(kErrSession);
+      errno = EACCES;
       return -1;
     }
   }

@@ -102,6 +102,12 @@ std::vector<Fault>& Faults() {
   return faults;
 }
 
+// How often each operation was called in this process and before it was forked.
+std::array<std::uint64_t, kOperationCount>& Counts() {
+  static std::array<std::uint64_t, kOperationCount> counts{};
+  return counts;
+}
+
 [[noreturn]] void RefuseRule(const std::string& rule, const std::string& reason) {
   throw std::invalid_argument("fault rule '" + rule + "': " + reason);
 }
@@ -147,6 +153,16 @@ void AddFault(const std::string& rule) {
   Faults().push_back(fault);
 }
 
+std::vector<std::string> OperationNames() {
+  return {std::begin(kOperations), std::end(kOperations)};
+}
+
+void StopWatching() {
+  TraceFile().Close();
+  Faults().clear();
+  Counts().fill(0);
+}
+
 Json::Value ToJson(const char* text) { return text == nullptr ? Json::Value() : Json::Value(text); }
 Json::Value ToJson(const std::string& text) { return {text}; }
 Json::Value ToJson(const Json::Value& value) { return value; }
@@ -170,8 +186,7 @@ Json::Value ToJson(char* const* argument_vector) {
 bool Operation::IsWatched() { return TraceFile() || !Faults().empty(); }
 
 const Fault* Operation::CountAndMatch(const char* name) {
-  static std::array<std::uint64_t, kOperationCount> counts{};
-  const std::uint64_t number = ++counts.at(IndexOf(name));
+  const std::uint64_t number = ++Counts().at(IndexOf(name));
   for (const Fault& fault : Faults()) {
     if (fault.call == name && (fault.number == 0 || fault.number == number)) {
       return &fault;

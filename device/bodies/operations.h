@@ -27,6 +27,12 @@ void OpenTrace(const std::string& path);
 // `throw`. Throws std::invalid_argument for a rule that is none or names no operation.
 void AddFault(const std::string& rule);
 
+// The names of all operations, as rules and trace lines have them.
+std::vector<std::string> OperationNames();
+
+// Ends tracing and forgets the rules.
+void StopWatching();
+
 struct Fault {
   std::string call;
   std::uint64_t number = 0;  // 0: every call

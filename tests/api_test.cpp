@@ -1,0 +1,175 @@
+// The module as its host sees it: symbols, table, one outcome per request.
+#include <dlfcn.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <filesystem>
+#include <regex>
+#include <set>
+#include <sstream>
+
+#include "device/bodies/operations.h"
+#include "device/host/request_state.h"
+#include "tests/device_fixture.h"
+
+// Null without the leak checker.
+extern "C" int __lsan_do_recoverable_leak_check() __attribute__((weak));
+
+namespace {
+
+using Device::ApiRow;
+using Device::Outcome;
+
+std::string ModulePath() {
+  return std::filesystem::read_symlink("/proc/self/exe").parent_path().string() +
+         "/KAVO.Zantro.Compress.so";
+}
+
+// The names of the module's dynamic symbols, without their arguments.
+std::set<std::string> Symbols(const std::string& which) {
+  std::istringstream lines(RunProgram({"/usr/bin/nm", "-DC", which, ModulePath()}).out);
+  std::set<std::string> names;
+  for (std::string line; std::getline(lines, line);) {
+    std::smatch parts;
+    static const std::regex kSymbol("^[0-9a-f ]* ([A-Za-z]) ([^(@\\[]*).*?(@.*)?$");
+    if (std::regex_match(line, parts, kSymbol) && !parts[3].matched) {
+      names.insert(parts[2]);
+    }
+  }
+  return names;
+}
+
+TEST(ModuleSymbols, ThreeAreExportedAndThePlatformAloneIsLeftToTheHost) {
+  EXPECT_EQ(Symbols("--defined-only"), (std::set<std::string>{"GetAPITable", "gTable", "pTask"}));
+  std::set<std::string> expected = {"Vesk::Task::~Task", "Vesk::TaskMgr::~TaskMgr",
+                                    "KavoSettings::~KavoSettings"};
+  for (const std::string& operation : Device::OperationNames()) {
+    expected.insert(operation);
+  }
+  std::set<std::string> undefined;
+  for (const std::string& name : Symbols("--undefined-only")) {
+    static const std::regex kLibraries("_ITM_.*|__gmon_start__|Json::.*|__[a-z]*san_.*|__asan.*");
+    if (!std::regex_match(name, kLibraries)) {
+      undefined.insert(name);
+    }
+  }
+  EXPECT_EQ(undefined, expected);
+}
+
+class ApiTest : public DeviceTest {
+ protected:
+  ApiTest() : module_(dlopen(ModulePath().c_str(), RTLD_NOW), dlclose) {}
+
+  void* Symbol(const char* name) const { return dlsym(module_.get(), name); }
+
+  std::unique_ptr<void, int (*)(void*)> module_;
+};
+
+TEST_F(ApiTest, TableListsEachMethodOfEachVersionAndEnds) {
+  auto* const get_table = reinterpret_cast<void* (*)()>(Symbol("GetAPITable"));
+  const auto* const rows = static_cast<const ApiRow*>(get_table());
+  EXPECT_EQ(rows, Symbol("gTable"));
+  EXPECT_EQ(get_table(), rows);
+  const char* const methods[] = {"start", "status", "stop"};
+  for (int row = 0; row < 9; ++row) {
+    EXPECT_STREQ(rows[row].api, "KAVO.Zantro.Compress");
+    EXPECT_EQ(rows[row].version, 1 + row / 3);
+    EXPECT_STREQ(rows[row].method, methods[row % 3]);
+    EXPECT_EQ(rows[row].handler, rows[0].handler);
+  }
+  const ApiRow end = {};
+  EXPECT_EQ(std::memcmp(&rows[9], &end, sizeof end), 0);
+}
+
+TEST_F(ApiTest, HostRefusesWhatNoRowServes) {
+  EXPECT_EQ(Call("begin", {}).code, 103);
+  EXPECT_EQ(Call("status", {}, "alice", 4).code, 104);
+  EXPECT_TRUE(Calls().empty());
+}
+
+TEST_F(ApiTest, MethodNamesAreComparedExactly) {
+  Device::Request request;
+  request.user = "alice";
+  const auto* const rows = static_cast<const ApiRow*>(Symbol("gTable"));
+  KAVO::APIRequest::State request_state{request};
+  KAVO::APIResponse::State response_state;
+  KAVO::APIRequest api_request{&request_state};
+  KAVO::APIResponse api_response{&response_state};
+  Device::AddFault("LumoLibUGIDSet=0");
+  for (const char* method : {"START", "Stop", "status ", ""}) {
+    request.method = method;
+    rows->handler(&api_request, &api_response);
+    EXPECT_EQ(response_state.outcome.code, 101) << method;
+  }
+  EXPECT_EQ(Calls("KAVO::APIResponse::SetError").size(), 4U);
+  EXPECT_EQ(*static_cast<void**>(Symbol("pTask")), nullptr);
+}
+
+TEST_F(ApiTest, IdentityThatIsNotTakenOnIsTheOutcome) {
+  Device::AddFault("LumoLibUGIDSet=-1:402");
+  const Outcome outcome = Call("status", {});
+  EXPECT_EQ(outcome.code, 402);
+  EXPECT_TRUE(outcome.data.isNull());
+  ASSERT_EQ(Log().size(), 1U);
+  EXPECT_EQ(Log().front().rfind("Failed to set UGID, ", 0), 0U);
+  EXPECT_TRUE(Calls("KAVO::APIRequest::GetAPIMethod").empty());
+  EXPECT_EQ(Calls("LumoLibRestoreUmask").size(), 1U);
+}
+
+TEST_F(ApiTest, MaskIsRestoredWhenAnExceptionPassesThrough) {
+  Device::AddFault("LumoLibRemoveFinishedTask=throw");
+  EXPECT_EQ(Call("status", {}).code, 100);
+  EXPECT_EQ(Calls("LumoLibRestoreUmask").front().args[0], Calls("LumoLibUmask").front().result);
+  EXPECT_TRUE(Calls("KAVO::APIResponse::SetError").empty());
+}
+
+// A request that fails early must not free the task of the one before it.
+TEST_F(ApiTest, OneProcessImageServesManyRequestsAlike) {
+  Add("vol1/photo/a.txt", "a");
+  Device::StopWatching();
+  Device::Request start;
+  start.api = "KAVO.Zantro.Compress";
+  start.method = "start";
+  start.version = 3;
+  start.user = "alice";
+  start.session_id = Device::SignIn("alice");
+  start.is_followed = true;
+  start.params = JobParams({"/photo/a.txt"}, "/photo/z.zip");
+  Device::Request status = start;
+  status.method = "status";
+  Device::Request stop = start;
+  stop.method = "stop";
+
+  const auto serve = [&] {
+    for (int round = 0; round < 34; ++round) {
+      const Outcome started = launcher_->CallHere(start);
+      EXPECT_EQ(started.code, 0) << round;
+      status.params = Json::Value(Json::objectValue);
+      EXPECT_EQ(launcher_->CallHere(status).code, 101);
+      status.params["taskid"] = "Zantro_none";
+      EXPECT_EQ(launcher_->CallHere(status).code, 599);
+      stop.params = started.data;
+      EXPECT_EQ(launcher_->CallHere(stop).code, 0);
+      status.params = started.data;
+      EXPECT_EQ(launcher_->CallHere(status).code, 599);
+      Device::Launcher::Reap();
+    }
+  };
+  const pid_t pid = fork();  // it takes on alice's identity for good
+  if (pid == 0) {
+    serve();
+    if (__lsan_do_recoverable_leak_check != nullptr) {
+      prctl(PR_SET_DUMPABLE, 1);  // for the leak checker to look into it
+      EXPECT_EQ(__lsan_do_recoverable_leak_check(), 0);
+    }
+    _exit(HasFailure() ? 1 : 0);
+  }
+  int status_word = 0;
+  ASSERT_EQ(waitpid(pid, &status_word, 0), pid);
+  EXPECT_EQ(status_word, 0);
+}
+
+}  // namespace

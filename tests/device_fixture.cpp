@@ -1,0 +1,232 @@
+#include "tests/device_fixture.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <array>
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <regex>
+#include <sstream>
+
+#include "device/bodies/json_text.h"
+#include "device/bodies/operations.h"
+#include "tests/libc_faults.h"
+
+namespace fs = std::filesystem;
+
+namespace {
+
+constexpr char kConfig[] = R"({
+  "volumes": ["vol1", "vol2"],
+  "users": [
+    { "name": "alice", "uid": 65001, "admin": true, "home": "vol1" },
+    { "name": "bob", "uid": 65002, "home": "vol1", "codepage": "CP932" },
+    { "name": "carol", "uid": 65003, "home": "vol1" }
+  ],
+  "shares": [
+    { "name": "photo", "volume": "vol1",
+      "access": { "alice": "rw", "bob": "rw", "carol": "list-denied" } },
+    { "name": "music", "volume": "vol1", "access": { "alice": "rw", "bob": "ro" } },
+    { "name": "vault", "volume": "vol2", "encrypted": true, "access": { "alice": "rw" } },
+    { "name": "attic", "volume": "vol2", "read_only": true, "access": { "alice": "rw" } }
+  ]
+})";
+constexpr uid_t kAliceUid = 65001;
+constexpr std::chrono::seconds kPatience(30);
+
+void ReadEnd(int fd, std::string& text) {
+  std::array<char, 4096> block{};
+  for (ssize_t got = 0; (got = read(fd, block.data(), block.size())) > 0;) {
+    text.append(block.data(), static_cast<std::size_t>(got));
+  }
+}
+
+}  // namespace
+
+TempFolder::TempFolder() {
+  char name[] = "/tmp/kavo-test-XXXXXX";
+  path_ = mkdtemp(name);
+  chmod(path_.c_str(), 0755);
+}
+
+TempFolder::~TempFolder() {
+  std::error_code ignored;
+  fs::remove_all(path_, ignored);
+}
+
+Ran RunProgram(const std::vector<std::string>& arguments, const std::string& folder) {
+  const TempFolder temp;
+  const std::string err_path = temp.Path() + "/err";
+  std::array<int, 2> out{};
+  EXPECT_EQ(pipe2(out.data(), O_CLOEXEC), 0);
+  const pid_t pid = fork();
+  if (pid == 0) {
+    dup2(out[1], STDOUT_FILENO);
+    dup2(open(err_path.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
+    std::vector<char*> argv;
+    for (const std::string& argument : arguments) {
+      argv.push_back(const_cast<char*>(argument.c_str()));
+    }
+    argv.push_back(nullptr);
+    if (chdir(folder.c_str()) == 0) {
+      execv(argv[0], argv.data());
+    }
+    _exit(127);
+  }
+  close(out[1]);
+  Ran ran;
+  ReadEnd(out[0], ran.out);
+  close(out[0]);
+  int status = 0;
+  waitpid(pid, &status, 0);
+  ran.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+  ran.err = ReadFile(err_path);
+  return ran;
+}
+
+std::string ReadFile(const std::string& path) {
+  std::ifstream file(path, std::ios::binary);
+  std::ostringstream text;
+  text << file.rdbuf();
+  return text.str();
+}
+
+void WriteFile(const std::string& path, const std::string& text) {
+  fs::create_directories(fs::path(path).parent_path());
+  std::ofstream(path, std::ios::binary) << text;
+}
+
+DeviceTest::DeviceTest() {
+  Device::StopWatching();
+  SetLibcFault({});
+  Device::Make(device_, kConfig);
+  Device::Open(device_);
+  SetLogFile(temp_.Path() + "/log");
+  chmod(temp_.Path().c_str(), 01777);  // the users' processes add files of their own
+  Device::OpenTrace(temp_.Path() + "/trace");
+  launcher_.emplace();
+}
+
+DeviceTest::~DeviceTest() {
+  for (const TracedCall& fork : Calls("KLIBCProcFork")) {
+    if (fork.result.asInt() > 0) {
+      kill(-fork.result.asInt(), SIGKILL);  // what a failed test left running
+    }
+  }
+  Device::StopWatching();
+  for (const std::string& path : StagedPaths()) {
+    fs::remove_all(path);
+  }
+}
+
+std::string DeviceTest::Add(const std::string& path, const std::string& text) {
+  WriteFile(At(path), text);
+  if (geteuid() == 0) {
+    EXPECT_EQ(chown(At(path).c_str(), kAliceUid, Device::kUsersGroup), 0);
+  }
+  return At(path);
+}
+
+Json::Value DeviceTest::JobParams(const std::vector<std::string>& sources,
+                                  const std::string& dest) {
+  Json::Value params;
+  params["path"] = Device::ToText(Device::ToJson(sources));
+  params["dest_file_path"] = Device::ToText(Device::ToJson(std::vector<std::string>{dest}));
+  return params;
+}
+
+Device::Outcome DeviceTest::Call(const std::string& method, const Json::Value& params,
+                                 const std::string& user, int version, bool is_followed) {
+  Device::Request request;
+  request.api = "KAVO.Zantro.Compress";
+  request.method = method;
+  request.version = version;
+  request.params = params;
+  request.user = user;
+  request.session_id = Device::SignIn(user);
+  request.is_followed = is_followed;
+  return launcher_->Call(request);
+}
+
+Device::Outcome DeviceTest::Ask(const std::string& method, const std::string& task_id,
+                                const std::string& user) {
+  Json::Value params;
+  params["taskid"] = task_id;
+  return Call(method, params, user);
+}
+
+bool DeviceTest::WaitUntil(const std::function<bool()>& condition) {
+  const auto deadline = std::chrono::steady_clock::now() + kPatience;
+  while (!condition()) {
+    if (std::chrono::steady_clock::now() > deadline) {
+      return false;
+    }
+    poll(nullptr, 0, 2);
+  }
+  return true;
+}
+
+Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& user) {
+  const Device::Outcome started = Call("start", params, user);
+  EXPECT_EQ(started.code, 0);
+  const std::string task_id = started.data["taskid"].asString();
+  Device::Outcome last;
+  EXPECT_TRUE(WaitUntil([&] {
+    last = Ask("status", task_id, user);
+    return last.code != 0 || last.data["finished"].asBool();
+  }));
+  EXPECT_EQ(last.code, 0);
+  // The worker has said its last word in the log when it is gone.
+  EXPECT_TRUE(WaitUntil([] {
+    Device::Launcher::Reap();
+    return waitpid(-1, nullptr, WNOHANG) == -1;
+  }));
+  return last.data;
+}
+
+std::vector<std::string> DeviceTest::FailJob(const Json::Value& params, const std::string& user) {
+  const Json::Value answer = RunJob(params, user);
+  EXPECT_TRUE(answer.isMember("errors")) << Device::ToText(answer);
+  std::vector<std::string> items;
+  for (const Json::Value& item : answer["errors"]) {
+    items.push_back(item["path"].asString() + ": " + item["code"].asString());
+  }
+  return items;
+}
+
+std::vector<std::string> DeviceTest::Log() const {
+  std::istringstream file(ReadFile(temp_.Path() + "/log"));
+  std::vector<std::string> lines;
+  for (std::string line; std::getline(file, line);) {
+    static const std::regex kPlace("^(KAVO\\.Zantro\\.Compress|lumo_webapi):[0-9]+ ");
+    lines.push_back(std::regex_replace(line, kPlace, ""));
+  }
+  return lines;
+}
+
+std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
+  std::istringstream file(ReadFile(temp_.Path() + "/trace"));
+  std::vector<TracedCall> calls;
+  for (std::string line; std::getline(file, line);) {
+    const Json::Value row = Device::ParseJson(line);
+    if (call.empty() || row["call"] == call) {
+      calls.push_back({row["pid"].asInt(), row["call"].asString(), row["args"], row["result"]});
+    }
+  }
+  return calls;
+}
+
+TracedCall DeviceTest::Fork() const {
+  TracedCall last;
+  for (const TracedCall& fork : Calls("KLIBCProcFork")) {
+    last = fork.result.asInt() > 0 ? fork : last;
+  }
+  return last;
+}

@@ -1,0 +1,77 @@
+// Limits that the kernel sets: full, quota-bound and read-only file systems, mounted for the test
+// alone.
+#include <fcntl.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+
+#include "tests/device_fixture.h"
+#include "tests/libc_faults.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+using Strings = std::vector<std::string>;
+
+class LimitTest : public DeviceTest {
+ protected:
+  void SetUp() override {
+    if (geteuid() != 0 || unshare(CLONE_NEWNS) != 0 ||
+        mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr) != 0) {
+      GTEST_SKIP() << "mounting file systems needs root";
+    }
+    fs::create_directory(folder_);
+    // Zeros that take no room, packed without compression.
+    fs::resize_file(Add("vol1/photo/big", ""), 40 << 20);
+  }
+
+  // The folder that was mounted on is alice's to write to.
+  void Open() {
+    ASSERT_EQ(chown(folder_.c_str(), 65001, Device::kUsersGroup), 0);
+    ASSERT_EQ(chmod(folder_.c_str(), 0755), 0);
+  }
+
+  Strings Fail() {
+    Json::Value params = JobParams({"/photo/big"}, "/photo/limited/z.zip");
+    params["level"] = "store";
+    return FailJob(params);
+  }
+
+  const std::string folder_ = At("vol1/photo/limited");
+};
+
+TEST_F(LimitTest, FullVolume) {
+  ASSERT_EQ(mount("tmpfs", folder_.c_str(), "tmpfs", 0, "size=8m"), 0);
+  Open();
+  EXPECT_EQ(Fail(), Strings{"/photo/limited/z.zip: 416"});
+  EXPECT_TRUE(fs::is_empty(folder_));
+}
+
+TEST_F(LimitTest, ReadOnlyVolume) {
+  ASSERT_EQ(mount("tmpfs", folder_.c_str(), "tmpfs", MS_RDONLY, "mode=0777"), 0);
+  EXPECT_EQ(Fail(), Strings{folder_ + ": 411"});
+}
+
+TEST_F(LimitTest, Quota) {
+  const std::string image = temp_.Path() + "/image";
+  WriteFile(image, "");
+  fs::resize_file(image, 200 << 20);
+  ASSERT_EQ(RunProgram({"/usr/sbin/mkfs.btrfs", "-q", image}).status, 0);
+  const Ran mounted = RunProgram({"/usr/bin/mount", "-o", "loop", image, folder_});
+  if (mounted.status != 0) {
+    GTEST_SKIP() << "no btrfs on a loop device here: " << mounted.err;
+  }
+  ASSERT_EQ(RunProgram({"/usr/bin/btrfs", "quota", "enable", folder_}).status, 0);
+  ASSERT_EQ(RunProgram({"/usr/bin/btrfs", "qgroup", "limit", "8M", folder_}).status, 0);
+  Open();
+  EXPECT_EQ(Fail(), Strings{"/photo/limited/z.zip: 415"});
+  EXPECT_TRUE(fs::is_empty(folder_));
+  EXPECT_EQ(umount(folder_.c_str()), 0);
+}
+
+}  // namespace
