@@ -45,7 +45,7 @@ TEST_F(CliTest, SampleDevicePacksFromTwoShares) {
 TEST_F(CliTest, CallAnswersOnOneLineAndDoesNotWaitForTheWorker) {
   fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
   const Ran started = Kavo({"call", device_, "--user", "alice", "start", "path=/photo/zeros",
-                            R"(dest_file_path:=["/photo/z.7z"])", "format=7z", "level=best"});
+                            R"(dest_file_path=["/photo/z.7z"])", "format=7z", "level=best"});
   EXPECT_EQ(started.status, 0) << started.err;
   const Json::Value answer = Device::ParseJson(started.out);
   const std::string task = answer["data"]["taskid"].asString();

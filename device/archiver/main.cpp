@@ -45,12 +45,12 @@ int main(int argc, char** argv) {
       Archiver::PackArchive(Archiver::ParseCommandLine(arguments), cancel, report);
       return 0;
     } catch (const Archiver::Cancelled&) {
-      throw;
+      report.CancelledRun();
     } catch (const std::exception& e) {
       report.Error(e.what());
     }
   } catch (const std::exception&) {
-    // Cancelled, or there is nobody left to tell.
+    // There is nobody left to tell.
   }
   return 1;
 }

@@ -28,6 +28,15 @@ void Report::Done() { Percent(100); }
 
 void Report::Error(const std::string& reason) { Line("Error: " + Printable(reason)); }
 
+void Report::CancelledRun() {
+  // The line before may be cut off. Nothing is waited for: the reader may be gone or not reading.
+  constexpr char kLine[] = "\nError: cancelled\n";
+  pollfd reader = {cancel_.ReportFd(), POLLOUT, 0};
+  if (poll(&reader, 1, 0) == 1 && (reader.revents & POLLERR) == 0) {
+    (void)!write(cancel_.ReportFd(), kLine, sizeof kLine - 1);
+  }
+}
+
 void Report::Percent(int percent) {
   if (percent > percent_) {
     percent_ = percent;

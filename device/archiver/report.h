@@ -21,6 +21,8 @@ class Report {
   // The archive stands under its final name.
   void Done();
   void Error(const std::string& reason);
+  // The same for a run that was cancelled, if somebody still reads; never blocks.
+  void CancelledRun();
 
  private:
   void Line(const std::string& text);

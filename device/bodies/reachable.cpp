@@ -36,12 +36,13 @@ fs::path FindClosedFolder(const fs::path& root) {
 
 // Puts an empty folder in place of `closed` and the device back where it was.
 bool Replace(const fs::path& closed, const fs::path& root) {
+  // What is mounted later elsewhere still shows here, and nothing of this shows there.
+  if (unshare(CLONE_NEWNS) != 0 || mount(nullptr, "/", nullptr, MS_REC | MS_SLAVE, nullptr) != 0) {
+    return false;
+  }
   const FileDescriptor device(open(root.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   const std::string source = "/proc/self/fd/" + std::to_string(device.Get());
-  if (unshare(CLONE_NEWNS) != 0 ||
-      // What is mounted later elsewhere still shows here, and nothing of this shows there.
-      mount(nullptr, "/", nullptr, MS_REC | MS_SLAVE, nullptr) != 0 ||
-      mount("kavo-device", closed.c_str(), "tmpfs", 0, "mode=0755,size=1m") != 0) {
+  if (mount("kavo-device", closed.c_str(), "tmpfs", 0, "mode=0755,size=1m") != 0) {
     return false;
   }
   std::error_code error;
