@@ -21,10 +21,16 @@ constexpr char kNotifyTitle[] = "tree:leaf_filebrowser";
 constexpr char kNotifyCompleted[] = "filebrowser:filebrowser_compress_completed";
 constexpr char kNotifyFailed[] = "filebrowser:filebrowser_compress_failed";
 
+// The list file of a job that may yet be stopped.
+const char* volatile list_file_of_job = nullptr;
+
 // Takes the whole process group along, so that the archiver does not outlive a stopped task.
 void EndProcessGroup(int signal_number) {
   if (signal_number == SIGTERM) {
     kill(0, SIGTERM);
+    if (list_file_of_job != nullptr) {
+      unlink(list_file_of_job);
+    }
     std::exit(1);  // NOLINT(bugprone-signal-handler): what the worker has open is to be closed
   }
 }
@@ -117,6 +123,7 @@ bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_Compr
     syslog(LOG_ERR, "%s:%d Failed to get ziplist", kLogSource, __LINE__);
     return false;
   }
+  list_file_of_job = info.list_file.c_str();
   info.dest_path = start.dest;
   info.codepage = start.codepage;
   LumoGetZipInfo(info);

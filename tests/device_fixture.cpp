@@ -117,8 +117,10 @@ DeviceTest::DeviceTest() {
 DeviceTest::~DeviceTest() {
   for (const TracedCall& fork : Calls("KLIBCProcFork")) {
     if (fork.result.asInt() > 0) {
-      kill(-fork.result.asInt(), SIGKILL);  // what a failed test left running
+      kill(-fork.result.asInt(), SIGKILL);  // what the test left running
     }
+  }
+  while (waitpid(-1, nullptr, 0) > 0) {
   }
   Device::StopWatching();
   for (const std::string& path : StagedPaths()) {

@@ -12,6 +12,7 @@
 #include "device/bodies/operations.h"
 #include "device/bodies/task_store.h"
 #include "tests/device_fixture.h"
+#include "tests/libc_faults.h"
 
 namespace {
 
@@ -77,6 +78,7 @@ TEST_F(TaskTest, StopEndsWorkerAndArchiverAndLeavesNothing) {
   EXPECT_TRUE(stopped.data.isNull());
   EXPECT_TRUE(Group(Worker()).empty());
   EXPECT_EQ(EntriesBeside(), 1U);
+  EXPECT_TRUE(StagedPaths().empty());
   EXPECT_EQ(Ask("status", task_id).code, 599);
 }
 

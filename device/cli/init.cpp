@@ -91,7 +91,8 @@ void WriteNoise(const fs::path& path, std::size_t size) {
 
 // Gives what the sample put below a folder of the device to its owner, not the folder itself.
 void GiveToOwner(const fs::path& folder) {
-  const User* const owner = ParseConfig(kSampleConfig).FindUser(kSampleOwner);
+  const Config config = ParseConfig(kSampleConfig);
+  const User* const owner = config.FindUser(kSampleOwner);
   if (geteuid() != 0 || owner == nullptr) {
     return;
   }
