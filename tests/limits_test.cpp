@@ -30,6 +30,8 @@ class LimitTest : public DeviceTest {
     fs::resize_file(Add("vol1/photo/big", ""), 40 << 20);
   }
 
+  void TearDown() override { umount2(folder_.c_str(), MNT_DETACH); }
+
   // The folder that was mounted on is alice's to write to.
   void Open() {
     ASSERT_EQ(chown(folder_.c_str(), 65001, Device::kUsersGroup), 0);
@@ -71,7 +73,6 @@ TEST_F(LimitTest, Quota) {
   Open();
   EXPECT_EQ(Fail(), Strings{"/photo/limited/z.zip: 415"});
   EXPECT_TRUE(fs::is_empty(folder_));
-  EXPECT_EQ(umount(folder_.c_str()), 0);
 }
 
 }  // namespace
