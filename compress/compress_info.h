@@ -11,7 +11,7 @@
 namespace Zantro {
 
 // The order of the fields is part of the design: later ones are released first.
-struct _tag_CompressInfo_ {    // NOLINT(bugprone-reserved-identifier): the device's name for it
+struct _tag_CompressInfo_ {    // NOLINT: the device's name
   bool is7z;                   // format "7z", otherwise zip; set by archive_options, not before
   std::string dest_file_path;  // the request's "dest_file_path" as text, unchanged
   std::string command;         // the archiver's command letter, "a" or "u"; empty without "mode"

@@ -127,7 +127,9 @@ bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_Compr
   info.dest_path = start.dest;
   info.codepage = start.codepage;
   LumoGetZipInfo(info);
-  if (!LumoCompressFiles(info, login_user.c_str())) {
+  const bool is_packed = LumoCompressFiles(info, login_user.c_str());
+  list_file_of_job = nullptr;
+  if (!is_packed) {
     syslog(LOG_ERR, "%s:%d Failed to compress file %s", kLogSource, __LINE__, start.dest.c_str());
     return false;
   }

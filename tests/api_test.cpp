@@ -16,7 +16,7 @@
 #include "tests/device_fixture.h"
 
 // Null without the leak checker.
-extern "C" int __lsan_do_recoverable_leak_check() __attribute__((weak));
+extern "C" int __lsan_do_recoverable_leak_check() __attribute__((weak));  // NOLINT
 
 namespace {
 

@@ -71,6 +71,7 @@ Ran RunProgram(const std::vector<std::string>& arguments, const std::string& fol
     dup2(out[1], STDOUT_FILENO);
     dup2(open(err_path.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
     std::vector<char*> argv;
+    argv.reserve(arguments.size() + 1);
     for (const std::string& argument : arguments) {
       argv.push_back(const_cast<char*>(argument.c_str()));
     }

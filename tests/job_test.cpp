@@ -143,7 +143,7 @@ TEST_F(JobTest, ModesTreatAnArchiveThatExists) {
   };
   for (const ModeRow& row : rows) {
     for (const std::string ending : {"zip", "7z"}) {
-      const std::string source = std::string("/photo/") + row.mode + ending;
+      const std::string source = std::string("/photo/").append(row.mode).append(ending);
       const std::string folder = "vol1" + source + "/";
       const std::string dest = source + "." + ending;
       const Json::Value params = With(JobParams({source}, dest), "format", ending);

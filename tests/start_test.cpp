@@ -8,7 +8,6 @@
 namespace {
 
 using Device::Outcome;
-using testing::TestWithParam;
 using testing::Values;
 
 struct Refusal {
@@ -36,7 +35,7 @@ TEST_P(StartRefuses, BeforeATaskExists) {
 constexpr char kTwoDestinations[] =
     "Bad parameter: Should not specify more than one detination path";
 constexpr char kNoSource[] = "Bad parameter: no input source file";
-const std::string name_256 =
+const std::string kName256 =
     R"({"path":"/photo/a","dest_file_path":"/photo/)" + std::string(256, 'n') + "\"}";
 
 INSTANTIATE_TEST_SUITE_P(
@@ -60,7 +59,7 @@ INSTANTIATE_TEST_SUITE_P(
                    kTwoDestinations, 1},
            Refusal{"NoDestinationLeft", R"({"path":"/photo/a","dest_file_path":","})", 101,
                    kTwoDestinations},
-           Refusal{"NameOf256Bytes", name_256.c_str(), 1301,
+           Refusal{"NameOf256Bytes", kName256.c_str(), 1301,
                    "Bad parameter: Compress zipname too long"},
            Refusal{"CodepageIsObject",
                    R"({"path":"/photo/a","dest_file_path":"/photo/z","codepage":{}})", 101,

@@ -1,10 +1,10 @@
 // Following a job and ending it, from requests of their own.
 #include <dirent.h>
-#include <signal.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <chrono>
+#include <csignal>
 #include <filesystem>
 #include <fstream>
 
@@ -158,15 +158,15 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
 TEST_F(TaskTest, StopRemovesTheTaskOnEveryPath) {
   struct Row {
     const char* fault;
-    int code;
     const char* log;
+    int code;
     bool asks_to_kill;
   };
   const Row rows[] = {
-      {"WaitForTaskDataKeyReady=0", 401, "Failed to get json data", false},
-      {"Vesk::Task::isFinished=1", 0, "", false},
-      {"Vesk::Task::getProperty=null", 401, "Failed to get json data", false},
-      {"DoKill=0", 401, "", true},
+      {"WaitForTaskDataKeyReady=0", "Failed to get json data", 401, false},
+      {"Vesk::Task::isFinished=1", "", 0, false},
+      {"Vesk::Task::getProperty=null", "Failed to get json data", 401, false},
+      {"DoKill=0", "", 401, true},
   };
   for (const Row& row : rows) {
     Device::StopWatching();

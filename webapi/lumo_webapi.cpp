@@ -11,7 +11,7 @@ constexpr char kLogSource[] = "lumo_webapi";
 }  // namespace
 
 FileWebAPI::FileWebAPI(KAVO::APIRequest* api_request, KAVO::APIResponse* api_response)
-    : saved_umask(0), request(api_request), response(api_response) {
+    : request(api_request), response(api_response) {
   saved_umask = LumoLibUmask();
 }
 

@@ -52,7 +52,7 @@ class FileWebAPI {
   // Hands the recorded outcome to the host, success (code 0) by the same operation as failure.
   void OutputResponse();
 
-  std::uint32_t saved_umask;
+  std::uint32_t saved_umask = 0;
   std::int32_t error_code = 0;
   Json::Value response_data;
   KAVO::APIRequest* request;

@@ -35,7 +35,7 @@ class ConfigReader {
       } else if (const auto other = optional.find(key); other != optional.end()) {
         other->second(member);
       } else {
-        Fail(member, "unknown key '" + key + "'");
+        Fail(member, std::string("unknown key '").append(key).append("'"));
       }
     }
     for (const auto& [key, reader] : required) {
@@ -72,7 +72,7 @@ class ConfigReader {
   // A name that can be a folder's.
   std::string Name(const Json::Value& value) const {
     constexpr std::size_t kNameMax = 64;
-    const std::string name = Text(value);
+    std::string name = Text(value);
     const bool is_plain = std::all_of(name.begin(), name.end(), [](char each) {
       return static_cast<unsigned char>(each) > ' ' && each != '/';
     });

@@ -58,8 +58,8 @@ std::string AclText(const Config& config, const Share& share, acl_type_t type) {
   for (const auto& [user, access] : share.access) {
     const Access shown =
         type == ACL_TYPE_DEFAULT && access == Access::kListDenied ? Access::kReadOnly : access;
-    text += ",u:" + std::to_string(config.FindUser(user)->uid) + ":" +
-            Permissions(shown, !share.read_only);
+    text.append(",u:").append(std::to_string(config.FindUser(user)->uid)).append(":");
+    text.append(Permissions(shown, !share.read_only));
   }
   return text;
 }

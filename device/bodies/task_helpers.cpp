@@ -21,8 +21,8 @@ constexpr char kPropData[] = "data";
 constexpr char kPropProgress[] = "progress";
 constexpr char kDataErrors[] = "errors";
 constexpr char kDataPid[] = "pid";
-constexpr std::time_t kFinishedKept = 24 * 60 * 60;  // seconds
-constexpr std::time_t kDeadKept = 60 * 60;           // seconds
+constexpr std::time_t kDeadKept = 3600;  // seconds
+constexpr std::time_t kFinishedKept = 24 * kDeadKept;
 
 // Reloads the task until it is as wanted. False after the time-out.
 bool WaitForTask(Vesk::Task::State& task, int seconds, const std::function<bool()>& is_wanted) {

@@ -2,6 +2,7 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <cmath>
 #include <ctime>
 #include <functional>
 #include <iostream>
@@ -64,7 +65,8 @@ std::string StateOf(const TaskRow& row, const Json::Value& data, const std::stri
 void PrintTask(const TaskRow& row, const std::string& user) {
   const Json::Value data = Property(row, "data");
   const Json::Value progress = Property(row, "progress");
-  const int percent = progress.isNumeric() ? static_cast<int>(progress.asDouble() * 100 + 0.5) : 0;
+  const int percent =
+      progress.isNumeric() ? static_cast<int>(std::lround(progress.asDouble() * 100)) : 0;
   const Json::Value dest = data.isObject() ? data["params"]["dest_file_path"] : Json::Value();
   std::cout << row.id << '\t' << StateOf(row, data, user) << '\t' << percent << " %\t"
             << (dest.isString() ? dest.asString() : "") << '\n';
