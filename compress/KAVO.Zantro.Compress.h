@@ -24,7 +24,8 @@ extern "C" Vesk::Task* pTask;
 
 namespace Zantro {
 
-// Names this module in its log lines, whichever of its files writes them.
+// Names this module in its log lines, whichever of its files writes them: find a line by its text,
+// the number alone may stand in several files.
 inline constexpr char kLogSource[] = "KAVO.Zantro.Compress";
 
 // What "start" has made of the request before it forks; the worker inherits it.
@@ -64,7 +65,8 @@ class ZantroCompressHandler final : public FileWebAPI {
   Json::Value MakeTaskData(pid_t worker) const;
   void StoreNewTask(pid_t worker);
 
-  // Part of "status": records the answer and returns the task's data, null when there is none.
+  // Part of "status": records the answer and returns the task's data, null when there is none. The
+  // manager is the caller's, as it has to outlive the removal of the task.
   Json::Value ReportProgress(std::optional<Vesk::TaskMgr>& task_manager);
   // Part of "stop": ends the worker of the present task, or records why it could not.
   void KillWorker();
@@ -76,7 +78,7 @@ class ZantroCompressHandler final : public FileWebAPI {
   void StoreOutcome(bool succeeded, const std::string& dest);
 
   // The worker's steps. Zero or false means failed: the step has recorded its error items and
-  // logged its line.
+  // logged its lines, as far as it has any.
   int GeneratePathInfo(_tag_CompressInfo_& info);                                 // path_info.cpp
   int CheckDestPriv(const char* dest, const char* user, const char* session_id);  // privileges.cpp
   int CheckSourcePrivilege(const _tag_CompressInfo_& info);                       // privileges.cpp

@@ -1,7 +1,5 @@
 // Worker step: turns the request's options into the archiver's command letter and switches. Values
 // are mapped, never refused; one that is no text throws out of its conversion.
-#include <cstring>
-
 #include "compress/KAVO.Zantro.Compress.h"
 #include "compress/task_record.h"
 
@@ -22,7 +20,7 @@ struct ModeRow {
 constexpr ModeRow kModes[] = {
     {"update", "u", ""},
     {"freshen", "u", "-up1q1r0x1y2z1w2"},
-    {"synchroize", "u", "-up1q0r2x1y2z1w2"},  // spelt so by the clients
+    {"synchroize", "u", "-up1q0r2x1y2z1w2"},  // spelt so, deliberately
 };
 constexpr ModeRow kOtherMode = {"", "a", ""};
 

@@ -10,6 +10,7 @@
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <new>
 
 #include "compress/KAVO.Zantro.Compress.h"
 #include "compress/error_codes.h"
@@ -42,7 +43,13 @@ class ArgumentVector {
   ArgumentVector(const ArgumentVector&) = delete;
   ArgumentVector& operator=(const ArgumentVector&) = delete;
 
-  void Add(const std::string& argument) { arguments_.at(count_++) = strdup(argument.c_str()); }
+  void Add(const std::string& argument) {
+    char* const copy = strdup(argument.c_str());
+    if (copy == nullptr) {
+      throw std::bad_alloc();
+    }
+    arguments_.at(count_++) = copy;
+  }
   char* const* Get() const { return arguments_.data(); }
 
  private:
@@ -68,22 +75,6 @@ void AddArguments(const _tag_CompressInfo_& info, const char* archive_path,
   arguments.Add("@" + info.list_file);
   arguments.Add("-progress");
 }
-
-// Removes the list file at the end of the run, however it ends.
-class ListFileOwner {
- public:
-  explicit ListFileOwner(const std::string& path) : path_(path) {}
-  ~ListFileOwner() {
-    if (!path_.empty()) {
-      unlink(path_.c_str());
-    }
-  }
-  ListFileOwner(const ListFileOwner&) = delete;
-  ListFileOwner& operator=(const ListFileOwner&) = delete;
-
- private:
-  const std::string& path_;
-};
 
 struct StreamCloser {
   // The exit status is not looked at: failures stand in the output.
@@ -114,7 +105,6 @@ struct LineBuffer {
 }  // namespace
 
 bool ZantroCompressHandler::LumoCompressFiles(const _tag_CompressInfo_& info, const char* user) {
-  const ListFileOwner list_file(info.list_file);
   char archive_path[kArchivePathSize] = {};
   ArgumentVector arguments;
   std::unique_ptr<FILE, StreamCloser> output;
@@ -134,6 +124,10 @@ bool ZantroCompressHandler::LumoCompressFiles(const _tag_CompressInfo_& info, co
   if (access(archive_path, F_OK) == 0) {
     SetArchiveOwner(archive_path, user, info.dest_path);
     KLIBKavoIndexAdd(archive_path, kIndexSingleFile);
+  }
+  output.reset();
+  if (!info.list_file.empty()) {
+    unlink(info.list_file.c_str());
   }
   return succeeded;
 }
@@ -216,7 +210,7 @@ void ZantroCompressHandler::SetArchiveMode(const char* archive_path) const {
   const mode_t mode =
       saved_umask == kNoSavedMask ? ~LumoLibGetUmask() & kArchiveMode : kArchiveMode;
   if (KAVOFSAclChmod(archive_path, kByPath, mode) < 0) {
-    // The text says 777 whatever the mode; log readers know it so.
+    // The text says 777 whatever the mode; deliberate.
     syslog(LOG_ERR, "%s:%d failed to ACL chmod '%s' to 777, errno: %m", kLogSource, __LINE__,
            archive_path);
   }

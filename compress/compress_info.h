@@ -21,11 +21,10 @@ struct _tag_CompressInfo_ {    // NOLINT: the device's name
   std::string dest_path;       // user path of the archive; empty until staging is done
   std::string list_file;       // the file that lists the entries; empty until staging made one
   std::string work_dir;        // the directory that the archiver runs in
-  // One element per resolved source in each of these, in the order of src_paths:
-  std::vector<PathInfo> path_infos;
+  std::vector<PathInfo> path_infos;    // one per resolved source, in the order of src_paths
   std::vector<std::string> src_paths;  // the request's sources as given
-  std::vector<std::string> src_names;  // base name of the full path
-  std::vector<std::string> src_dirs;   // parent of the full path, ending in "/"
+  std::vector<std::string> src_names;  // base name of the full path, one per path_infos
+  std::vector<std::string> src_dirs;   // its parent, ending in "/", one per path_infos
   std::string codepage;                // for names in a zip; may be empty
 };
 

@@ -25,6 +25,7 @@ namespace Zantro {
 
 namespace {
 
+constexpr char kTempTemplate[] = "/tmp/lumozipXXXXXX";
 constexpr std::size_t kListLineSize = 4097;        // bytes, with the terminating zero
 constexpr std::size_t kStagedListLineSize = 4120;  // the same, for names that begin with the share
 constexpr char kRemoveProgram[] = "/bin/rm";
@@ -33,17 +34,15 @@ constexpr unsigned int kExeclRunAndWait = 187;
 class FileDescriptor {
  public:
   explicit FileDescriptor(int fd) : fd_(fd) {}
-  ~FileDescriptor() { Close(); }
+  ~FileDescriptor() {
+    if (fd_ > 0) {  // 0 is left open, deliberately
+      close(fd_);
+    }
+  }
   FileDescriptor(const FileDescriptor&) = delete;
   FileDescriptor& operator=(const FileDescriptor&) = delete;
 
   int Get() const { return fd_; }
-  void Close() {
-    if (fd_ > 0) {  // 0 is left open, deliberately
-      close(fd_);
-    }
-    fd_ = -1;
-  }
 
  private:
   int fd_;
@@ -91,9 +90,9 @@ bool ZantroCompressHandler::SaveZipFileListToTmp(_tag_CompressInfo_& info) {
 }
 
 bool ZantroCompressHandler::GenerateZipList(_tag_CompressInfo_& info, const std::string& parent) {
-  char list_file[] = "/tmp/lumozipXXXXXX";
-  if (!WriteList(info, parent, list_file)) {
-    unlink(list_file);
+  std::string list_file = kTempTemplate;
+  if (!WriteList(info, parent, list_file.data())) {
+    unlink(list_file.c_str());
     return false;
   }
   info.work_dir = parent;
@@ -105,7 +104,7 @@ bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std:
                                       char* list_file) {
   const FileDescriptor list(mkstemp(list_file));
   if (list.Get() == -1) {
-    syslog(LOG_ERR, "%s:%d Failed to mkstemp %s", kLogSource, __LINE__, list_file);
+    syslog(LOG_ERR, "%s:%d Failed to mkstemp %s", kLogSource, __LINE__, kTempTemplate);
     SetErrItem(info.dest_path, kErrGeneral);
     return false;
   }
@@ -128,19 +127,19 @@ bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std:
 
 // On success the directory and its links are left behind, deliberately; the process stays in it.
 bool ZantroCompressHandler::GenerateZipListWithShare(_tag_CompressInfo_& info) {
-  char directory[] = "/tmp/lumozipXXXXXX";
-  if (mkdtemp(directory) == nullptr) {
+  std::string directory = kTempTemplate;
+  if (mkdtemp(directory.data()) == nullptr) {
     syslog(LOG_ERR, "%s:%d Failed to create a temp directory.", kLogSource, __LINE__);
     SetErrItem(info.dest_path, kErrGeneral);
     return false;
   }
   char list_file[] = "lumozipXXXXXX";
-  if (!FillStagingDirectory(info, directory, list_file)) {
-    RemoveStagingDirectory(directory);
+  if (!FillStagingDirectory(info, directory.c_str(), list_file)) {
+    RemoveStagingDirectory(directory.c_str());
     return false;
   }
   info.work_dir = directory;
-  info.list_file = std::string(directory) + "/" + list_file;
+  info.list_file = directory + "/" + list_file;
   return true;
 }
 

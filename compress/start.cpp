@@ -1,5 +1,5 @@
 // Method "start": checks the request, creates the task, forks the worker, stores the request in the
-// task and answers with the task's id. Nothing that a failure did not itself create is undone.
+// task and answers with the task's id. A failed fork removes the task; nothing else is undone.
 #include <libgen.h>
 #include <sys/types.h>
 #include <syslog.h>
@@ -163,7 +163,7 @@ void ZantroCompressHandler::StoreNewTask(pid_t worker) {
     syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
   }
   if (!pTask->endUpdate()) {
-    // The worker runs on, deliberately: it finds no data and ends by itself.
+    // The worker runs on, deliberately; it makes the archive but has no data to report in.
     syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
     SetError(kErrGeneral);
     return;

@@ -6,6 +6,7 @@
 
 #include <csignal>
 #include <cstdlib>
+#include <exception>
 
 #include "compress/KAVO.Zantro.Compress.h"
 #include "compress/error_codes.h"
@@ -21,8 +22,26 @@ constexpr char kNotifyTitle[] = "tree:leaf_filebrowser";
 constexpr char kNotifyCompleted[] = "filebrowser:filebrowser_compress_completed";
 constexpr char kNotifyFailed[] = "filebrowser:filebrowser_compress_failed";
 
-// The list file of a job that may yet be stopped.
+// The list file of a job that may yet be stopped; null when there is none.
 const char* volatile list_file_of_job = nullptr;
+
+// Owns the list file from staging on. The archiver run removes it; this is for a run that is
+// stopped before, and for a step that throws.
+class ListFileOwner {
+ public:
+  explicit ListFileOwner(const std::string& path) : path_(path) {
+    list_file_of_job = path_.c_str();
+  }
+  ~ListFileOwner() {
+    list_file_of_job = nullptr;
+    unlink(path_.c_str());
+  }
+  ListFileOwner(const ListFileOwner&) = delete;
+  ListFileOwner& operator=(const ListFileOwner&) = delete;
+
+ private:
+  const std::string& path_;
+};
 
 // Takes the whole process group along, so that the archiver does not outlive a stopped task.
 void EndProcessGroup(int signal_number) {
@@ -31,7 +50,7 @@ void EndProcessGroup(int signal_number) {
     if (list_file_of_job != nullptr) {
       unlink(list_file_of_job);
     }
-    std::exit(1);  // NOLINT(bugprone-signal-handler): what the worker has open is to be closed
+    std::exit(1);  // NOLINT(bugprone-signal-handler): who stops a worker kills it if this hangs
   }
 }
 
@@ -78,8 +97,8 @@ void ZantroCompressHandler::RunWorker(const StartParameters& start,
   _exit(0);
 }
 
-// What the steps throw, a request value that is no text for one, is a failure of the job; the
-// host's code up the stack belongs to another process.
+// An exception out of a step, such as a request value that is no text, fails the job; it must not
+// reach the host\'s frames.
 bool ZantroCompressHandler::RunJob(const StartParameters& start,
                                    _tag_CompressInfo_& info) noexcept {
   try {
@@ -123,13 +142,11 @@ bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_Compr
     syslog(LOG_ERR, "%s:%d Failed to get ziplist", kLogSource, __LINE__);
     return false;
   }
-  list_file_of_job = info.list_file.c_str();
+  const ListFileOwner list_file(info.list_file);
   info.dest_path = start.dest;
   info.codepage = start.codepage;
   LumoGetZipInfo(info);
-  const bool is_packed = LumoCompressFiles(info, login_user.c_str());
-  list_file_of_job = nullptr;
-  if (!is_packed) {
+  if (!LumoCompressFiles(info, login_user.c_str())) {
     syslog(LOG_ERR, "%s:%d Failed to compress file %s", kLogSource, __LINE__, start.dest.c_str());
     return false;
   }

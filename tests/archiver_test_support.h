@@ -1,4 +1,5 @@
-#pragma once
+#ifndef TESTS_ARCHIVER_TEST_SUPPORT_H_
+#define TESTS_ARCHIVER_TEST_SUPPORT_H_
 
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -211,3 +212,5 @@ class ArchiverFixture : public testing::Test {
 };
 
 }  // namespace ArchiverTest
+
+#endif  // TESTS_ARCHIVER_TEST_SUPPORT_H_

@@ -179,6 +179,8 @@ const ConfigRow kConfigs[] = {
     {"ShareNamedHome",
      R"({"volumes":["v"],"users":[],"shares":[{"name":"home","volume":"v","access":{}}]})",
      "line 1: the name 'home' is taken"},
+    {"VolumeOfTheStores", R"({"volumes":["users"],"users":[],"shares":[]})",
+     "line 1: the name 'users' is taken"},
     {"AccessForNobody",
      R"({"volumes":["v"],"users":[],"shares":[{"name":"s","volume":"v","access":{"x":"rw"}}]})",
      "line 1: no user 'x'"},

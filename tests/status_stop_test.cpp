@@ -173,8 +173,7 @@ TEST_F(TaskTest, StopRemovesTheTaskOnEveryPath) {
     const std::string task_id = "Zantro_" + std::string(row.fault);
     {
       Device::TaskStore store("alice");
-      store.AddTask(task_id);
-      store.UpdateTask(task_id, {{"data", R"({"pid":1})"}}, false);
+      store.AddTask(task_id, {{"data", R"({"pid":1})"}});
     }
     if (geteuid() == 0) {
       for (const fs::directory_entry& file : fs::directory_iterator(At("users/alice"))) {
@@ -202,6 +201,7 @@ TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {
   {
     sqlite3* database = nullptr;
     ASSERT_EQ(sqlite3_open(At("users/alice/store.db").c_str(), &database), SQLITE_OK);
+    sqlite3_busy_timeout(database, 10000);  // the worker writes as well
     ASSERT_EQ(
         sqlite3_exec(database, "UPDATE workers SET start_time = 1", nullptr, nullptr, nullptr),
         SQLITE_OK);

@@ -368,6 +368,7 @@ TEST_F(WorkerTest, TakesARequestValueThatIsNoTextForAFailure) {
     EXPECT_EQ(FailJob(params), Strings{"/photo/z.zip: 1300"}) << param;
   }
   EXPECT_TRUE(Calls("KLIBCPopenv").empty());
+  EXPECT_TRUE(StagedPaths().empty());
 }
 
 TEST_F(WorkerTest, AsksOncePerShareAndPassesOverSourcesOfOneThatIsNotListed) {

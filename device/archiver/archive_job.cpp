@@ -131,16 +131,16 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
   const WorkPlace place = FindWorkPlace(listed, request.list_path);
   CheckSources(place, listed);
   const std::vector<std::string> sources = WithoutNested(listed);
-  const bool exists = ArchiveExists(request.archive);
+  const ArchiveState seen = LookAtArchive(request.archive);
   const WorkFolder work(request.archive);
 
   PackRun run;
   run.archive = work.Result();
   run.sources = DivideNames(sources);
-  if (exists && page && HasNamesIn(*page, request.archive)) {
+  if (seen.exists && page && HasNamesIn(*page, request.archive)) {
     CopyFile(request.archive, work.Result(), cancel);
     NamesToUtf8(*page, work.Result(), cancel);
-  } else if (exists) {
+  } else if (seen.exists) {
     run.archive = request.archive;
     run.new_archive = work.Result();
   }
@@ -157,7 +157,7 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
     NamesToCodePage(*page, work.Result(), cancel);
   }
   cancel.Check();
-  work.Publish();
+  work.Publish(seen);
   report.Done();
 }
 

@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_ARCHIVE_JOB_H_
+#define DEVICE_ARCHIVER_ARCHIVE_JOB_H_
 
 #include "device/archiver/cancel.h"
 #include "device/archiver/command_line.h"
@@ -11,3 +12,5 @@ namespace Archiver {
 void PackArchive(const Request& request, const Cancel& cancel, Report& report);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_ARCHIVE_JOB_H_

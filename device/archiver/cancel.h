@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_CANCEL_H_
+#define DEVICE_ARCHIVER_CANCEL_H_
 
 #include "device/archiver/unique_fd.h"
 
@@ -23,3 +24,5 @@ class Cancel {
 };
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_CANCEL_H_

@@ -68,7 +68,12 @@ CodePage::~CodePage() {
 
 std::optional<std::string> CodePage::Encode(const std::string& utf8) const {
   std::optional<std::string> bytes = Convert(encoder_, utf8);
-  return bytes && Convert(decoder_, *bytes) == utf8 ? bytes : std::nullopt;
+  // Some code pages have characters with a byte that would part the name where it has no part.
+  const auto parts = [](const std::string& name) {
+    return std::count(name.begin(), name.end(), '/') + std::count(name.begin(), name.end(), '\0');
+  };
+  const bool is_held = bytes && Convert(decoder_, *bytes) == utf8 && parts(*bytes) == parts(utf8);
+  return is_held ? bytes : std::nullopt;
 }
 
 std::optional<std::string> CodePage::Decode(const std::string& bytes) const {

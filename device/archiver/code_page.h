@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_CODE_PAGE_H_
+#define DEVICE_ARCHIVER_CODE_PAGE_H_
 
 #include <iconv.h>
 
@@ -29,3 +30,5 @@ class CodePage {
 };
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_CODE_PAGE_H_

@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_COMMAND_LINE_H_
+#define DEVICE_ARCHIVER_COMMAND_LINE_H_
 
 #include <string>
 #include <vector>
@@ -25,3 +26,5 @@ Request ParseCommandLine(const std::vector<std::string>& arguments);
 void HidePassword(int argc, char** argv);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_COMMAND_LINE_H_

@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_ERROR_TEXT_H_
+#define DEVICE_ARCHIVER_ERROR_TEXT_H_
 
 #include <string>
 
@@ -20,3 +21,5 @@ class ErrorText {
 };
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_ERROR_TEXT_H_

@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_FAILURE_H_
+#define DEVICE_ARCHIVER_FAILURE_H_
 
 #include <exception>
 #include <stdexcept>
@@ -33,3 +34,5 @@ std::string Printable(const std::string& text);
 std::string NameInError(const std::string& name);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_FAILURE_H_

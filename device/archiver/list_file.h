@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_LIST_FILE_H_
+#define DEVICE_ARCHIVER_LIST_FILE_H_
 
 #include <string>
 #include <vector>
@@ -25,3 +26,5 @@ NamesFor7z DivideNames(const std::vector<std::string>& names);
 bool IsUtf8(const std::string& text);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_LIST_FILE_H_

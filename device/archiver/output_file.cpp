@@ -20,6 +20,7 @@ namespace {
 constexpr char kPrefix[] = ".kavo-7z-";
 constexpr char kRandom[] = "XXXXXX";
 constexpr char kResult[] = "new";
+constexpr char kCannotName[] = "cannot name the finished archive";
 constexpr int kOpenFolder = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
 
 struct CloseDir {
@@ -44,18 +45,24 @@ void RemoveResults(int folder) {
 
 }  // namespace
 
-bool ArchiveExists(const std::string& path) {
+bool ArchiveState::operator==(const ArchiveState& other) const {
+  return exists == other.exists && device == other.device && inode == other.inode &&
+         size == other.size && changed.tv_sec == other.changed.tv_sec &&
+         changed.tv_nsec == other.changed.tv_nsec;
+}
+
+ArchiveState LookAtArchive(const std::string& path) {
   struct stat info {};
   if (lstat(path.c_str(), &info) != 0) {
     if (errno == ENOENT) {
-      return false;
+      return {};
     }
     throw SystemFailure("cannot write archive", path, errno);
   }
   if (!S_ISREG(info.st_mode)) {
     throw NamedFailure("cannot write archive", path, "something else than a file has the name");
   }
-  return true;
+  return {true, info.st_dev, info.st_ino, info.st_size, info.st_mtim};
 }
 
 WorkFolder::WorkFolder(std::string archive)
@@ -90,9 +97,27 @@ WorkFolder::~WorkFolder() {
 
 std::string WorkFolder::Result() const { return path_ + '/' + kResult; }
 
-void WorkFolder::Publish() const {
-  if (rename(Result().c_str(), archive_.c_str()) != 0) {
-    throw SystemFailure("cannot name the finished archive", archive_, errno);
+void WorkFolder::Publish(const ArchiveState& seen) const {
+  const std::string result = Result();
+  const auto rename_as = [&](unsigned int flags) {
+    return renameat2(AT_FDCWD, result.c_str(), AT_FDCWD, archive_.c_str(), flags) == 0;
+  };
+  // Exchanged, the old archive can be looked at before it goes; it goes with this folder.
+  bool is_named = rename_as(seen.exists ? RENAME_EXCHANGE : RENAME_NOREPLACE);
+  bool is_as_seen = is_named || (errno != EEXIST && errno != ENOENT);
+  if (is_named && seen.exists && !(LookAtArchive(result) == seen)) {
+    rename_as(RENAME_EXCHANGE);
+    is_as_seen = false;
+  } else if (!is_named && (errno == EINVAL || errno == ENOSYS)) {
+    // A file system that knows neither kind of rename.
+    is_as_seen = LookAtArchive(archive_) == seen;
+    is_named = is_as_seen && rename_as(0);
+  }
+  if (!is_as_seen) {
+    throw NamedFailure(kCannotName, archive_, "it has changed meanwhile");
+  }
+  if (!is_named) {
+    throw SystemFailure(kCannotName, archive_, errno);
   }
 }
 

@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_PASSWORD_H_
+#define DEVICE_ARCHIVER_PASSWORD_H_
 
 #include "device/archiver/command_line.h"
 #include "device/archiver/unique_fd.h"
@@ -15,3 +16,5 @@ UniqueFd PasswordInput(const Request& request);
 UniqueFd UnnamedFile(const std::string& text);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_PASSWORD_H_

@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_PROGRESS_H_
+#define DEVICE_ARCHIVER_PROGRESS_H_
 
 #include <cstdint>
 #include <string>
@@ -30,3 +31,5 @@ class OutputParser {
 };
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_PROGRESS_H_

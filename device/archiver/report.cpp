@@ -11,6 +11,19 @@
 
 namespace Archiver {
 
+namespace {
+
+// Begins a line of its own, as the one before may be cut off. Waits for nothing: the reader may be
+// gone or not reading.
+void LastWord(int fd, const std::string& text) {
+  pollfd reader = {fd, POLLOUT, 0};
+  if (poll(&reader, 1, 0) == 1 && (reader.revents & POLLERR) == 0) {
+    (void)!write(fd, text.data(), text.size());
+  }
+}
+
+}  // namespace
+
 void Report::Total(uint64_t bytes) {
   if (!has_total_) {
     has_total_ = true;
@@ -28,14 +41,9 @@ void Report::Done() { Percent(100); }
 
 void Report::Error(const std::string& reason) { Line("Error: " + Printable(reason)); }
 
-void Report::CancelledRun() {
-  // The line before may be cut off. Nothing is waited for: the reader may be gone or not reading.
-  constexpr char kLine[] = "\nError: cancelled\n";
-  pollfd reader = {cancel_.ReportFd(), POLLOUT, 0};
-  if (poll(&reader, 1, 0) == 1 && (reader.revents & POLLERR) == 0) {
-    (void)!write(cancel_.ReportFd(), kLine, sizeof kLine - 1);
-  }
-}
+void Report::CancelledRun() { LastWord(cancel_.ReportFd(), "\nError: cancelled\n"); }
+
+void Report::KilledRun(int report_fd) { LastWord(report_fd, "\nError: the archiver was killed\n"); }
 
 void Report::Percent(int percent) {
   if (percent > percent_) {

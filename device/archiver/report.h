@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_REPORT_H_
+#define DEVICE_ARCHIVER_REPORT_H_
 
 #include <cstdint>
 #include <string>
@@ -23,6 +24,8 @@ class Report {
   void Error(const std::string& reason);
   // The same for a run that was cancelled, if somebody still reads; never blocks.
   void CancelledRun();
+  // The same for a run that was killed, said by another process.
+  static void KilledRun(int report_fd);
 
  private:
   void Line(const std::string& text);
@@ -34,3 +37,5 @@ class Report {
 };
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_REPORT_H_

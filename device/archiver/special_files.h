@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_SPECIAL_FILES_H_
+#define DEVICE_ARCHIVER_SPECIAL_FILES_H_
 
 #include <string>
 #include <vector>
@@ -30,3 +31,5 @@ class SpecialsMirror {
 };
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_SPECIAL_FILES_H_

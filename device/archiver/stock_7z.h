@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_STOCK_7Z_H_
+#define DEVICE_ARCHIVER_STOCK_7Z_H_
 
 #include <string>
 #include <vector>
@@ -24,3 +25,5 @@ struct Child7z {
 void Run7z(const Child7z& child, const Cancel& cancel, Report& report);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_STOCK_7Z_H_

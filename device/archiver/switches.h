@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_SWITCHES_H_
+#define DEVICE_ARCHIVER_SWITCHES_H_
 
 #include <string>
 #include <vector>
@@ -26,3 +27,5 @@ std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& ru
 bool IsExcluded(const Request& request, const std::string& path);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_SWITCHES_H_

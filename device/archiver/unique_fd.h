@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_UNIQUE_FD_H_
+#define DEVICE_ARCHIVER_UNIQUE_FD_H_
 
 #include <unistd.h>
 
@@ -31,3 +32,5 @@ class UniqueFd {
 };
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_UNIQUE_FD_H_

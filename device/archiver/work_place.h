@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_WORK_PLACE_H_
+#define DEVICE_ARCHIVER_WORK_PLACE_H_
 
 #include <map>
 #include <string>
@@ -28,3 +29,5 @@ void CheckSources(const WorkPlace& place, const std::vector<std::string>& source
 std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& path);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_WORK_PLACE_H_

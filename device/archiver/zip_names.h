@@ -1,4 +1,5 @@
-#pragma once
+#ifndef DEVICE_ARCHIVER_ZIP_NAMES_H_
+#define DEVICE_ARCHIVER_ZIP_NAMES_H_
 
 #include <string>
 
@@ -18,3 +19,5 @@ void NamesToUtf8(const CodePage& page, const std::string& archive, const Cancel&
 void NamesToCodePage(const CodePage& page, const std::string& archive, const Cancel& cancel);
 
 }  // namespace Archiver
+
+#endif  // DEVICE_ARCHIVER_ZIP_NAMES_H_

@@ -13,7 +13,13 @@ namespace Device {
 
 namespace {
 
-constexpr char kReservedShareName[] = "home";  // every user's own
+constexpr const char* kReservedShares[] = {"home", "homes"};          // every user's own, and all
+constexpr const char* kReservedVolumes[] = {"users", "device.json"};  // beside the volumes
+
+template <std::size_t kCount>
+bool IsOneOf(const std::string& name, const char* const (&names)[kCount]) {
+  return std::find(std::begin(names), std::end(names), name) != std::end(names);
+}
 
 // Reads members of JSON objects and says on which line of the text something is wrong.
 class ConfigReader {
@@ -153,6 +159,15 @@ void CheckVolume(const ConfigReader& reader, const Json::Value& where, const Con
   }
 }
 
+void AddVolume(const ConfigReader& reader, const Json::Value& value, Config& config) {
+  std::string name = reader.Name(value);
+  if (IsOneOf(name, kReservedVolumes) ||
+      std::find(config.volumes.begin(), config.volumes.end(), name) != config.volumes.end()) {
+    reader.Fail(value, std::string("the name '").append(name).append("' is taken"));
+  }
+  config.volumes.push_back(std::move(name));
+}
+
 void AddUser(const ConfigReader& reader, const Json::Value& value, Config& config) {
   User user = ReadUser(reader, value);
   CheckVolume(reader, value, config, user.home);
@@ -167,7 +182,7 @@ void AddUser(const ConfigReader& reader, const Json::Value& value, Config& confi
 void AddShare(const ConfigReader& reader, const Json::Value& value, Config& config) {
   Share share = ReadShare(reader, value, config);
   CheckVolume(reader, value, config, share.volume);
-  if (config.FindShare(share.name) != nullptr || share.name == kReservedShareName) {
+  if (config.FindShare(share.name) != nullptr || IsOneOf(share.name, kReservedShares)) {
     reader.Fail(value, "the name '" + share.name + "' is taken");
   }
   config.shares.push_back(std::move(share));
@@ -193,7 +208,7 @@ Config ParseConfig(const std::string& text) {
   Json::Value shares;
   const auto read_volumes = [&](const Json::Value& volumes) {
     reader.ReadArray(volumes, "volumes",
-                     [&](const Json::Value& each) { config.volumes.push_back(reader.Name(each)); });
+                     [&](const Json::Value& each) { AddVolume(reader, each, config); });
   };
   // Users name volumes, shared folders name both: in that order, wherever they stand in the text.
   reader.ReadObject(root, "the device",

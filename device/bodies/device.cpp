@@ -4,7 +4,8 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cstdlib>
+#include <cerrno>
+#include <cstring>
 #include <filesystem>
 #include <iostream>
 #include <memory>
@@ -20,19 +21,20 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr char kArchiverName[] = "kavo-7z";
+constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
 
 std::unique_ptr<OpenDevice>& Instance() {
   static std::unique_ptr<OpenDevice> device;
   return device;
 }
 
-// The device's own archiver stands beside its executable. It is kept open, as the users may not be
-// able to walk there.
-FileDescriptor OpenArchiver() {
-  const fs::path path = fs::read_symlink("/proc/self/exe").parent_path() / kArchiverName;
-  FileDescriptor file(open(path.c_str(), O_PATH | O_CLOEXEC));
+// What the device needs beside its executable is opened at once: later there may be no way to walk
+// there.
+FileDescriptor OpenBesideExecutable(const char* name, int flags) {
+  const fs::path path = fs::read_symlink("/proc/self/exe").parent_path() / name;
+  FileDescriptor file(open(path.c_str(), flags | O_CLOEXEC));
   if (!file) {
-    throw std::system_error(errno, std::generic_category(), "archiver " + path.string());
+    throw std::runtime_error(path.string() + ": " + std::strerror(errno));
   }
   return file;
 }
@@ -59,7 +61,8 @@ std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
       throw std::runtime_error("volume '" + volume + "': no such folder");
     }
   }
-  device->archiver = OpenArchiver();
+  device->archiver = OpenBesideExecutable(kArchiverName, O_PATH);
+  device->module = OpenBesideExecutable(kModuleName, O_RDONLY);
   device->switches_identity = geteuid() == 0;
   if (device->switches_identity) {
     MakeReachable(device->root);

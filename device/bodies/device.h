@@ -27,6 +27,7 @@ struct OpenDevice {
   Config config;
   bool switches_identity = false;  // false: not root, all users are the caller
   FileDescriptor archiver;         // the program that runs in place of /usr/bin/7z
+  FileDescriptor module;           // the shared library that serves the requests
 
   std::map<std::string, std::string> sessions;  // session id to user name
   std::string current_user;  // whose identity this process has; empty: the device's own

@@ -36,7 +36,7 @@ int SwitchTo(const char* session_id, const char* name) {
     errno = ENOENT;
     return -1;
   }
-  if (session_id != nullptr) {
+  if (session_id != nullptr && *session_id != '\0') {
     const auto session = device.sessions.find(session_id);
     if (session == device.sessions.end() || session->second != user->name) {
       SetLastError(kErrSession);

@@ -92,7 +92,14 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     KLIB_ERROR(error);
     return nullptr;
   }
-  FILE* const stream = fdopen(read_end.Release(), mode);
+  FILE* const stream = fdopen(read_end.Get(), mode);
+  if (stream == nullptr) {
+    KLIB_ERROR(errno);
+    kill(pid, SIGKILL);
+    WaitForExit(pid);
+    return nullptr;
+  }
+  read_end.Release();
   Streams()[stream] = pid;
   return stream;
 }

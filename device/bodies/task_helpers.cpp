@@ -6,6 +6,7 @@
 #include <chrono>
 #include <ctime>
 #include <functional>
+#include <set>
 
 #include "device/bodies/device.h"
 #include "device/bodies/json_text.h"
@@ -24,47 +25,54 @@ constexpr char kDataPid[] = "pid";
 constexpr std::time_t kDeadKept = 3600;  // seconds
 constexpr std::time_t kFinishedKept = 24 * kDeadKept;
 
-// Reloads the task until it is as wanted. False after the time-out.
+// Reloads the task until it is as wanted. False after the time-out, or when the task was removed.
 bool WaitForTask(Vesk::Task::State& task, int seconds, const std::function<bool()>& is_wanted) {
   constexpr int kFirstPauseMs = 1;
   constexpr int kLongestPauseMs = 50;
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(seconds);
   int pause = kFirstPauseMs;
-  task.Reload();
-  while (!is_wanted()) {
+  while (task.Reload()) {
+    if (is_wanted()) {
+      return true;
+    }
     if (std::chrono::steady_clock::now() >= deadline) {
       return false;
     }
     poll(nullptr, 0, pause);
     pause = std::min(2 * pause, kLongestPauseMs);
-    task.Reload();
   }
-  return true;
+  return false;
 }
 
 bool HoldsErrors(const Json::Value& data) { return data.isObject() && data.isMember(kDataErrors); }
 
+// The worker that the task's data names, -1 when it names none.
+pid_t WorkerOf(const TaskRow& row) {
+  const auto data = row.properties.find(kPropData);
+  const Json::Value value = data == row.properties.end() ? Json::Value() : ParseJson(data->second);
+  const Json::Value pid = value.isObject() ? value[kDataPid] : Json::Value();
+  return pid.isInt() ? pid.asInt() : -1;
+}
+
+// When a worker went is not known; its last word in the store counts.
 bool IsStale(const std::string& user, const TaskRow& row) {
   const std::time_t age = std::time(nullptr) - row.updated;
   if (row.finished) {
     return age > kFinishedKept;
   }
-  if (age <= kDeadKept) {
-    return false;
-  }
-  const auto data = row.properties.find(kPropData);
-  const Json::Value value = data == row.properties.end() ? Json::Value() : ParseJson(data->second);
-  const Json::Value pid = value.isObject() ? value[kDataPid] : Json::Value();
-  return !pid.isInt() || !IsWorkerAlive(user, pid.asInt());
+  return age > kDeadKept && !IsWorkerAlive(user, WorkerOf(row));
 }
 
 void RemoveStaleTasks(const std::string& user) {
+  std::set<pid_t> named;
   for (const TaskRow& row : StoreOf(user).AllTasks()) {
     if (IsStale(user, row)) {
       StoreOf(user).RemoveTask(row.id);
+    } else {
+      named.insert(WorkerOf(row));
     }
   }
-  ForgetEndedWorkers(user);
+  ForgetEndedWorkers(user, named);
 }
 
 // The worker may end between two looks: what it stored last counts, so that a result is never
@@ -122,10 +130,14 @@ Json::Value LumoLibBkgTaskInfoCreate(const Json::Value& data, const std::string&
 void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved) {
   Operation("LumoLibRemoveFinishedTask", task, pid, reserved).Run([&] {
     Vesk::Task::State* const state = task == nullptr ? nullptr : task->state;
-    if (state != nullptr &&
-        (state->row.finished || Device::HoldsErrors(state->Get(Device::kPropData)) ||
-         Device::EndedWithoutResult(*state, pid))) {
-      state->Remove();
+    try {
+      if (state != nullptr &&
+          (state->row.finished || Device::HoldsErrors(state->Get(Device::kPropData)) ||
+           Device::EndedWithoutResult(*state, pid))) {
+        state->Remove();
+      }
+    } catch (const std::exception& error) {
+      syslog(LOG_ERR, "remove finished task: %s", error.what());
     }
   });
 }

@@ -18,7 +18,9 @@ struct Vesk::Task::State {
   bool Set(const std::string& name, const Json::Value& value);
   // Stores what is gathered and closes the update. False, and a line logged, when it is not stored.
   bool Store(bool is_finished);
-  void Reload();
+  // False when the task was removed meanwhile; it has no properties then. A store that cannot be
+  // read is logged and leaves the task as it was known.
+  bool Reload();
   void Remove();
 
   std::string user;

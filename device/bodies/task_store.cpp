@@ -101,11 +101,26 @@ void TaskStore::InTransaction(const std::function<void()>& body) {
   }
 }
 
-void TaskStore::AddTask(const std::string& id) {
-  Statement(database_.get(), "INSERT INTO tasks VALUES (?, 0, ?)")
-      .Bind(id)
-      .Bind(std::time(nullptr))
-      .Step();
+void TaskStore::AddTask(const std::string& id,
+                        const std::map<std::string, std::string>& properties) {
+  InTransaction([&] {
+    Statement(database_.get(), "INSERT INTO tasks VALUES (?, 0, ?)")
+        .Bind(id)
+        .Bind(std::time(nullptr))
+        .Step();
+    WriteProperties(id, properties);
+  });
+}
+
+void TaskStore::WriteProperties(const std::string& id,
+                                const std::map<std::string, std::string>& properties) {
+  for (const auto& [name, value] : properties) {
+    Statement(database_.get(), "INSERT OR REPLACE INTO properties VALUES (?, ?, ?)")
+        .Bind(id)
+        .Bind(name)
+        .Bind(value)
+        .Step();
+  }
 }
 
 void TaskStore::ReadProperties(TaskRow& row) {
@@ -166,15 +181,8 @@ bool TaskStore::UpdateTask(const std::string& id,
         .Bind(id)
         .Step();
     is_found = sqlite3_changes(database_.get()) == 1;
-    if (!is_found) {
-      return;
-    }
-    for (const auto& [name, value] : properties) {
-      Statement(database_.get(), "INSERT OR REPLACE INTO properties VALUES (?, ?, ?)")
-          .Bind(id)
-          .Bind(name)
-          .Bind(value)
-          .Step();
+    if (is_found) {
+      WriteProperties(id, properties);
     }
   });
   return is_found;

@@ -39,7 +39,7 @@ class TaskStore {
   // Opens the user's store, and makes it when it is not there yet.
   explicit TaskStore(const std::string& user);
 
-  void AddTask(const std::string& id);
+  void AddTask(const std::string& id, const std::map<std::string, std::string>& properties);
   std::optional<TaskRow> FindTask(const std::string& id);
   std::vector<TaskRow> AllTasks();
   // Stores the properties and the finished state together. False when there is no such task.
@@ -64,6 +64,7 @@ class TaskStore {
 
   void InTransaction(const std::function<void()>& body);
   void ReadProperties(TaskRow& row);
+  void WriteProperties(const std::string& id, const std::map<std::string, std::string>& properties);
 
   std::unique_ptr<sqlite3, int (*)(sqlite3*)> database_;
 };

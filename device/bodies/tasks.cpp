@@ -77,17 +77,18 @@ bool Task::State::Store(bool is_finished) {
   }
 }
 
-void Task::State::Reload() {
+bool Task::State::Reload() {
   try {
     std::optional<Device::TaskRow> stored = Device::StoreOf(user).FindTask(row.id);
-    // A task that was removed meanwhile has no properties.
-    row.properties.clear();
-    if (stored) {
-      row = std::move(*stored);
+    if (!stored) {
+      row.properties.clear();
+      return false;
     }
+    row = std::move(*stored);
   } catch (const std::exception& error) {
     LogFailure("reload task", error);
   }
+  return true;
 }
 
 void Task::State::Remove() {
@@ -103,11 +104,9 @@ Task::Task(const char* user, const char* task_id) : state(nullptr) {
     auto task_state = std::make_unique<State>();
     task_state->user = user;
     task_state->row.id = task_id;
-    Device::StoreOf(user).AddTask(task_id);
-    // Nobody watches the task: the desktop is to be told of its end.
-    if (!task_state->Set(kPropNotify, !Device::TheDevice().is_followed)) {
-      throw std::runtime_error("task '" + task_state->row.id + "' is not stored");
-    }
+    // When nobody watches the task, the desktop is to be told of its end.
+    task_state->row.properties[kPropNotify] = Device::ToText(!Device::TheDevice().is_followed);
+    Device::StoreOf(user).AddTask(task_id, task_state->row.properties);
     state = task_state.release();
   });
 }

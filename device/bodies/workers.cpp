@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <cerrno>
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
@@ -108,8 +109,11 @@ bool EndWorker(const std::string& user, pid_t pid) {
   // The descriptor holds on to the process that has the id now; whether that is the worker is asked
   // after, so that no other can slip in between.
   const FileDescriptor process(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
+  if (!process && errno != ESRCH) {
+    return false;
+  }
   if (!process || !IsWorkerAlive(user, pid)) {
-    return true;  // it has ended already
+    return true;  // it has ended already, and an archiver that nobody reads from ends by itself
   }
   const Clock::time_point deadline = Clock::now() + kGrace;
   if (syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) != 0) {
@@ -123,9 +127,9 @@ bool EndWorker(const std::string& user, pid_t pid) {
   return WaitForGroup(pid, Clock::now() + kGrace);
 }
 
-void ForgetEndedWorkers(const std::string& user) {
+void ForgetEndedWorkers(const std::string& user, const std::set<pid_t>& kept) {
   for (const pid_t pid : StoreOf(user).AllWorkers()) {
-    if (!IsWorkerAlive(user, pid)) {
+    if (kept.count(pid) == 0 && !IsWorkerAlive(user, pid)) {
       StoreOf(user).RemoveWorker(pid);
     }
   }

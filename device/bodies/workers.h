@@ -5,6 +5,7 @@
 
 #include <sys/types.h>
 
+#include <set>
 #include <string>
 
 namespace Device {
@@ -19,8 +20,8 @@ bool IsWorkerAlive(const std::string& user, pid_t pid);
 // a grace of 5 s. False when it is none, or could not be ended.
 bool EndWorker(const std::string& user, pid_t pid);
 
-// Forgets the workers that have ended.
-void ForgetEndedWorkers(const std::string& user);
+// Forgets the workers that have ended, but those which a task still names.
+void ForgetEndedWorkers(const std::string& user, const std::set<pid_t>& kept);
 
 }  // namespace Device
 

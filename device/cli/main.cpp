@@ -3,6 +3,7 @@
 
 #include <CLI/CLI.hpp>
 #include <csignal>
+#include <cstring>
 #include <exception>
 #include <iostream>
 
@@ -13,6 +14,8 @@ namespace {
 
 using Device::CallOptions;
 using Device::CompressOptions;
+
+constexpr char kPasswordParam[] = "password";
 
 struct CommandLine {
   std::string folder;
@@ -80,6 +83,18 @@ CLI::App* AddCompress(CLI::App& app, CommandLine& line) {
   return command;
 }
 
+// Takes passwords off the process list, on which a worker shows what its starter was called with.
+void HidePasswords(int argc, char** argv) {
+  for (int index = 1; index < argc; ++index) {
+    char* const value = std::strncmp(argv[index], kPasswordParam, std::strlen(kPasswordParam)) == 0
+                            ? std::strchr(argv[index], '=')
+                            : nullptr;
+    if (value != nullptr) {
+      std::memset(value + 1, '*', std::strlen(value + 1));
+    }
+  }
+}
+
 int Run(int argc, char** argv) {
   CLI::App app("A network-storage device in a folder.", "kavo-device");
   app.require_subcommand(1);
@@ -97,6 +112,7 @@ int Run(int argc, char** argv) {
   } catch (const CLI::ParseError& error) {
     return app.exit(error) == 0 ? Device::kExitDone : Device::kExitUsage;
   }
+  HidePasswords(argc, argv);
   for (const std::string& rule : line.fault_rules) {
     Device::AddFault(rule);
   }

@@ -9,7 +9,6 @@
 
 #include <cerrno>
 #include <cstring>
-#include <filesystem>
 #include <stdexcept>
 
 #include "device/bodies/device.h"
@@ -24,7 +23,6 @@ namespace Device {
 namespace {
 
 constexpr std::size_t kSessionIdBytes = 16;
-constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
 
 std::string DlError() {
   const char* const reason = dlerror();
@@ -32,8 +30,7 @@ std::string DlError() {
 }
 
 void* LoadModule() {
-  const std::filesystem::path path =
-      std::filesystem::read_symlink("/proc/self/exe").parent_path() / kModuleName;
+  const std::string path = "/proc/self/fd/" + std::to_string(TheDevice().module.Get());
   void* const module = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
   if (module == nullptr) {
     throw std::runtime_error("cannot load module: " + DlError());

@@ -40,7 +40,7 @@ struct ApiRow {
 
 class Launcher {
  public:
-  // Loads the module beside this executable; the device must be open. The calling process becomes
+  // Loads the open device's module. The calling process becomes
   // the one that reaps the workers. Throws std::runtime_error that names the module and the reason.
   Launcher();
 

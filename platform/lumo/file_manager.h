@@ -27,8 +27,8 @@ const char* LumoParseErrorToVeskString(int code, int reserved);
 
 // ---- Identity and file-creation mask of the process
 
-// Takes on the user's uid, gid and groups. A session id that is given (not null) must be a living
-// one of that user. Negative on failure, 0 or more on success.
+// Takes on the user's uid, gid and groups. A session id that is given (neither null nor empty)
+// must be a living one of that user. Negative on failure, 0 or more on success.
 int LumoLibUGIDSet(const char* session_id, const char* user);
 // Sets the mask that the file manager works under and returns the value to restore later.
 std::uint32_t LumoLibUmask();

@@ -106,8 +106,9 @@ void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved);
 // Removes the user's stale tasks.
 void CleanTimeOutTasks(const char* user);
 
-// Ends a worker process of the calling user and all that runs in its process group. Non-zero when
-// it no longer runs, zero when it could not be ended or `pid` is not one of the user's workers.
+// Ends a worker process of the calling user, and with it all that runs in its process group.
+// Non-zero when it no longer runs, zero when it could not be ended or `pid` is not one of the
+// user's workers.
 int DoKill(int pid);
 
 #endif  // PLATFORM_VESK_TASK_MANAGER_H_
