@@ -49,17 +49,20 @@ class Program {
       pointers.push_back(const_cast<char*>(argument.c_str()));
     }
     pointers.push_back(nullptr);
+    // Opened before `prepare`, after which there may be no way to walk there.
+    const int program = open(argv[0].c_str(), O_PATH | O_CLOEXEC);
     pid_ = fork();
     if (pid_ == 0) {
       setpgid(0, 0);
       dup2(ends[1], STDOUT_FILENO);
       prepare();
       if (chdir(folder.c_str()) == 0) {
-        execv(argv[0].c_str(), pointers.data());
+        fexecve(program, pointers.data(), environ);
       }
       _exit(126);
     }
     setpgid(pid_, pid_);
+    close(program);
     close(ends[1]);
     output_ = ends[0];
   }
