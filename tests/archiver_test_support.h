@@ -58,6 +58,7 @@ class Program {
       prepare();
       if (chdir(folder.c_str()) == 0) {
         fexecve(program, pointers.data(), environ);
+        execv(argv[0].c_str(), pointers.data());  // a script is read again by its name
       }
       _exit(126);
     }
