@@ -98,7 +98,7 @@ void ZantroCompressHandler::RunWorker(const StartParameters& start,
 }
 
 // An exception out of a step, such as a request value that is no text, fails the job; it must not
-// reach the host\'s frames.
+// reach the host's frames.
 bool ZantroCompressHandler::RunJob(const StartParameters& start,
                                    _tag_CompressInfo_& info) noexcept {
   try {
