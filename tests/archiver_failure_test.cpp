@@ -42,28 +42,6 @@ TEST_F(Failing, NamesWhatIsMissingAndLeavesTheOldArchive) {
   EXPECT_EQ(ReadFile(out / "old"), old);
 }
 
-TEST_F(Failing, NamesWhatCannotBeRead) {
-  WriteFile(share / "d/a", "a");
-  WriteFile(share / "d/closed/b", "b");
-  const auto as_nobody = [] {
-    if (geteuid() == 0 &&
-        (setgroups(0, nullptr) != 0 || setgid(65534) != 0 || setuid(65534) != 0)) {
-      _exit(125);
-    }
-  };
-  fs::permissions(out, fs::perms::all);
-  for (const char* closed : {"d/closed", "d/a", "d/closed/b"}) {
-    const fs::perms before = fs::status(share / closed).permissions();
-    fs::permissions(share / closed, fs::perms::none);
-    const Strings argv = CommandLine(out / "new", {"d"});
-    const Outcome outcome = Execute(argv, folder, as_nobody);
-    Bad(outcome, "Permission denied");
-    EXPECT_NE(outcome.Last().find(closed), std::string::npos) << outcome.text;
-    fs::permissions(share / closed, before);
-  }
-  EXPECT_EQ(InOut(), Strings{});
-}
-
 TEST_F(Failing, RefusesTargetsThatAreNoArchiveOfTheType) {
   WriteFile(share / "a", "a");
   WriteFile(out / "junk", "no archive");

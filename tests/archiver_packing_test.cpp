@@ -74,18 +74,6 @@ TEST_F(Packing, LetsNoFileNameForgeALine) {
   EXPECT_EQ(outcome.Last(), "Progress: 100");
 }
 
-TEST_F(Packing, LeavesOutExcludedNamesAtAnyDepthAndItself) {
-  WriteFile(share / "d/@eaDir/x", "x");
-  WriteFile(share / "d/e/@eaDir/x", "x");
-  WriteFile(share / "d/e/a*b", "old");
-  WriteFile(share / "d/e/aXb", "x");
-  fs::remove(share / "d/e/a*b");
-  for (int round = 0; round < 2; ++round) {
-    Good(Pack(share / "d/e/a*b", {"d", "d/@eaDir/x"}));
-    EXPECT_EQ(Names(share / "d/e/a*b"), (Strings{"d", "d/e", "d/e/aXb"}));
-  }
-}
-
 TEST_F(Packing, WaitsForNoPipe) {
   WriteFile(share / "d/a", "a");
   ASSERT_EQ(mkfifo((share / "d/pipe").c_str(), 0600), 0);
@@ -97,16 +85,6 @@ TEST_F(Packing, WaitsForNoPipe) {
     EXPECT_EQ(Names(out / "a"), (Strings{"d", "d/a", "d/pipe", "listed"}));
     fs::remove(out / "a");
   }
-}
-
-TEST_F(Packing, StoresLinksOfAShareAsLinks) {
-  WriteFile(root / "outside/secret", "secret");
-  WriteFile(share / "d/a", "a");
-  fs::create_symlink(root / "outside", share / "d/l");
-  fs::create_symlink("d/a", share / "listed");
-  Good(Pack(out / "a", {"d", "listed"}));
-  EXPECT_EQ(ReadFile(out / "a").find("secret"), std::string::npos);
-  EXPECT_EQ(Names(out / "a"), (Strings{"d", "d/a", "d/l", "listed"}));
 }
 
 TEST_F(Packing, PacksSeveralSharesUnderTheirNamesWithLinksKept) {

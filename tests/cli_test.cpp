@@ -110,34 +110,30 @@ struct UsageRow {
 };
 void PrintTo(const UsageRow& row, std::ostream* out) { *out << row.name; }
 
+// clang-format off
 const UsageRow kUsage[] = {
     {"NoCommand", {}, "subcommand is required"},
-    {"NoSuchDevice",
-     {"tasks", "/no/such", "--user", "alice"},
+    {"NoSuchDevice", {"tasks", "/no/such", "--user", "alice"},
      "cannot open device '/no/such': No such file or directory\n"},
     {"FolderIsNoDevice", {"tasks", "/proc", "--user", "alice"}, "device.json: No such file"},
     {"NoSuchUser", {"tasks", "DEV", "--user", "mallory"}, "no user 'mallory'"},
     {"ParameterWithoutName", {"call", "DEV", "--user", "alice", "status", "=x"}, "parameter '=x'"},
-    {"ParameterIsNoJson",
-     {"call", "DEV", "--user", "alice", "status", "x:={"},
+    {"ParameterIsNoJson", {"call", "DEV", "--user", "alice", "status", "x:={"},
      "parameter 'x': line 1"},
-    {"UnknownOperation",
-     {"call", "DEV", "--user", "alice", "status", "--fault", "Lumo=1"},
+    {"UnknownOperation", {"call", "DEV", "--user", "alice", "status", "--fault", "Lumo=1"},
      "fault rule 'Lumo=1': no operation 'Lumo'"},
-    {"RuleWithoutResult",
-     {"call", "DEV", "--user", "alice", "status", "--fault", "DoKill"},
+    {"RuleWithoutResult", {"call", "DEV", "--user", "alice", "status", "--fault", "DoKill"},
      "expected CALL[#N]=RESULT[:CODE]"},
-    {"TraceNotOpened",
-     {"call", "DEV", "--user", "alice", "status", "--trace", "/no/such/file"},
+    {"TraceNotOpened", {"call", "DEV", "--user", "alice", "status", "--trace", "/no/such/file"},
      "cannot open trace file '/no/such/file': No such file or directory"},
     {"NoPasswordFile",
      {"compress", "DEV", "--user", "alice", "/photo/a", "/photo/z", "--password-file", "/no/pw"},
      "/no/pw: No such file or directory"},
-    {"UnknownLevel",
-     {"compress", "DEV", "--user", "alice", "/photo/a", "/photo/z", "--level", "9"},
+    {"UnknownLevel", {"compress", "DEV", "--user", "alice", "/photo/a", "/photo/z", "--level", "9"},
      "--level: 9 not in"},
     {"NoDestination", {"compress", "DEV", "--user", "alice", "/photo/a"}, "paths"},
 };
+// clang-format on
 
 class CliRefuses : public CliTest, public testing::WithParamInterface<UsageRow> {};
 
@@ -160,6 +156,7 @@ struct ConfigRow {
 };
 void PrintTo(const ConfigRow& row, std::ostream* out) { *out << row.name; }
 
+// clang-format off
 const ConfigRow kConfigs[] = {
     {"UnknownKey", "{\n\"volum\": [] }", "line 2: unknown key 'volum'"},
     {"MissingKey", R"({"volumes": [], "users": []})", "line 1: the device lacks 'shares'"},
@@ -185,6 +182,7 @@ const ConfigRow kConfigs[] = {
      R"({"volumes":["v"],"users":[],"shares":[{"name":"s","volume":"v","access":{"x":"rw"}}]})",
      "line 1: no user 'x'"},
 };
+// clang-format on
 
 class ConfigRefuses : public testing::TestWithParam<ConfigRow> {};
 

@@ -129,45 +129,6 @@ TEST_F(JobTest, EveryNameIsPackedUnderItsOwn) {
   EXPECT_EQ(Unpack("vol1/photo/z.7z"), expected);
 }
 
-struct ModeRow {
-  const char* mode;
-  Tree expected;
-};
-
-TEST_F(JobTest, ModesTreatAnArchiveThatExists) {
-  const ModeRow rows[] = {
-      {"add", {{"gone", "1"}, {"kept", "1"}, {"newer", "2"}, {"new", "2"}}},
-      {"update", {{"gone", "1"}, {"kept", "1"}, {"newer", "2"}, {"new", "2"}}},
-      {"freshen", {{"gone", "1"}, {"kept", "1"}, {"newer", "2"}}},
-      {"synchroize", {{"kept", "1"}, {"newer", "2"}, {"new", "2"}}},
-  };
-  for (const ModeRow& row : rows) {
-    for (const std::string ending : {"zip", "7z"}) {
-      const std::string source = std::string("/photo/").append(row.mode).append(ending);
-      const std::string folder = "vol1" + source + "/";
-      const std::string dest = source + "." + ending;
-      const Json::Value params = With(JobParams({source}, dest), "format", ending);
-      for (const char* name : {"gone", "kept", "newer"}) {
-        Add(folder + name, "1");
-      }
-      Succeed(params);
-      fs::remove(At(folder + "gone"));
-      Add(folder + "new", "2");
-      Add(folder + "newer", "2");
-      fs::last_write_time(At(folder + "newer"),
-                          fs::last_write_time(At(folder + "kept")) + std::chrono::hours(1));
-      Succeed(With(params, "mode", row.mode));
-      Tree tree;
-      for (const auto& [name, text] : Unpack("vol1" + dest)) {
-        if (text != "/") {
-          tree[fs::path(name).filename().string()] = text;
-        }
-      }
-      EXPECT_EQ(tree, row.expected) << row.mode << ' ' << ending;
-    }
-  }
-}
-
 TEST_F(JobTest, LevelsAndPasswordReachTheArchive) {
   const std::string text(300000, 'x');
   Add("vol1/photo/a.txt", text);
@@ -210,21 +171,6 @@ TEST_F(JobTest, OverlappingSourcesArePackedOnce) {
   Succeed(JobParams({"/photo/trip", "/photo/trip/a.txt", "/photo//trip/", "/photo/./trip"},
                     "/photo/z.zip"));
   EXPECT_EQ(Unpack("vol1/photo/z.zip"), (Tree{{"trip", "/"}, {"trip/a.txt", "a"}}));
-}
-
-TEST_F(JobTest, DestinationThatIsNoArchiveIsLeftAsItIs) {
-  Add("vol1/photo/a.txt", "a");
-  Add("vol1/photo/text.zip", "no archive");
-  Add("vol1/photo/target", "linked");
-  fs::create_symlink(At("vol1/photo/target"), At("vol1/photo/link.zip"));
-  fs::create_directory(At("vol1/photo/folder.zip"));
-  for (const char* name : {"text.zip", "link.zip", "folder.zip"}) {
-    const std::string dest = std::string("/photo/") + name;
-    EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, dest)).front(), dest + ": 1300");
-  }
-  EXPECT_EQ(ReadFile(At("vol1/photo/text.zip")), "no archive");
-  EXPECT_EQ(ReadFile(At("vol1/photo/target")), "linked");
-  EXPECT_EQ(ReadTree(At("vol1/photo")).size(), 5U);
 }
 
 TEST_F(JobTest, ArchiveNameMayHaveTheLongestName) {

@@ -41,32 +41,22 @@ struct ErrorRow {
 };
 void PrintTo(const ErrorRow& row, std::ostream* out) { *out << row.name; }
 
+// clang-format off
 const ErrorRow kErrors[] = {
     {"NoSpace", "Error: write: No space left on device", "/photo/z.zip", "", 416, {}},
     {"Quota", "7z: Error: Disk quota exceeded", "/photo/z.zip", "", 415, {}},
     {"ReadOnly", "Error: Read-only file system", "/photo/z.zip", "", 411, {}},
     {"NameTooLong", "Error: File name too long", "/photo/z.zip", "", 412, {}},
     {"NameTooLongEncrypted", "Error: File name too long", "/vault/z.zip", "", 413, {}},
-    {"NameTooLongShareUnknown",
-     "Error: File name too long",
-     "/vault/z.zip",
-     "LumoLibCheckEncryptShare=0",
-     412,
-     {"Failed to get share info for /vault/z.zip"}},
-    {"FirstCauseCounts",
-     "Error: File name too long, Disk quota exceeded",
-     "/photo/z.zip",
-     "",
-     415,
+    {"NameTooLongShareUnknown", "Error: File name too long", "/vault/z.zip",
+     "LumoLibCheckEncryptShare=0", 412, {"Failed to get share info for /vault/z.zip"}},
+    {"FirstCauseCounts", "Error: File name too long, Disk quota exceeded", "/photo/z.zip", "", 415,
      {}},
     {"Other", "Error: what", "/photo/z.zip", "", 1300, {"Error: what", ""}},
-    {"CauseWithoutMark",
-     "No space left on device\nError: x",
-     "/photo/z.zip",
-     "",
-     1300,
+    {"CauseWithoutMark", "No space left on device\nError: x", "/photo/z.zip", "", 1300,
      {"Error: x", ""}},
 };
+// clang-format on
 
 class RunFails : public RunTest, public testing::WithParamInterface<ErrorRow> {};
 
@@ -98,24 +88,17 @@ struct SetUpRow {
 };
 void PrintTo(const SetUpRow& row, std::ostream* out) { *out << row.name; }
 
+// clang-format off
 const SetUpRow kSetUps[] = {
-    {"ArchivePathUnresolved",
-     "PathInfoFactory::create#2=0:407",
-     {},
-     "/photo/z.zip: 407",
+    {"ArchivePathUnresolved", "PathInfoFactory::create#2=0:407", {}, "/photo/z.zip: 407",
      {"Failed to get path info:/photo/z.zip, reason=[197]"}},
-    {"NoVolume",
-     "VolumePathParse=-1",
-     {},
-     "DEV/vol1: 1300",
+    {"NoVolume", "VolumePathParse=-1", {}, "DEV/vol1: 1300",
      {"Failed to get volume info, DEV/vol1"}},
-    {"WorkFolderNotEntered",
-     "FindCommonParent=DEV/vol1/photo/",
-     {"chdir", "vol1/photo", EACCES},
-     "DEV/vol1/photo/: 407",
-     {"Failed to chdir, reason=Permission denied(13)"}},
+    {"WorkFolderNotEntered", "FindCommonParent=DEV/vol1/photo/", {"chdir", "vol1/photo", EACCES},
+     "DEV/vol1/photo/: 407", {"Failed to chdir, reason=Permission denied(13)"}},
     {"NotStarted", "KLIBCPopenv=null", {}, "/photo/z.zip: 1300", {"KLIBCPopenv failed"}},
 };
+// clang-format on
 
 class SetUpFails : public RunTest, public testing::WithParamInterface<SetUpRow> {
  protected:
