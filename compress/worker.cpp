@@ -7,6 +7,7 @@
 #include <csignal>
 #include <cstdlib>
 #include <exception>
+#include <optional>
 
 #include "compress/KAVO.Zantro.Compress.h"
 #include "compress/error_codes.h"
@@ -41,6 +42,23 @@ class ListFileOwner {
 
  private:
   const std::string& path_;
+};
+
+// Holds SIGTERM back, so that it finds a job before it has a list file or when that has its owner.
+class TermHeldBack {
+ public:
+  TermHeldBack() {
+    sigset_t term;
+    sigemptyset(&term);
+    sigaddset(&term, SIGTERM);
+    sigprocmask(SIG_BLOCK, &term, &saved_);
+  }
+  ~TermHeldBack() { sigprocmask(SIG_SETMASK, &saved_, nullptr); }
+  TermHeldBack(const TermHeldBack&) = delete;
+  TermHeldBack& operator=(const TermHeldBack&) = delete;
+
+ private:
+  sigset_t saved_{};
 };
 
 // Takes the whole process group along, so that the archiver does not outlive a stopped task.
@@ -138,11 +156,13 @@ bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_Compr
     syslog(LOG_ERR, "%s:%d Can't access source files", kLogSource, __LINE__);
     return false;
   }
+  std::optional<TermHeldBack> held_back(std::in_place);
   if (!SaveZipFileListToTmp(info)) {
     syslog(LOG_ERR, "%s:%d Failed to get ziplist", kLogSource, __LINE__);
     return false;
   }
   const ListFileOwner list_file(info.list_file);
+  held_back.reset();
   info.dest_path = start.dest;
   info.codepage = start.codepage;
   LumoGetZipInfo(info);
