@@ -241,6 +241,27 @@ TEST_F(WorkerTest, AsksOncePerShareAndPassesOverSourcesOfOneThatIsNotListed) {
   EXPECT_EQ(access[1].args[1], 1);
 }
 
+TEST_F(WorkerTest, NamesAndPathsThatAreTooLong) {
+  const std::string name = "/photo/" + std::string(256, 'n');
+  EXPECT_EQ(FailJob(JobParams({name}, "/photo/z.zip")), Strings{name + ": 412"});
+  const std::string path = "/photo/" + std::string(1 << 20U, 'p');
+  EXPECT_EQ(FailJob(JobParams({path}, "/photo/z.zip")), Strings{path + ": 412"});
+}
+
+TEST_F(WorkerTest, RefusesASourceWhoseLineDoesNotFit) {
+  for (const char* rule : {"LumoCheckPath=0", "CheckShareListPrivilege=0", "FindCommonParent=/"}) {
+    Device::AddFault(rule);
+  }
+  const std::string share = At("vol1/photo/");
+  const std::string fits = "/photo/" + std::string(4094 - share.size(), 'd');
+  EXPECT_EQ(FailJob(JobParams({fits}, "/photo/z.zip")).back(), "/photo/z.zip: 412");
+  EXPECT_FALSE(Calls("KLIBCPopenv").empty());
+  const std::string too_long = fits + "d";
+  EXPECT_EQ(FailJob(JobParams({too_long}, "/photo/z.zip")).back(), too_long + ": 1300");
+  EXPECT_EQ(Calls("KLIBCPopenv").size(), 1U);
+  EXPECT_TRUE(StagedPaths().empty());
+}
+
 TEST_F(WorkerTest, AsksNoPrivilegeForTheUsersHome) {
   Add("vol1/photo/sub/a.txt", "a");
   EXPECT_FALSE(RunJob(JobParams({"/photo/sub"}, "/home/z.zip")).isMember("errors"));
