@@ -109,17 +109,25 @@ bool EndWorker(const std::string& user, pid_t pid) {
   // The descriptor holds on to the process that has the id now; whether that is the worker is asked
   // after, so that no other can slip in between.
   const FileDescriptor process(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
-  if (!process && errno != ESRCH) {
+  // Where there are no such descriptors, under emulators, the id itself must do.
+  const bool has_descriptor = static_cast<bool>(process);
+  const int error = has_descriptor ? 0 : errno;
+  if (error != 0 && error != ESRCH && error != ENOSYS) {
     return false;
   }
-  if (!process || !IsWorkerAlive(user, pid)) {
+  if (error == ESRCH || !IsWorkerAlive(user, pid)) {
     return true;  // it has ended already, and an archiver that nobody reads from ends by itself
   }
   const Clock::time_point deadline = Clock::now() + kGrace;
-  if (syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) != 0) {
+  const bool is_told = has_descriptor
+                           ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0
+                           : kill(pid, SIGTERM) == 0;
+  if (!is_told) {
     return false;
   }
-  WaitForProcess(process, deadline);
+  if (has_descriptor) {
+    WaitForProcess(process, deadline);
+  }
   if (WaitForGroup(pid, deadline)) {
     return true;
   }
