@@ -213,6 +213,14 @@ TEST_F(WorkerTest, DoesNotFinishATaskItCannotRead) {
   EXPECT_TRUE(Calls("Vesk::Task::finish").empty());
 }
 
+TEST_F(WorkerTest, LogsATaskThatIsNotStoredAsFinished) {
+  Add("vol1/photo/a.txt", "a");
+  Device::AddFault("Vesk::Task::finish=0");
+  Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip"));
+  ASSERT_TRUE(WaitUntil([&] { return !Calls("CleanTimeOutTasks").empty(); }));
+  EXPECT_EQ(Log(), Strings{"Failed to write progress."});
+}
+
 TEST_F(WorkerTest, TakesARequestValueThatIsNoTextForAFailure) {
   Add("vol1/photo/a.txt", "a");
   for (const char* param : {"level", "mode", "format", "password"}) {
