@@ -26,9 +26,9 @@ namespace {
 
 constexpr mode_t kFileMode = 0666;  // the umask takes its share
 
-UniqueFd Open(const std::string& path, int flags) {
-  UniqueFd fd(open(path.c_str(), flags | O_CLOEXEC, kFileMode));
-  if (!fd.Valid()) {
+Device::FileDescriptor Open(const std::string& path, int flags) {
+  Device::FileDescriptor fd(open(path.c_str(), flags | O_CLOEXEC, kFileMode));
+  if (!fd) {
     throw SystemFailure("cannot open", path, errno);
   }
   return fd;
@@ -37,7 +37,7 @@ UniqueFd Open(const std::string& path, int flags) {
 // Hands `use` the bytes of `path` piece by piece.
 template <typename Use>
 void ReadFile(const std::string& path, Use use) {
-  const UniqueFd fd = Open(path, O_RDONLY);
+  const Device::FileDescriptor fd = Open(path, O_RDONLY);
   std::array<char, 65536> buffer{};
   while (const ssize_t size = read(fd.Get(), buffer.data(), buffer.size())) {
     if (size > 0) {
@@ -49,7 +49,7 @@ void ReadFile(const std::string& path, Use use) {
 }
 
 void CopyFile(const std::string& from, const std::string& to, const Cancel& cancel) {
-  const UniqueFd out = Open(to, O_WRONLY | O_CREAT | O_EXCL);
+  const Device::FileDescriptor out = Open(to, O_WRONLY | O_CREAT | O_EXCL);
   ReadFile(from, [&](const char* bytes, size_t size) {
     cancel.Check();
     while (size > 0) {
@@ -77,9 +77,9 @@ std::vector<std::string> Sources(const Request& request) {
 
 void Pack(const Request& request, PackRun run, const std::string& folder, const Cancel& cancel,
           Report& report) {
-  const UniqueFd sources = UnnamedFile(run.sources.list);
-  const UniqueFd left_out = UnnamedFile(run.left_out.list);
-  const UniqueFd password = PasswordInput(request);
+  const Device::FileDescriptor sources = UnnamedFile(run.sources.list);
+  const Device::FileDescriptor left_out = UnnamedFile(run.left_out.list);
+  const Device::FileDescriptor password = PasswordInput(request);
   run.sources_file = "/proc/self/fd/" + std::to_string(sources.Get());
   run.left_out_file = "/proc/self/fd/" + std::to_string(left_out.Get());
   Child7z child;

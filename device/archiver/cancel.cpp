@@ -18,8 +18,8 @@ Cancel::Cancel(int report_fd) : report_fd_(report_fd) {
     sigaddset(&stops, number);
   }
   sigprocmask(SIG_BLOCK, &stops, nullptr);
-  signals_ = UniqueFd(signalfd(-1, &stops, SFD_CLOEXEC | SFD_NONBLOCK));
-  if (!signals_.Valid()) {
+  signals_ = Device::FileDescriptor(signalfd(-1, &stops, SFD_CLOEXEC | SFD_NONBLOCK));
+  if (!signals_) {
     throw SystemFailure("cannot watch", "signals", errno);
   }
 }

@@ -1,7 +1,7 @@
 #ifndef DEVICE_ARCHIVER_CANCEL_H_
 #define DEVICE_ARCHIVER_CANCEL_H_
 
-#include "device/archiver/unique_fd.h"
+#include "device/bodies/file_descriptor.h"
 
 namespace Archiver {
 
@@ -20,7 +20,7 @@ class Cancel {
 
  private:
   int report_fd_;
-  UniqueFd signals_;
+  Device::FileDescriptor signals_;
 };
 
 }  // namespace Archiver

@@ -78,15 +78,15 @@ bool WorkFolder::CreateLocked() {
   if (mkdtemp(path_.data()) == nullptr) {
     throw SystemFailure("cannot create a temporary folder in", parent_, errno);
   }
-  lock_ = UniqueFd(open(path_.c_str(), kOpenFolder));
-  if (!lock_.Valid() && errno != ENOENT) {
+  lock_ = Device::FileDescriptor(open(path_.c_str(), kOpenFolder));
+  if (!lock_ && errno != ENOENT) {
     const int error = errno;
     rmdir(path_.c_str());
     throw SystemFailure("cannot open temporary folder", path_, error);
   }
   // A file system without locks costs the sweep, not the archive.
   struct stat info {};
-  return lock_.Valid() && (flock(lock_.Get(), LOCK_EX | LOCK_NB) == 0 || errno != EWOULDBLOCK) &&
+  return lock_ && (flock(lock_.Get(), LOCK_EX | LOCK_NB) == 0 || errno != EWOULDBLOCK) &&
          fstat(lock_.Get(), &info) == 0 && info.st_nlink > 0;
 }
 
@@ -128,9 +128,9 @@ void WorkFolder::Sweep() const {
         std::strlen(entry->d_name) != std::strlen(kPrefix) + std::strlen(kRandom)) {
       continue;
     }
-    const UniqueFd stale(openat(dirfd(dir.get()), entry->d_name, kOpenFolder));
+    const Device::FileDescriptor stale(openat(dirfd(dir.get()), entry->d_name, kOpenFolder));
     struct stat info {};
-    if (stale.Valid() && fstat(stale.Get(), &info) == 0 && info.st_uid == geteuid() &&
+    if (stale && fstat(stale.Get(), &info) == 0 && info.st_uid == geteuid() &&
         flock(stale.Get(), LOCK_EX | LOCK_NB) == 0) {
       RemoveResults(stale.Get());
       unlinkat(dirfd(dir.get()), entry->d_name, AT_REMOVEDIR);

@@ -6,7 +6,7 @@
 #include <ctime>
 #include <string>
 
-#include "device/archiver/unique_fd.h"
+#include "device/bodies/file_descriptor.h"
 
 namespace Archiver {
 
@@ -48,7 +48,7 @@ class WorkFolder {
   std::string archive_;
   std::string parent_;
   std::string path_;
-  UniqueFd lock_;
+  Device::FileDescriptor lock_;
 };
 
 }  // namespace Archiver

@@ -21,18 +21,18 @@ void CheckPassword(const Request& request) {
   }
 }
 
-UniqueFd PasswordInput(const Request& request) {
+Device::FileDescriptor PasswordInput(const Request& request) {
   if (request.password.empty()) {
-    return UniqueFd();
+    return Device::FileDescriptor();
   }
   // It asks once to open an old archive and once to encrypt new files.
   const std::string answer = request.password + '\n';
   return UnnamedFile(answer + answer);
 }
 
-UniqueFd UnnamedFile(const std::string& text) {
-  UniqueFd fd(memfd_create("kavo-7z", MFD_CLOEXEC));
-  bool whole = fd.Valid();
+Device::FileDescriptor UnnamedFile(const std::string& text) {
+  Device::FileDescriptor fd(memfd_create("kavo-7z", MFD_CLOEXEC));
+  bool whole = static_cast<bool>(fd);
   for (size_t done = 0; whole && done < text.size();) {
     const ssize_t size = write(fd.Get(), text.data() + done, text.size() - done);
     whole = size > 0 || (size < 0 && errno == EINTR);

@@ -2,7 +2,7 @@
 #define DEVICE_ARCHIVER_PASSWORD_H_
 
 #include "device/archiver/command_line.h"
-#include "device/archiver/unique_fd.h"
+#include "device/bodies/file_descriptor.h"
 
 namespace Archiver {
 
@@ -10,10 +10,10 @@ namespace Archiver {
 void CheckPassword(const Request& request);
 
 // A standard input for 7z that answers its questions for the password; invalid when there is none.
-UniqueFd PasswordInput(const Request& request);
+Device::FileDescriptor PasswordInput(const Request& request);
 
 // An unnamed file that holds `text`, positioned at its start.
-UniqueFd UnnamedFile(const std::string& text);
+Device::FileDescriptor UnnamedFile(const std::string& text);
 
 }  // namespace Archiver
 

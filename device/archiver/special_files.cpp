@@ -13,7 +13,7 @@
 #include <utility>
 
 #include "device/archiver/failure.h"
-#include "device/archiver/unique_fd.h"
+#include "device/bodies/file_descriptor.h"
 
 namespace Archiver {
 
@@ -80,7 +80,7 @@ class Scan {
 std::vector<std::string> FindSpecials(const WorkPlace& place,
                                       const std::vector<std::string>& sources,
                                       const std::vector<std::string>& excluded) {
-  const UniqueFd folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const Device::FileDescriptor folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   Scan scan(!place.shares.empty(), excluded);
   for (const std::string& source : sources) {
     const int flags = place.shares.count(source) != 0 ? 0 : AT_SYMLINK_NOFOLLOW;

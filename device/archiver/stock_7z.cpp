@@ -14,7 +14,7 @@
 #include "device/archiver/error_text.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/progress.h"
-#include "device/archiver/unique_fd.h"
+#include "device/bodies/file_descriptor.h"
 
 namespace Archiver {
 
@@ -30,10 +30,10 @@ struct Pipe {
     if (pipe2(ends.data(), O_CLOEXEC) != 0) {
       throw SystemFailure(kCannotStart, program, errno);
     }
-    reader = UniqueFd(ends[0]);
-    writer = UniqueFd(ends[1]);
+    reader = Device::FileDescriptor(ends[0]);
+    writer = Device::FileDescriptor(ends[1]);
   }
-  UniqueFd reader, writer;
+  Device::FileDescriptor reader, writer;
 };
 
 // Kills and reaps its process unless that was waited for.
@@ -107,7 +107,7 @@ std::vector<std::string> Environment() {
   return result;
 }
 
-std::string ReadSome(UniqueFd& fd) {
+std::string ReadSome(Device::FileDescriptor& fd) {
   std::array<char, 65536> buffer{};
   ssize_t size = 0;
   do {
@@ -136,10 +136,10 @@ void PassOn(const std::vector<Event>& events, Report& report) {
   }
 }
 
-void Drain(UniqueFd& output, UniqueFd& errors, ErrorText* text, const Cancel& cancel,
-           Report& report) {
+void Drain(Device::FileDescriptor& output, Device::FileDescriptor& errors, ErrorText* text,
+           const Cancel& cancel, Report& report) {
   OutputParser parser;
-  while ((output.Valid() || errors.Valid()) && !text->HasWarning()) {
+  while ((output || errors) && !text->HasWarning()) {
     pollfd watched[] = {{output.Get(), POLLIN, 0},
                         {errors.Get(), POLLIN, 0},
                         {cancel.SignalFd(), POLLIN, 0},
@@ -157,9 +157,9 @@ void Drain(UniqueFd& output, UniqueFd& errors, ErrorText* text, const Cancel& ca
   }
 }
 
-UniqueFd OpenNull() {
-  UniqueFd fd(open("/dev/null", O_RDONLY | O_CLOEXEC));
-  if (!fd.Valid()) {
+Device::FileDescriptor OpenNull() {
+  Device::FileDescriptor fd(open("/dev/null", O_RDONLY | O_CLOEXEC));
+  if (!fd) {
     throw SystemFailure("cannot open", "/dev/null", errno);
   }
   return fd;
@@ -171,7 +171,7 @@ void Run7z(const Child7z& child, const Cancel& cancel, Report& report) {
   Pipe output(child.program);
   Pipe errors(child.program);
   Pipe exec_errors(child.program);
-  const UniqueFd no_input = OpenNull();
+  const Device::FileDescriptor no_input = OpenNull();
   std::vector<std::string> arguments = child.arguments;
   arguments.insert(arguments.begin(), child.program);
   const std::vector<char*> argv = Pointers(arguments);

@@ -10,7 +10,7 @@
 #include <unordered_set>
 
 #include "device/archiver/failure.h"
-#include "device/archiver/unique_fd.h"
+#include "device/bodies/file_descriptor.h"
 
 namespace Archiver {
 namespace {
@@ -82,7 +82,7 @@ WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::stri
 }
 
 void CheckSources(const WorkPlace& place, const std::vector<std::string>& sources) {
-  const UniqueFd folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const Device::FileDescriptor folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   std::unordered_set<std::string> folders;
   struct stat info {};
   for (const std::string& source : sources) {

@@ -131,6 +131,21 @@ Outcome Launcher::CallHere(const Request& request) {
   return response_state.outcome;
 }
 
+void Launcher::ServeAndExit(const Request& request) {
+  Outcome outcome;
+  try {
+    outcome = CallHere(request);
+  } catch (const Json::Exception& error) {
+    syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
+    outcome = {kErrBadParameter, Json::Value()};
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
+    outcome = {kErrInternal, Json::Value()};
+  }
+  CloseStores();
+  _exit(WriteFrame(TheDevice().outcome.Get(), outcome) ? 0 : 1);
+}
+
 Outcome Launcher::Call(const Request& request) {
   Outcome outcome;
   if (FindRow(request, outcome.code) == nullptr) {
@@ -149,17 +164,7 @@ Outcome Launcher::Call(const Request& request) {
   }
   if (pid == 0) {
     TheDevice().outcome = std::move(write_end);
-    try {
-      outcome = CallHere(request);
-    } catch (const Json::Exception& error) {
-      syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
-      outcome = {kErrBadParameter, Json::Value()};
-    } catch (const std::exception& error) {
-      syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
-      outcome = {kErrInternal, Json::Value()};
-    }
-    CloseStores();
-    _exit(WriteFrame(TheDevice().outcome.Get(), outcome) ? 0 : 1);
+    ServeAndExit(request);
   }
   write_end.Close();
   if (!ReadFrame(read_end.Get(), outcome)) {

@@ -59,6 +59,9 @@ class Launcher {
   // Null, and the host's error code in `code`, when no row serves the request.
   const ApiRow* FindRow(const Request& request, int& code) const;
 
+  // The request process: sends the outcome, or the host's error code for what the handler throws.
+  [[noreturn]] void ServeAndExit(const Request& request);
+
   std::unique_ptr<void, int (*)(void*)> module_;
   const ApiRow* table_ = nullptr;
 };
