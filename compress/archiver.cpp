@@ -23,7 +23,6 @@ namespace Zantro {
 namespace {
 
 constexpr char kArchiverProgram[] = "/usr/bin/7z";
-constexpr char kDefaultCommand[] = "a";  // for a request without "mode"
 constexpr std::size_t kArgumentsMax = 32;
 constexpr std::size_t kArchivePathSize = 4095;  // bytes; a longer path is cut to fit
 constexpr std::uint32_t kArchiveMode = 0666;
@@ -60,10 +59,10 @@ class ArgumentVector {
 void AddArguments(const _tag_CompressInfo_& info, const char* archive_path,
                   ArgumentVector& arguments) {
   arguments.Add(kArchiverProgram);
-  arguments.Add(info.command.empty() ? kDefaultCommand : info.command);
+  arguments.Add(info.command);  // this one and the two switches also when empty
   arguments.Add("-utf16");
   arguments.Add(archive_path);
-  arguments.Add(info.update_switch);  // these two also when empty
+  arguments.Add(info.update_switch);
   arguments.Add(info.level_switch);
   if (!info.is7z) {
     arguments.Add("-lang" + info.codepage);

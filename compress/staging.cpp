@@ -11,13 +11,13 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdio>
 #include <cstdlib>
 #include <map>
 #include <string>
 
 #include "compress/KAVO.Zantro.Compress.h"
 #include "compress/error_codes.h"
+#include "compress/list_line.h"
 #include "platform/klib/system.h"
 #include "platform/lumo/file_manager.h"
 
@@ -26,8 +26,6 @@ namespace Zantro {
 namespace {
 
 constexpr char kTempTemplate[] = "/tmp/lumozipXXXXXX";
-constexpr std::size_t kListLineSize = 4097;        // bytes, with the terminating zero
-constexpr std::size_t kStagedListLineSize = 4120;  // the same, for names that begin with the share
 constexpr char kRemoveProgram[] = "/bin/rm";
 constexpr unsigned int kExeclRunAndWait = 187;
 
@@ -48,26 +46,11 @@ class FileDescriptor {
   int fd_;
 };
 
-// One line of the list: "." and the name, which begins with "/".
+// False when the line was not written whole.
 template <std::size_t kBufferSize>
-class ListLine {
- public:
-  explicit ListLine(const std::string& name)
-      : length_(std::snprintf(text_, kBufferSize, ".%s\n", name.c_str())),
-        is_expressible_(length_ > 0 && static_cast<std::size_t>(length_) < kBufferSize &&
-                        name.find('\n') == std::string::npos) {}
-
-  // False when the name does not fit the buffer, or holds a line feed, which ends a line.
-  bool IsExpressible() const { return is_expressible_; }
-  // False when the line was not written whole.
-  bool Write(int fd) const { return write(fd, text_, length_) == length_; }
-  const char* Text() const { return text_; }
-
- private:
-  char text_[kBufferSize];
-  int length_;
-  bool is_expressible_;
-};
+bool WriteLine(int fd, const ListLine<kBufferSize>& line) {
+  return write(fd, line.Text(), line.Length()) == line.Length();
+}
 
 void RemoveStagingDirectory(const char* directory) {
   struct stat status {};
@@ -116,7 +99,7 @@ bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std:
       RefuseSource(source);
       return false;
     }
-    if (!line.Write(list.Get())) {
+    if (!WriteLine(list.Get(), line)) {
       syslog(LOG_ERR, "%s:%d Failed to write %s to tempzip", kLogSource, __LINE__, line.Text());
       SetErrItem(info.dest_path, kErrGeneral);
       return false;
@@ -165,7 +148,7 @@ bool ZantroCompressHandler::FillStagingDirectory(const _tag_CompressInfo_& info,
       RefuseSource(source);
       return false;
     }
-    if (!line.Write(list.Get())) {
+    if (!WriteLine(list.Get(), line)) {
       syslog(LOG_ERR, "%s:%d Failed to write tempzip", kLogSource, __LINE__);
       SetErrItem(info.dest_path, kErrGeneral);
       return false;

@@ -26,7 +26,7 @@ constexpr char kNotifyFailed[] = "filebrowser:filebrowser_compress_failed";
 // The list file of a job that may yet be stopped; null when there is none.
 const char* volatile list_file_of_job = nullptr;
 
-// Owns the list file from staging on. The archiver run removes it; this is for a run that is
+// Owns the list file from staging on until the archiver run, which removes it: for a job that is
 // stopped before, and for a step that throws.
 class ListFileOwner {
  public:
@@ -35,7 +35,9 @@ class ListFileOwner {
   }
   ~ListFileOwner() {
     list_file_of_job = nullptr;
-    unlink(path_.c_str());
+    if (std::uncaught_exceptions() > 0) {
+      unlink(path_.c_str());
+    }
   }
   ListFileOwner(const ListFileOwner&) = delete;
   ListFileOwner& operator=(const ListFileOwner&) = delete;

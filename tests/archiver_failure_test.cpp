@@ -83,7 +83,7 @@ TEST_F(Failing, SaysWhyARequestCannotBeMet) {
     options.password = c.password;
     Bad(Pack(out / "new", c.sources, options), c.cause);
   }
-  Bad(Execute({KAVO_7Z_PATH, "", out / "new"}, folder), "command");
+  Bad(Execute({KAVO_7Z_PATH, "x", out / "new"}, folder), "command");
   EXPECT_EQ(InOut(), Strings{});
 }
 

@@ -24,7 +24,7 @@ TEST(CommandLine, ReadsTheCallersVectorWithItsEmptyArguments) {
   EXPECT_EQ(zip.password, " -x");
   EXPECT_EQ(zip.exclude, Strings{"@eaDir"});
   const Request plain =
-      ParseCommandLine({"a", "-utf16", "/v/a", "", "", "-xr!@eaDir", "@/t/l", "-progress"});
+      ParseCommandLine({"", "-utf16", "/v/a", "", "", "-xr!@eaDir", "@/t/l", "-progress"});
   EXPECT_FALSE(plain.zip);
   EXPECT_EQ(plain.actions, "p1q1r2x2y2z2w2");
   EXPECT_EQ(plain.list_path, "/t/l");
@@ -37,7 +37,6 @@ TEST(CommandLine, TellsThePasswordRogressFromTheSwitch) {
 
 TEST(CommandLine, RefusesWhatNoCallerSends) {
   const std::vector<Strings> wrong = {{},
-                                      {"", "/a", "@l"},
                                       {"x", "/a", "@l"},
                                       {"a", "rel", "@l"},
                                       {"a", "@l"},

@@ -148,7 +148,7 @@ TEST_F(RunTest, ArgumentsStandInTheirOrderEmptyOnesIncluded) {
   };
   const std::string archive = At("vol1/photo/z.7z");
   EXPECT_EQ(arguments(0),
-            "|/usr/bin/7z|a|-utf16|" + archive + "|||-lang|-xr!@eaDir|@LIST|-progress");
+            "|/usr/bin/7z||-utf16|" + archive + "|||-lang|-xr!@eaDir|@LIST|-progress");
   EXPECT_EQ(arguments(1), "|/usr/bin/7z|u|-utf16|" + archive +
                               "|-up1q0r2x1y2z1w2|-mx9|-ppass word|-xr!@eaDir|@LIST|-progress");
   EXPECT_EQ(arguments(2),

@@ -9,6 +9,7 @@ namespace {
 
 constexpr char kProgress[] = "-progress";
 constexpr char kPassword[] = "-p";
+constexpr char kAdd[] = "a";
 
 bool StartsWith(const std::string& text, const char* prefix) {
   return text.compare(0, std::strlen(prefix), prefix) == 0;
@@ -51,10 +52,11 @@ void ParseSwitch(const std::string& argument, bool last, Request* request) {
 
 Request ParseCommandLine(const std::vector<std::string>& arguments) {
   Request request;
-  if (!arguments.empty()) {
-    request.command = arguments[0];
+  if (arguments.empty()) {
+    throw Failure("no command");
   }
-  if (request.command == "a") {
+  request.command = arguments[0].empty() ? kAdd : arguments[0];
+  if (request.command == kAdd) {
     request.actions = "p1q1r2x2y2z2w2";
   } else if (request.command == "u") {
     request.actions = "p1q1r2x1y2z1w2";

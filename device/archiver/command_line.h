@@ -18,8 +18,9 @@ struct Request {
   std::string list_path;
 };
 
-// Reads the arguments after the program's name. Empty arguments stand for absent switches. Throws
-// Failure for a vector that no caller of this program should send.
+// Reads the arguments after the program's name. An empty command means "a", other empty arguments
+// stand for absent switches. Throws Failure for a vector that no caller of this program should
+// send.
 Request ParseCommandLine(const std::vector<std::string>& arguments);
 
 // Blanks the password in the process's own argument vector, where everybody can read it.
