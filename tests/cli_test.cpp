@@ -11,14 +11,13 @@
 #include "device/bodies/config.h"
 #include "device/bodies/json_text.h"
 #include "tests/device_fixture.h"
+#include "tests/table.h"
 
 namespace {
 
 namespace fs = std::filesystem;
 
-using Strings = std::vector<std::string>;
 using testing::HasSubstr;
-using testing::ValuesIn;
 
 class CliTest : public DeviceTest {
  protected:
@@ -103,100 +102,32 @@ TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   EXPECT_EQ(Kavo({"tasks", device_, "--user", "alice"}).out, "");
 }
 
-struct UsageRow {
-  const char* name;
-  Strings arguments;  // "DEV" stands for the device
-  std::string words;  // on standard error
-};
-void PrintTo(const UsageRow& row, std::ostream* out) { *out << row.name; }
-
-// clang-format off
-const UsageRow kUsage[] = {
-    {"NoCommand", {}, "subcommand is required"},
-    {"NoSuchDevice", {"tasks", "/no/such", "--user", "alice"},
-     "cannot open device '/no/such': No such file or directory\n"},
-    {"FolderIsNoDevice", {"tasks", "/proc", "--user", "alice"}, "device.json: No such file"},
-    {"NoSuchUser", {"tasks", "DEV", "--user", "mallory"}, "no user 'mallory'"},
-    {"ParameterWithoutName", {"call", "DEV", "--user", "alice", "status", "=x"}, "parameter '=x'"},
-    {"ParameterIsNoJson", {"call", "DEV", "--user", "alice", "status", "x:={"},
-     "parameter 'x': line 1"},
-    {"UnknownOperation", {"call", "DEV", "--user", "alice", "status", "--fault", "Lumo=1"},
-     "fault rule 'Lumo=1': no operation 'Lumo'"},
-    {"RuleWithoutResult", {"call", "DEV", "--user", "alice", "status", "--fault", "DoKill"},
-     "expected CALL[#N]=RESULT[:CODE]"},
-    {"TraceNotOpened", {"call", "DEV", "--user", "alice", "status", "--trace", "/no/such/file"},
-     "cannot open trace file '/no/such/file': No such file or directory"},
-    {"NoPasswordFile",
-     {"compress", "DEV", "--user", "alice", "/photo/a", "/photo/z", "--password-file", "/no/pw"},
-     "/no/pw: No such file or directory"},
-    {"UnknownLevel", {"compress", "DEV", "--user", "alice", "/photo/a", "/photo/z", "--level", "9"},
-     "--level: 9 not in"},
-    {"NoDestination", {"compress", "DEV", "--user", "alice", "/photo/a"}, "paths"},
-};
-// clang-format on
-
-class CliRefuses : public CliTest, public testing::WithParamInterface<UsageRow> {};
+// In the arguments "DEV" stands for the device.
+class CliRefuses : public CliTest, public testing::WithParamInterface<TableRow> {};
 
 TEST_P(CliRefuses, WithStatusTwoAndOneLine) {
-  Strings arguments = GetParam().arguments;
+  Strings arguments = GetParam().All("argument");
   std::replace(arguments.begin(), arguments.end(), std::string("DEV"), device_);
   const Ran ran = Kavo(arguments);
   EXPECT_EQ(ran.status, 2);
   EXPECT_EQ(ran.out, "");
-  EXPECT_THAT(ran.err, HasSubstr(GetParam().words));
+  EXPECT_THAT(ran.err, HasSubstr(GetParam().Get("words")));
 }
 
-INSTANTIATE_TEST_SUITE_P(Usage, CliRefuses, ValuesIn(kUsage),
-                         [](const auto& row) { return row.param.name; });
+INSTANTIATE_TABLE(CliRefuses, wrong_usage);
 
-struct ConfigRow {
-  const char* name;
-  const char* text;
-  const char* error;
-};
-void PrintTo(const ConfigRow& row, std::ostream* out) { *out << row.name; }
-
-// clang-format off
-const ConfigRow kConfigs[] = {
-    {"UnknownKey", "{\n\"volum\": [] }", "line 2: unknown key 'volum'"},
-    {"MissingKey", R"({"volumes": [], "users": []})", "line 1: the device lacks 'shares'"},
-    {"NoObject", "[]", "line 1: the device is not an object"},
-    {"Syntax", "{\n\n\"volumes\" [] }", "line 3: Missing ':' after object member name"},
-    {"RepeatedKey", "{\"volumes\": [],\n\"volumes\": []}", "line 2: Duplicate key: 'volumes'"},
-    {"UidOfRoot", R"({"volumes":["v"],"shares":[],"users":[{"name":"a","uid":0,"home":"v"}]})",
-     "line 1: 'uid' is not a number above 0"},
-    {"TwiceTheSameUid",
-     R"({"volumes":["v"],"shares":[],"users":[{"name":"a","uid":7,"home":"v"},
-{"name":"b","uid":7,"home":"v"}]})",
-     "line 2: user 'b' has the name or uid of another"},
-    {"HomeOnNoVolume", R"({"volumes":["v"],"shares":[],"users":[{"name":"a","uid":7,"home":"w"}]})",
-     "line 1: no volume 'w'"},
-    {"NameWithSlash", R"({"volumes":["a/../.."],"shares":[],"users":[]})",
-     "line 1: 'a/../..' is not a valid name"},
-    {"ShareNamedHome",
-     R"({"volumes":["v"],"users":[],"shares":[{"name":"home","volume":"v","access":{}}]})",
-     "line 1: the name 'home' is taken"},
-    {"VolumeOfTheStores", R"({"volumes":["users"],"users":[],"shares":[]})",
-     "line 1: the name 'users' is taken"},
-    {"AccessForNobody",
-     R"({"volumes":["v"],"users":[],"shares":[{"name":"s","volume":"v","access":{"x":"rw"}}]})",
-     "line 1: no user 'x'"},
-};
-// clang-format on
-
-class ConfigRefuses : public testing::TestWithParam<ConfigRow> {};
+class ConfigRefuses : public testing::TestWithParam<TableRow> {};
 
 TEST_P(ConfigRefuses, NamingLineAndReason) {
   try {
-    Device::ParseConfig(GetParam().text);
+    Device::ParseConfig(GetParam().Get("text"));
     ADD_FAILURE() << "accepted";
   } catch (const std::runtime_error& error) {
-    EXPECT_STREQ(error.what(), GetParam().error);
+    EXPECT_EQ(error.what(), GetParam().Get("error"));
   }
 }
 
-INSTANTIATE_TEST_SUITE_P(Config, ConfigRefuses, ValuesIn(kConfigs),
-                         [](const auto& row) { return row.param.name; });
+INSTANTIATE_TABLE(ConfigRefuses, wrong_configs);
 
 // A device below a folder that is closed to its users works all the same, and the folder stays
 // shut.

@@ -12,8 +12,7 @@
 
 #include "device/bodies/device.h"
 #include "device/host/launcher.h"
-
-using Strings = std::vector<std::string>;
+#include "tests/table.h"
 
 // A folder that others can walk into; removed with all that is in it.
 class TempFolder {

@@ -16,7 +16,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-using Strings = std::vector<std::string>;
 using Tree =
     std::map<std::string, std::string>;  // path to contents; "/" for a folder, "->x" a link
 
@@ -113,22 +112,6 @@ TEST_F(JobTest, SourcesOfSeveralSharesAreNamedFromTheirShare) {
   EXPECT_TRUE(fs::is_symlink(StagedPaths().front() + "/music"));
 }
 
-TEST_F(JobTest, EveryNameIsPackedUnderItsOwn) {
-  const Strings names = {"-x",       "@list",     "*x*",     "?",       "[a]",   " both ends ",
-                         "a,b",      "quo\"te",   "\"q\"",   "'",       "!ex",   "Error: disk",
-                         "日本.txt", "tab\there", "back\\s", "\x1b[2J", "$HOME", "~"};
-  Tree expected;
-  Strings sources;
-  for (const std::string& name : names) {
-    Add("vol1/photo/" + name, "of " + name);
-    expected[name] = "of " + name;
-    sources.push_back("/photo/" + name);
-  }
-  Add("vol1/photo/xxx", "matches a wildcard and is not asked for");
-  Succeed(JobParams(sources, "/photo/out/../z.7z"));
-  EXPECT_EQ(Unpack("vol1/photo/z.7z"), expected);
-}
-
 TEST_F(JobTest, LevelsAndPasswordReachTheArchive) {
   const std::string text(300000, 'x');
   Add("vol1/photo/a.txt", text);
@@ -149,28 +132,12 @@ TEST_F(JobTest, LevelsAndPasswordReachTheArchive) {
   }
 }
 
-TEST_F(JobTest, LegacyUnzipShowsNamesOfTheUsersCodePage) {
-  Add("vol1/photo/日の出.txt", "a");
-  Succeed(JobParams({"/photo/日の出.txt"}, "/photo/z.zip"), "bob");
-  // An unzip that knows no UTF-8 flag passes on the bytes, which a terminal of that code page
-  // shows.
-  const Ran listing = RunProgram({"/usr/bin/unzip", "-Z1", At("vol1/photo/z.zip")});
-  EXPECT_EQ(listing.out, "\x93\xfa\x82\xcc\x8f\x6f.txt\n");
-}
-
 TEST_F(JobTest, ArchiveLiesInASourceAndDoesNotHoldItself) {
   Add("vol1/photo/trip/a.txt", "a");
   for (int round = 0; round < 2; ++round) {
     Succeed(JobParams({"/photo/trip"}, "/photo/trip/z.zip"));
     EXPECT_EQ(Unpack("vol1/photo/trip/z.zip"), (Tree{{"trip", "/"}, {"trip/a.txt", "a"}}));
   }
-}
-
-TEST_F(JobTest, OverlappingSourcesArePackedOnce) {
-  Add("vol1/photo/trip/a.txt", "a");
-  Succeed(JobParams({"/photo/trip", "/photo/trip/a.txt", "/photo//trip/", "/photo/./trip"},
-                    "/photo/z.zip"));
-  EXPECT_EQ(Unpack("vol1/photo/z.zip"), (Tree{{"trip", "/"}, {"trip/a.txt", "a"}}));
 }
 
 TEST_F(JobTest, ArchiveNameMayHaveTheLongestName) {

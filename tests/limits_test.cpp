@@ -16,8 +16,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-using Strings = std::vector<std::string>;
-
 class LimitTest : public DeviceTest {
  protected:
   void SetUp() override {

@@ -3,10 +3,9 @@
 #include "device/bodies/operations.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
+#include "tests/table.h"
 
 namespace {
-
-using testing::ValuesIn;
 
 class RunTest : public DeviceTest {
  protected:
@@ -17,53 +16,24 @@ class RunTest : public DeviceTest {
   }
 };
 
-struct ErrorRow {
-  const char* name;
-  const char* line;
-  int code;
-  const char* after = "";  // the calls up to the closing of the archiver's output
-  Strings log = {};
-  std::string dest = "/photo/z.zip";
-  const char* fault = nullptr;
-};
-void PrintTo(const ErrorRow& row, std::ostream* out) { *out << row.name; }
-
-// clang-format off
-const ErrorRow kErrors[] = {
-    {"NoSpace", "Error: write: No space left on device", 416},
-    {"Quota", "7z: Error: Disk quota exceeded", 415},
-    {"ReadOnly", "Error: Read-only file system", 411},
-    {"NameTooLong", "Error: File name too long", 412, "LumoLibCheckEncryptShare"},
-    {"NameTooLongEncrypted", "Error: File name too long", 413, "LumoLibCheckEncryptShare", {}, "/vault/z.zip"},
-    {"NameTooLongShareUnknown", "Error: File name too long", 412, "LumoLibCheckEncryptShare syslog",
-     {"Failed to get share info for /vault/z.zip"}, "/vault/z.zip", "LumoLibCheckEncryptShare=0"},
-    {"SpaceBeforeQuota", "Error: Disk quota exceeded, No space left on device", 416},
-    {"QuotaBeforeReadOnly", "Error: Read-only file system, Disk quota exceeded", 415},
-    {"ReadOnlyBeforeName", "Error: File name too long, Read-only file system", 411},
-    {"Other", "Error: what", 1300, "syslog", {"Error: what", ""}},
-    {"MarkOfAnotherCase", "error: No space left on device\nError: x", 1300, "syslog", {"Error: x", ""}},
-    {"CauseWithoutMark", "No space left on device\n Error:", 1300, "syslog", {" Error:", ""}},
-};
-// clang-format on
-
-class RunFails : public RunTest, public testing::WithParamInterface<ErrorRow> {};
+// A row names the error line and the calls that follow it up to the closing of the output.
+class RunFails : public RunTest, public testing::WithParamInterface<TableRow> {};
 
 TEST_P(RunFails, WithTheCodeOfTheFirstErrorLine) {
-  const ErrorRow& row = GetParam();
-  ScriptArchiver(std::string("Total: 9\n") + row.line + "\nError: No space left on device\n");
-  if (row.fault != nullptr) {
-    Device::AddFault(row.fault);
+  const TableRow& row = GetParam();
+  ScriptArchiver("Total: 9\n" + row.Get("line") + "\nError: No space left on device\n");
+  for (const std::string& fault : row.All("fault")) {
+    Device::AddFault(fault);
   }
-  EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, row.dest)),
-            Strings{row.dest + ": " + std::to_string(row.code)});
-  EXPECT_EQ(Log(), row.log + Strings{"Failed to compress file " + row.dest});
+  const std::string dest = row.Get("dest", "/photo/z.zip");
+  EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, dest)), Strings{dest + ": " + row.Get("code")});
+  EXPECT_EQ(Log(), row.All("log") + Strings{"Failed to compress file " + dest});
   const Strings end = Behind(NamesOf(ExpectedSequence("failed_job")), "syslog");
   EXPECT_EQ(Behind(Sequence(Fork().result.asInt()), "SaveTaskData"),
-            Words(row.after) + Words("access KLIBCPclose unlink syslog") + end);
+            Words(row.Get("after")) + Words("access KLIBCPclose unlink syslog") + end);
 }
 
-INSTANTIATE_TEST_SUITE_P(ErrorLines, RunFails, ValuesIn(kErrors),
-                         [](const auto& row) { return row.param.name; });
+INSTANTIATE_TABLE(RunFails, archiver_errors);
 
 TEST_F(RunTest, ModeLevelFormatAndPasswordBecomeArguments) {
   const struct {

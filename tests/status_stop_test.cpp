@@ -13,6 +13,7 @@
 #include "device/bodies/task_store.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
+#include "tests/table.h"
 
 namespace {
 
@@ -177,81 +178,38 @@ TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {
   EXPECT_TRUE(WaitUntil([&] { return Group(worker).empty(); }));
 }
 
-struct AnswerRow {
-  const char* method;
-  const char* data;    // stored before
-  const char* answer;  // the code and its data
-  const char* last;    // the last call that is as in a request that succeeds
-  const char* after = "";
-  const char* fault = nullptr;
-};
+// A row names what is stored as "data", the last call that is as in a request that succeeds, and
+// those between it and the answer.
+class TaskAnswers : public TaskTest, public testing::WithParamInterface<TableRow> {};
 
-constexpr char kNoData[] = "Failed to get json data";
-constexpr char kHas[] = "KAVO::APIRequest::HasParam";
-constexpr char kFind[] = "Vesk::TaskMgr::getTaskWithThrow";
-constexpr char kGet[] = "Vesk::Task::getProperty";
-constexpr char kGone[] = "LumoLibRemoveFinishedTask";
-
-// clang-format off
-const AnswerRow kAnswers[] = {
-    {"status", nullptr, "101 null", kHas, kGone},
-    {"status", nullptr, "599 null", kFind, kGone},
-    {"status", R"({"pid":7})", "401 null", kGet, "syslog LumoLibRemoveFinishedTask", "Vesk::Task::getProperty=null"},
-    {"status", R"({"pid":7})", R"(0 {"finished":false,"progress":0.0})", kGone},
-    {"status", R"({"pid":7,"params":{}})", R"(0 {"dest_file_path":"","finished":false,"progress":0.0})", kGone},
-    {"status", R"({"params":{"dest_file_path":"/d"}})", R"(0 {"dest_file_path":"/d","finished":true,"progress":0.0})", kGone, "", "Vesk::Task::isFinished=1"},
-    {"status", R"({"errors":[1],"pid":"x"})", R"(0 {"errors":[1],"finished":true})", kGet, kGone},
-    {"status", R"({"params":{"dest_file_path":[]}})", "101 null", kGet, "LumoLibRemoveFinishedTask throws"},
-    {"status", R"([1])", "101 null", kGet, "LumoLibRemoveFinishedTask throws"},
-    {"stop", nullptr, "101 null", kHas},
-    {"stop", nullptr, "0 null", kFind},
-    {"stop", R"({"pid":7})", "401 null", "WaitForTaskDataKeyReady", "syslog Vesk::Task::remove", "WaitForTaskDataKeyReady=0"},
-    {"stop", R"({"pid":7})", "0 null", "Vesk::Task::isFinished", "Vesk::Task::remove", "Vesk::Task::isFinished=1"},
-    {"stop", R"({"pid":7})", "401 null", kGet, "syslog Vesk::Task::remove", "Vesk::Task::getProperty=null"},
-    {"stop", R"({"pid":7})", "401 null", "Vesk::Task::remove", "", "DoKill=0"},
-    {"stop", R"({"pid":"x"})", "101 null", kGet, "Vesk::Task::remove throws"},
-};
-// clang-format on
-
-TEST_F(TaskTest, AnswersForEachTask) {
-  for (const AnswerRow& row : kAnswers) {
-    const std::string name = std::string(row.method) + " " + row.answer + " " + row.after;
-    Watch();
-    const std::string task_id = "Zantro_test";
-    if (row.data != nullptr) {
-      Device::TaskStore("alice").AddTask(task_id, {{"data", row.data}});
-      for (const fs::directory_entry& file : fs::directory_iterator(At("users/alice"))) {
-        EXPECT_EQ(lchown(file.path().c_str(), geteuid() == 0 ? 65001 : -1, -1), 0);
-      }
+TEST_P(TaskAnswers, WithItsCodeDataAndCalls) {
+  const TableRow& row = GetParam();
+  const std::string task_id = "Zantro_test";
+  if (row.Has("data")) {
+    Device::TaskStore("alice").AddTask(task_id, {{"data", row.Get("data")}});
+    for (const fs::directory_entry& file : fs::directory_iterator(At("users/alice"))) {
+      EXPECT_EQ(lchown(file.path().c_str(), geteuid() == 0 ? 65001 : -1, -1), 0);
     }
-    if (row.fault != nullptr) {
-      Device::AddFault(row.fault);
-    }
-    const Outcome outcome = row.last == kHas ? Call(row.method, Json::Value(Json::objectValue))
-                                             : Ask(row.method, task_id);
-    EXPECT_EQ(std::to_string(outcome.code) + " " + Device::ToText(outcome.data), row.answer)
-        << name;
-    Strings after = Words(row.after);
-    const bool throws = !after.empty() && after.back() == "throws";
-    throws ? after.pop_back() : void();
-    EXPECT_EQ(Sequence(Calls("LumoLibUmask").front().pid),
-              UpTo(NamesOf(ExpectedSequence(row.method)), row.last) + after +
-                  Words(throws ? "" : "KAVO::APIResponse::SetError") + Words("LumoLibRestoreUmask"))
-        << name;
-    if (after.size() == 2) {
-      EXPECT_EQ(Log(), Strings{kNoData}) << name;
-    }
-    // The process id goes with the removal when the data has one.
-    for (const TracedCall& removal : Calls(kGone)) {
-      EXPECT_EQ(removal.args[0].isNull(), row.data == nullptr) << name;
-      EXPECT_EQ(removal.args[1], row.fault == nullptr && outcome.code == 0 &&
-                                         std::string(row.data).find(":7") != std::string::npos
-                                     ? 7
-                                     : -1)
-          << name;
-    }
-    Device::TaskStore("alice").RemoveTask(task_id);
+  }
+  for (const std::string& fault : row.All("fault")) {
+    Device::AddFault(fault);
+  }
+  const bool has_id = row.Get("last") != "KAVO::APIRequest::HasParam";
+  const Outcome outcome = has_id ? Ask(row.Get("method"), task_id)
+                                 : Call(row.Get("method"), Json::Value(Json::objectValue));
+  EXPECT_EQ(std::to_string(outcome.code) + " " + Device::ToText(outcome.data), row.Get("answer"));
+  EXPECT_EQ(Sequence(Calls("LumoLibUmask").front().pid),
+            UpTo(NamesOf(ExpectedSequence(row.Get("method"))), row.Get("last")) +
+                Words(row.Get("after")) +
+                Words(row.Has("throws") ? "" : "KAVO::APIResponse::SetError") +
+                Words("LumoLibRestoreUmask"));
+  EXPECT_EQ(Log(), row.All("log"));
+  for (const TracedCall& removal : Calls("LumoLibRemoveFinishedTask")) {
+    EXPECT_EQ(removal.args[0].isNull(), !row.Has("data"));
+    EXPECT_EQ(removal.args[1].asString(), row.Get("pid", "-1"));
   }
 }
+
+INSTANTIATE_TABLE(TaskAnswers, answers);
 
 }  // namespace
