@@ -119,6 +119,7 @@ DeviceTest::~DeviceTest() {
   for (const TracedCall& fork : Calls("KLIBCProcFork")) {
     if (fork.result.asInt() > 0) {
       kill(-fork.result.asInt(), SIGKILL);  // what the test left running
+      WaitUntil([&] { return Group(fork.result.asInt()).empty(); });
     }
   }
   while (waitpid(-1, nullptr, 0) > 0) {
@@ -187,9 +188,11 @@ Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& use
   }));
   EXPECT_EQ(last.code, 0);
   // The worker has said its last word in the log when it is gone.
-  EXPECT_TRUE(WaitUntil([] {
+  const int worker = Worker();
+  EXPECT_TRUE(WaitUntil([&] {
     Device::Launcher::Reap();
-    return waitpid(-1, nullptr, WNOHANG) == -1;
+    // Under an emulator the worker may be nobody's child here.
+    return waitpid(-1, nullptr, WNOHANG) == -1 && Group(worker).empty();
   }));
   return last.data;
 }
@@ -224,6 +227,22 @@ std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
     }
   }
   return calls;
+}
+
+std::vector<std::string> DeviceTest::Group(int worker) {
+  std::vector<std::string> names;
+  for (const fs::directory_entry& process : fs::directory_iterator("/proc")) {
+    std::ifstream stat(process.path() / "stat");
+    std::string pid;
+    std::string name;
+    std::string state;
+    int parent = 0;
+    int group = 0;
+    if (stat >> pid >> name >> state >> parent >> group && group == worker && state != "Z") {
+      names.push_back(name);
+    }
+  }
+  return names;
 }
 
 TracedCall DeviceTest::Fork() const {

@@ -74,6 +74,9 @@ class DeviceTest : public testing::Test {
   std::vector<TracedCall> Calls(const std::string& call = "") const;
   // The fork that made the last worker, as the request process saw it.
   TracedCall Fork() const;
+  int Worker() const { return Fork().result.isNull() ? -1 : Fork().result.asInt(); }
+  // The living processes of the worker's group: itself, the archiver's two, the stock 7z.
+  static std::vector<std::string> Group(int worker);
 
   TempFolder temp_;
   const std::string device_ = temp_.Path() + "/device";

@@ -33,25 +33,6 @@ class TaskTest : public DeviceTest {
     return started.data["taskid"].asString();
   }
 
-  // The living processes of the worker's group: itself, the archiver's two, the stock 7z.
-  static std::vector<std::string> Group(int worker) {
-    std::vector<std::string> names;
-    for (const fs::directory_entry& process : fs::directory_iterator("/proc")) {
-      std::ifstream stat(process.path() / "stat");
-      std::string pid;
-      std::string name;
-      std::string state;
-      int parent = 0;
-      int group = 0;
-      if (stat >> pid >> name >> state >> parent >> group && group == worker && state != "Z") {
-        names.push_back(name);
-      }
-    }
-    return names;
-  }
-
-  int Worker() const { return Fork().result.asInt(); }
-
   // Until 7z has made the file that it writes to.
   bool IsPacking() {
     return WaitUntil([&] { return Group(Worker()).size() >= 4 && EntriesBeside() > 1; });

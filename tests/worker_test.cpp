@@ -3,6 +3,7 @@
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
 #include "tests/device_fixture.h"
+#include "tests/emulation.h"
 #include "tests/libc_faults.h"
 
 namespace {
@@ -262,7 +263,9 @@ TEST_F(WorkerTest, RefusesASourceWhoseLineDoesNotFit) {
   }
   const std::string share = At("vol1/photo/");
   const std::string fits = "/photo/" + std::string(4094 - share.size(), 'd');
-  EXPECT_EQ(FailJob(JobParams({fits}, "/photo/z.zip")).back(), "/photo/z.zip: 412");
+  // An emulator shows the archiver the root of its own sysroot, where there is no such path.
+  EXPECT_EQ(FailJob(JobParams({fits}, "/photo/z.zip")).back(),
+            kIsEmulated ? "/photo/z.zip: 1300" : "/photo/z.zip: 412");
   EXPECT_FALSE(Calls("KLIBCPopenv").empty());
   const std::string too_long = fits + "d";
   EXPECT_EQ(FailJob(JobParams({too_long}, "/photo/z.zip")).back(), too_long + ": 1300");
