@@ -22,7 +22,7 @@ constexpr char kDescriptors[] = "/proc/self/fd/";
 
 // Opened at once and inherited: a program that takes on another identity may have no way to walk
 // there.
-const int sysroot = open(KAVO_SYSROOT, O_PATH | O_DIRECTORY);
+const int kSysroot = open(KAVO_SYSROOT, O_PATH | O_DIRECTORY);
 
 template <typename Function>
 Function* Real(const char* name) {
@@ -79,7 +79,7 @@ class Start {
 
   const char* program_;
   char* const* arguments_;
-  const std::string libraries_ = kDescriptors + std::to_string(sysroot);
+  const std::string libraries_ = kDescriptors + std::to_string(kSysroot);
   std::vector<char*> whole_;
   int kept_ = -1;
 };
