@@ -17,6 +17,7 @@
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
+#include "tests/emulation.h"
 #include "tests/libc_faults.h"
 
 namespace fs = std::filesystem;
@@ -39,7 +40,7 @@ constexpr char kConfig[] = R"({
   ]
 })";
 constexpr uid_t kAliceUid = 65001;
-constexpr std::chrono::seconds kPatience(30);
+const std::chrono::seconds kPatience(30 * kSlowness);
 
 void ReadEnd(int fd, std::string& text) {
   std::array<char, 4096> block{};
