@@ -221,9 +221,11 @@ void ZantroCompressHandler::SetArchiveOwner(const char* archive_path, const char
                                             const std::string& dest_path) {
   const int is_admin = KLIBGroupIsAdminGroupMem(user, 0);
   if (is_admin == -1) {
+    const auto error = static_cast<unsigned int>(KLIBCErrGet());
+    const char* const file = KLIBCErrorGetFile();
+    const int line = KLIBCErrorGetLine();
     syslog(LOG_ERR, "%s:%d KLIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]", kLogSource,
-           __LINE__, user, static_cast<unsigned int>(KLIBCErrGet()), KLIBCErrorGetFile(),
-           KLIBCErrorGetLine());
+           __LINE__, user, error, file, line);
     SetErrItem(dest_path, kErrTask);
   } else if (is_admin == 1 && LumoLibChown2Admin(archive_path, user) != 0) {
     syslog(LOG_ERR, "%s:%d LumoLibChown2Admin fail", kLogSource, __LINE__);

@@ -114,8 +114,8 @@ bool ZantroCompressHandler::ReadDestination(StartParameters& start) {
 // A list parameter as an array of texts.
 Json::Value ZantroCompressHandler::ExplodeParam(const char* name,
                                                 const Json::Value& fallback) const {
-  return StringExplodeEx(request->GetParam(name, fallback), kListSeparator,
-                         request->GetAPIVersion(), false);
+  const Json::Value value = request->GetParam(name, fallback);
+  return StringExplodeEx(value, kListSeparator, request->GetAPIVersion(), false);
 }
 
 bool ZantroCompressHandler::CreateTask(Vesk::TaskMgr& task_manager) {

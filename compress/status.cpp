@@ -13,6 +13,12 @@ namespace Zantro {
 namespace {
 
 constexpr char kAnswerFinished[] = "finished";
+constexpr int kNoProcess = -1;
+
+int WorkerOf(const Json::Value& data) {
+  const Json::Value worker = data.isObject() ? data[kDataPid] : Json::Value();
+  return worker.isInt() ? worker.asInt() : kNoProcess;
+}
 
 Json::Value MakeAnswer(const Json::Value& data) {
   Json::Value answer(Json::objectValue);
@@ -35,9 +41,16 @@ Json::Value MakeAnswer(const Json::Value& data) {
 
 void ZantroCompressHandler::LumoProgressHandler() {
   std::optional<Vesk::TaskMgr> task_manager;  // outlives the removal
-  const Json::Value data = ReportProgress(task_manager);
-  // On every path, deliberately: after an error there may be no task, and the call takes null.
-  LumoLibRemoveFinishedTask(pTask, data.get(kDataPid, -1).asInt(), false);
+  // The removal is asked for on every path, deliberately: after an error there may be no task, and
+  // the call takes null.
+  Json::Value data;
+  try {
+    data = ReportProgress(task_manager);
+  } catch (...) {
+    LumoLibRemoveFinishedTask(pTask, kNoProcess, false);
+    throw;
+  }
+  LumoLibRemoveFinishedTask(pTask, WorkerOf(data), false);
 }
 
 Json::Value ZantroCompressHandler::ReportProgress(std::optional<Vesk::TaskMgr>& task_manager) {

@@ -20,7 +20,12 @@ void ZantroCompressHandler::LumoCancelHandler() {
   } catch (...) {
     return;  // no such task: nothing to stop, deliberately no error
   }
-  KillWorker();
+  try {
+    KillWorker();
+  } catch (...) {
+    pTask->remove();
+    throw;
+  }
   pTask->remove();
 }
 

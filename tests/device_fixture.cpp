@@ -1,24 +1,28 @@
 #include "tests/device_fixture.h"
 
+#include <dlfcn.h>
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
+#include <memory>
 #include <regex>
 #include <sstream>
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
 #include "tests/emulation.h"
-#include "tests/libc_faults.h"
+#include "tests/libc_calls.h"
 
 namespace fs = std::filesystem;
 
@@ -49,6 +53,15 @@ void ReadEnd(int fd, std::string& text) {
   }
 }
 
+Strings Lines(const std::string& text) {
+  std::istringstream in(text);
+  Strings lines;
+  for (std::string line; std::getline(in, line);) {
+    lines.push_back(line);
+  }
+  return lines;
+}
+
 }  // namespace
 
 TempFolder::TempFolder() {
@@ -62,7 +75,11 @@ TempFolder::~TempFolder() {
   fs::remove_all(path_, ignored);
 }
 
-Ran RunProgram(const std::vector<std::string>& arguments, const std::string& folder) {
+std::string ModulePath() {
+  return fs::read_symlink("/proc/self/exe").parent_path().string() + "/KAVO.Zantro.Compress.so";
+}
+
+Ran RunProgram(const Strings& arguments, const std::string& folder) {
   const TempFolder temp;
   const std::string err_path = temp.Path() + "/err";
   std::array<int, 2> out{};
@@ -105,15 +122,56 @@ void WriteFile(const std::string& path, const std::string& text) {
   std::ofstream(path, std::ios::binary) << text;
 }
 
+Strings ExpectedSequence(const std::string& name) {
+  const Strings lines = Lines(ReadFile(std::string(KAVO_TESTS_DIR) + "/sequences/" + name));
+  EXPECT_FALSE(lines.empty()) << name;
+  return lines;
+}
+
+Strings NamesOf(Strings sequence) {
+  for (std::string& line : sequence) {
+    line.resize(std::min(line.size(), line.find(' ')));
+  }
+  return sequence;
+}
+
+Strings UpTo(const Strings& names, const std::string& call) {
+  const std::size_t hash = call.find('#');
+  int left = hash == std::string::npos ? 1 : std::stoi(call.substr(hash + 1));
+  for (auto at = names.begin(); at != names.end(); ++at) {
+    if (*at == call.substr(0, hash) && --left == 0) {
+      return {names.begin(), at + 1};
+    }
+  }
+  ADD_FAILURE() << "no call " << call;
+  return {};
+}
+
+Strings Behind(const Strings& names, const std::string& call) {
+  return {std::find(names.rbegin(), names.rend(), call).base(), names.end()};
+}
+
+Strings operator+(Strings first, const Strings& second) {
+  first.insert(first.end(), second.begin(), second.end());
+  return first;
+}
+
+Strings Words(const std::string& text) {
+  std::istringstream in(text);
+  return {std::istream_iterator<std::string>(in), {}};
+}
+
 DeviceTest::DeviceTest() {
-  Device::StopWatching();
-  SetLibcFault({});
+  umask(022);
   Device::Make(device_, kConfig);
   Device::Open(device_);
   SetLogFile(temp_.Path() + "/log");
   chmod(temp_.Path().c_str(), 01777);  // the users' processes add files of their own
-  Device::OpenTrace(temp_.Path() + "/trace");
+  Watch();
   launcher_.emplace();
+  const std::unique_ptr<void, int (*)(void*)> module(dlopen(ModulePath().c_str(), RTLD_NOW),
+                                                     dlclose);
+  WatchModule(dlsym(module.get(), "gTable"));
 }
 
 DeviceTest::~DeviceTest() {
@@ -139,11 +197,10 @@ std::string DeviceTest::Add(const std::string& path, const std::string& text) {
   return At(path);
 }
 
-Json::Value DeviceTest::JobParams(const std::vector<std::string>& sources,
-                                  const std::string& dest) {
+Json::Value DeviceTest::JobParams(const Strings& sources, const std::string& dest) {
   Json::Value params;
   params["path"] = Device::ToText(Device::ToJson(sources));
-  params["dest_file_path"] = Device::ToText(Device::ToJson(std::vector<std::string>{dest}));
+  params["dest_file_path"] = Device::ToText(Device::ToJson(Strings{dest}));
   return params;
 }
 
@@ -198,30 +255,24 @@ Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& use
   return last.data;
 }
 
-std::vector<std::string> DeviceTest::FailJob(const Json::Value& params, const std::string& user) {
+Strings DeviceTest::FailJob(const Json::Value& params, const std::string& user) {
   const Json::Value answer = RunJob(params, user);
   EXPECT_TRUE(answer.isMember("errors")) << Device::ToText(answer);
-  std::vector<std::string> items;
+  Strings items;
   for (const Json::Value& item : answer["errors"]) {
     items.push_back(item["path"].asString() + ": " + item["code"].asString());
   }
   return items;
 }
 
-std::vector<std::string> DeviceTest::Log() const {
-  std::istringstream file(ReadFile(temp_.Path() + "/log"));
-  std::vector<std::string> lines;
-  for (std::string line; std::getline(file, line);) {
-    static const std::regex kPlace("^(KAVO\\.Zantro\\.Compress|lumo_webapi):[0-9]+ ");
-    lines.push_back(std::regex_replace(line, kPlace, ""));
-  }
-  return lines;
+Strings DeviceTest::Log() const {
+  static const std::regex kPlace("(^|\n)(KAVO\\.Zantro\\.Compress|lumo_webapi):[0-9]+ ");
+  return Lines(Plain(std::regex_replace(ReadFile(temp_.Path() + "/log"), kPlace, "$1")));
 }
 
 std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
-  std::istringstream file(ReadFile(temp_.Path() + "/trace"));
   std::vector<TracedCall> calls;
-  for (std::string line; std::getline(file, line);) {
+  for (const std::string& line : Lines(ReadFile(temp_.Path() + "/trace"))) {
     const Json::Value row = Device::ParseJson(line);
     if (call.empty() || row["call"] == call) {
       calls.push_back({row["pid"].asInt(), row["call"].asString(), row["args"], row["result"]});
@@ -230,8 +281,8 @@ std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
   return calls;
 }
 
-std::vector<std::string> DeviceTest::Group(int worker) {
-  std::vector<std::string> names;
+Strings DeviceTest::Group(int worker) {
+  Strings names;
   for (const fs::directory_entry& process : fs::directory_iterator("/proc")) {
     std::ifstream stat(process.path() / "stat");
     std::string pid;
@@ -252,4 +303,48 @@ TracedCall DeviceTest::Fork() const {
     last = fork.result.asInt() > 0 ? fork : last;
   }
   return last;
+}
+
+Strings DeviceTest::Sequence(int pid, bool with_arguments) const {
+  std::string text;
+  for (const TracedCall& call : Calls()) {
+    if (call.pid == pid && call.call != "Vesk::Task::getTaskId") {
+      const std::string arguments = Device::ToText(call.args);
+      text += call.call + (call.args.empty() ? "" : " ");
+      text += arguments.substr(1, arguments.size() - 2) + "\n";
+    }
+  }
+  const Strings lines = Lines(Plain(text));
+  return with_arguments ? lines : NamesOf(lines);
+}
+
+std::string DeviceTest::Plain(std::string text) const {
+  const std::string worker =
+      "(\"pid\":|\nDoKill |RemoveFinishedTask \"object\",)" + Fork().result.asString() + "\\b";
+  text = std::regex_replace(text, std::regex(worker), "$1PID");
+  static const std::regex kVarying(
+      R"((Zantro_)[0-9A-Za-z_-]+|("started":)[0-9]+|(lumozip)[0-9A-Za-z]{6})");
+  text = std::regex_replace(text, kVarying, "$1$2$3*");
+  text = std::regex_replace(text, std::regex(device_), "DEV");
+  for (const auto& [id, user] : Device::TheDevice().sessions) {
+    text = std::regex_replace(text, std::regex(id), "SID");
+  }
+  return text;
+}
+
+void DeviceTest::Watch() {
+  Device::StopWatching();
+  SetLibcFault({});
+  for (const char* name : {"/log", "/trace"}) {
+    std::ofstream(temp_.Path() + name, std::ios::trunc).flush();
+  }
+  Device::OpenTrace(temp_.Path() + "/trace");
+  SetLibcTrace(temp_.Path() + "/trace");
+}
+
+void DeviceTest::ScriptArchiver(const std::string& text) {
+  WriteFile(temp_.Path() + "/output", text);
+  setenv("KAVO_SCRIPTED_OUTPUT", (temp_.Path() + "/output").c_str(), 1);
+  const std::string program = fs::path(ModulePath()).parent_path().string() + "/scripted-7z";
+  Device::TheDevice().archiver = Device::FileDescriptor(open(program.c_str(), O_PATH | O_CLOEXEC));
 }

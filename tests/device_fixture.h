@@ -13,6 +13,8 @@
 #include "device/bodies/device.h"
 #include "device/host/launcher.h"
 
+using Strings = std::vector<std::string>;
+
 // A folder that others can walk into; removed with all that is in it.
 class TempFolder {
  public:
@@ -34,10 +36,23 @@ struct Ran {
   std::string err;
 };
 // Runs a program to its end; the path is taken as it is.
-Ran RunProgram(const std::vector<std::string>& arguments, const std::string& folder = "/");
+Ran RunProgram(const Strings& arguments, const std::string& folder = "/");
 
 std::string ReadFile(const std::string& path);
 void WriteFile(const std::string& path, const std::string& text);
+
+// The built module, beside the test program.
+std::string ModulePath();
+
+// The calls that stand in tests/sequences under that name, one a line; the names alone.
+Strings ExpectedSequence(const std::string& name);
+Strings NamesOf(Strings sequence);
+// Their beginning up to and with CALL or CALL#N, the Nth one; their end behind the last CALL.
+Strings UpTo(const Strings& names, const std::string& call);
+Strings Behind(const Strings& names, const std::string& call);
+Strings operator+(Strings first, const Strings& second);
+// The words of a text.
+Strings Words(const std::string& text);
 
 struct TracedCall {
   int pid = 0;
@@ -57,7 +72,7 @@ class DeviceTest : public testing::Test {
   std::string Add(const std::string& path, const std::string& text);
   std::string At(const std::string& path) const { return device_ + "/" + path; }
 
-  static Json::Value JobParams(const std::vector<std::string>& sources, const std::string& dest);
+  static Json::Value JobParams(const Strings& sources, const std::string& dest);
   Device::Outcome Call(const std::string& method, const Json::Value& params,
                        const std::string& user = "alice", int version = 3, bool is_followed = true);
   Device::Outcome Ask(const std::string& method, const std::string& task_id,
@@ -65,18 +80,30 @@ class DeviceTest : public testing::Test {
   // Starts a job and waits for the status answer that reports its end.
   Json::Value RunJob(const Json::Value& params, const std::string& user = "alice");
   // The same; "path: code" for each error item.
-  std::vector<std::string> FailJob(const Json::Value& params, const std::string& user = "alice");
+  Strings FailJob(const Json::Value& params, const std::string& user = "alice");
   // Waits, for a while, until the condition holds.
   static bool WaitUntil(const std::function<bool()>& condition);
 
-  // The module's log lines without their file and line, and the calls of platform operations.
-  std::vector<std::string> Log() const;
+  // The module's log lines without their file and line, as Plain has them.
+  Strings Log() const;
+  // The calls of one operation, or of all.
   std::vector<TracedCall> Calls(const std::string& call = "") const;
   // The fork that made the last worker, as the request process saw it.
   TracedCall Fork() const;
   int Worker() const { return Fork().result.isNull() ? -1 : Fork().result.asInt(); }
   // The living processes of the worker's group: itself, the archiver's two, the stock 7z.
-  static std::vector<std::string> Group(int worker);
+  static Strings Group(int worker);
+  // What a process called, libc's calls by the module among it: one line for each, the name and,
+  // if asked for, the arguments as Plain has them. Getters of the task's id are left out.
+  Strings Sequence(int pid, bool with_arguments = false) const;
+  // What is not the same in every run replaced: DEV the device's folder, SID, PID the last worker's
+  // process id, and * for a time and the rest of a task's id or a temporary name.
+  std::string Plain(std::string text) const;
+
+  // Forgets fault rules, trace and log so far, and watches on.
+  void Watch();
+  // The archiver prints this text and ends well, from now on.
+  void ScriptArchiver(const std::string& text);
 
   TempFolder temp_;
   const std::string device_ = temp_.Path() + "/device";

@@ -10,7 +10,7 @@
 #include "device/bodies/operations.h"
 #include "device/bodies/task_store.h"
 #include "tests/device_fixture.h"
-#include "tests/libc_faults.h"
+#include "tests/libc_calls.h"
 
 namespace {
 

@@ -10,7 +10,7 @@
 #include <fstream>
 
 #include "tests/device_fixture.h"
-#include "tests/libc_faults.h"
+#include "tests/libc_calls.h"
 
 namespace {
 

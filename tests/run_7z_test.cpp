@@ -1,30 +1,16 @@
 // What the module makes of the archiver's lines, with a program in its place that prints them.
-#include <fcntl.h>
-
-#include <filesystem>
-
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
 #include "tests/device_fixture.h"
-#include "tests/libc_faults.h"
+#include "tests/libc_calls.h"
 
 namespace {
 
-using Strings = std::vector<std::string>;
 using testing::ValuesIn;
 
 class RunTest : public DeviceTest {
  protected:
   RunTest() { Add("vol1/photo/a.txt", "a"); }
-
-  // The archiver prints this text and ends well.
-  void Print(const std::string& text) {
-    WriteFile(temp_.Path() + "/output", text);
-    setenv("KAVO_SCRIPTED_OUTPUT", (temp_.Path() + "/output").c_str(), 1);
-    const std::filesystem::path here = std::filesystem::read_symlink("/proc/self/exe");
-    Device::TheDevice().archiver = Device::FileDescriptor(
-        open((here.parent_path() / "scripted-7z").c_str(), O_PATH | O_CLOEXEC));
-  }
 
   Json::Value Run(const std::string& dest = "/photo/z.zip") {
     return RunJob(JobParams({"/photo/a.txt"}, dest));
@@ -34,184 +20,156 @@ class RunTest : public DeviceTest {
 struct ErrorRow {
   const char* name;
   const char* line;
-  const char* dest;
-  const char* fault;  // may be empty
   int code;
-  Strings log;
+  const char* after = "";  // the calls up to the closing of the archiver's output
+  Strings log = {};
+  std::string dest = "/photo/z.zip";
+  const char* fault = nullptr;
 };
 void PrintTo(const ErrorRow& row, std::ostream* out) { *out << row.name; }
 
 // clang-format off
 const ErrorRow kErrors[] = {
-    {"NoSpace", "Error: write: No space left on device", "/photo/z.zip", "", 416, {}},
-    {"Quota", "7z: Error: Disk quota exceeded", "/photo/z.zip", "", 415, {}},
-    {"ReadOnly", "Error: Read-only file system", "/photo/z.zip", "", 411, {}},
-    {"NameTooLong", "Error: File name too long", "/photo/z.zip", "", 412, {}},
-    {"NameTooLongEncrypted", "Error: File name too long", "/vault/z.zip", "", 413, {}},
-    {"NameTooLongShareUnknown", "Error: File name too long", "/vault/z.zip",
-     "LumoLibCheckEncryptShare=0", 412, {"Failed to get share info for /vault/z.zip"}},
-    {"FirstCauseCounts", "Error: File name too long, Disk quota exceeded", "/photo/z.zip", "", 415,
-     {}},
-    {"Other", "Error: what", "/photo/z.zip", "", 1300, {"Error: what", ""}},
-    {"CauseWithoutMark", "No space left on device\nError: x", "/photo/z.zip", "", 1300,
-     {"Error: x", ""}},
+    {"NoSpace", "Error: write: No space left on device", 416},
+    {"Quota", "7z: Error: Disk quota exceeded", 415},
+    {"ReadOnly", "Error: Read-only file system", 411},
+    {"NameTooLong", "Error: File name too long", 412, "LumoLibCheckEncryptShare"},
+    {"NameTooLongEncrypted", "Error: File name too long", 413, "LumoLibCheckEncryptShare", {}, "/vault/z.zip"},
+    {"NameTooLongShareUnknown", "Error: File name too long", 412, "LumoLibCheckEncryptShare syslog",
+     {"Failed to get share info for /vault/z.zip"}, "/vault/z.zip", "LumoLibCheckEncryptShare=0"},
+    {"SpaceBeforeQuota", "Error: Disk quota exceeded, No space left on device", 416},
+    {"QuotaBeforeReadOnly", "Error: Read-only file system, Disk quota exceeded", 415},
+    {"ReadOnlyBeforeName", "Error: File name too long, Read-only file system", 411},
+    {"Other", "Error: what", 1300, "syslog", {"Error: what", ""}},
+    {"MarkOfAnotherCase", "error: No space left on device\nError: x", 1300, "syslog", {"Error: x", ""}},
+    {"CauseWithoutMark", "No space left on device\n Error:", 1300, "syslog", {" Error:", ""}},
 };
 // clang-format on
 
 class RunFails : public RunTest, public testing::WithParamInterface<ErrorRow> {};
 
-TEST_P(RunFails, WithTheCodeOfTheErrorLine) {
+TEST_P(RunFails, WithTheCodeOfTheFirstErrorLine) {
   const ErrorRow& row = GetParam();
-  Print(std::string("Total: 9\n") + row.line + "\nError: No space left on device\n");
-  if (row.fault[0] != 0) {
+  ScriptArchiver(std::string("Total: 9\n") + row.line + "\nError: No space left on device\n");
+  if (row.fault != nullptr) {
     Device::AddFault(row.fault);
   }
   EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, row.dest)),
-            Strings{std::string(row.dest) + ": " + std::to_string(row.code)});
-  Strings log = row.log;
-  log.push_back(std::string("Failed to compress file ") + row.dest);
-  EXPECT_EQ(Log(), log);
-  EXPECT_TRUE(Calls("KAVOFSAclChmod").empty());
-  EXPECT_EQ(Calls("KLIBCPclose").size(), 1U);
-  EXPECT_TRUE(StagedPaths().empty());
+            Strings{row.dest + ": " + std::to_string(row.code)});
+  EXPECT_EQ(Log(), row.log + Strings{"Failed to compress file " + row.dest});
+  const Strings end = Behind(NamesOf(ExpectedSequence("failed_job")), "syslog");
+  EXPECT_EQ(Behind(Sequence(Fork().result.asInt()), "SaveTaskData"),
+            Words(row.after) + Words("access KLIBCPclose unlink syslog") + end);
 }
 
 INSTANTIATE_TEST_SUITE_P(ErrorLines, RunFails, ValuesIn(kErrors),
                          [](const auto& row) { return row.param.name; });
 
-struct SetUpRow {
-  const char* name;
-  const char* fault;
-  LibcFault libc;
-  const char* item;
-  Strings log;
-};
-void PrintTo(const SetUpRow& row, std::ostream* out) { *out << row.name; }
-
-// clang-format off
-const SetUpRow kSetUps[] = {
-    {"ArchivePathUnresolved", "PathInfoFactory::create#2=0:407", {}, "/photo/z.zip: 407",
-     {"Failed to get path info:/photo/z.zip, reason=[197]"}},
-    {"NoVolume", "VolumePathParse=-1", {}, "DEV/vol1: 1300",
-     {"Failed to get volume info, DEV/vol1"}},
-    {"WorkFolderNotEntered", "FindCommonParent=DEV/vol1/photo/", {"chdir", "vol1/photo", EACCES},
-     "DEV/vol1/photo/: 407", {"Failed to chdir, reason=Permission denied(13)"}},
-    {"NotStarted", "KLIBCPopenv=null", {}, "/photo/z.zip: 1300", {"KLIBCPopenv failed"}},
-};
-// clang-format on
-
-class SetUpFails : public RunTest, public testing::WithParamInterface<SetUpRow> {
- protected:
-  std::string Fill(std::string text) const {
-    const std::size_t at = text.find("DEV");
-    return at == std::string::npos ? text : text.replace(at, 3, device_);
-  }
-};
-
-TEST_P(SetUpFails, BeforeTheArchiverRuns) {
-  const SetUpRow& row = GetParam();
-  Device::AddFault(Fill(row.fault));
-  SetLibcFault(row.libc);
-  EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, "/photo/z.zip")), Strings{Fill(row.item)});
-  EXPECT_EQ(Log(), (Strings{Fill(row.log.front()), "Failed to compress file /photo/z.zip"}));
-  EXPECT_TRUE(Calls("KLIBKavoIndexAdd").empty());
-  EXPECT_TRUE(Calls("KLIBCPclose").empty());
-  EXPECT_TRUE(StagedPaths().empty());
-}
-
-INSTANTIATE_TEST_SUITE_P(EachStep, SetUpFails, ValuesIn(kSetUps),
-                         [](const auto& row) { return row.param.name; });
-
-TEST_F(RunTest, ArgumentsStandInTheirOrderEmptyOnesIncluded) {
-  Json::Value params = JobParams({"/photo/a.txt"}, "/photo/z.7z");
-  Print("");
-  RunJob(params);
-  params["mode"] = "synchroize";
-  params["level"] = "best";
-  params["format"] = "7z";
-  params["password"] = "pass word";
-  RunJob(params);
-  params["mode"] = "synchronize";  // no keyword
-  params["format"] = "7Z";
-  params["level"] = "";
-  params["password"] = "";
-  RunJob(params);
-  const std::vector<TracedCall> runs = Calls("KLIBCPopenv");
-  const auto arguments = [&](std::size_t run) {
-    Json::Value all = runs[run].args[2];
-    std::string text;
-    for (const Json::Value& each : all) {
-      const std::string argument = each.asString();
-      text += "|" + (argument.rfind("@/tmp/lumozip", 0) == 0 ? "@LIST" : argument);
-    }
-    return text;
+TEST_F(RunTest, ModeLevelFormatAndPasswordBecomeArguments) {
+  const struct {
+    const char* params;  // JSON
+    const char* arguments;
+  } rows[] = {
+      {"{}", "|ARCHIVE|||-lang"},
+      {R"({"mode":"","level":"","format":"","password":""})", "a|ARCHIVE||-mx6|-lang"},
+      {R"({"mode":"add","level":"normal","format":"zip"})", "a|ARCHIVE||-mx6|-lang"},
+      {R"({"mode":"update","level":"store","format":"7Z"})", "u|ARCHIVE||-mx0|-lang"},
+      {R"({"mode":"freshen","level":"fastest","format":"7z"})", "u|ARCHIVE|-up1q1r0x1y2z1w2|-mx3"},
+      {R"({"mode":"synchroize","level":"best","codepage":"CP932","password":"pass word"})",
+       "u|ARCHIVE|-up1q0r2x1y2z1w2|-mx9|-langCP932|-ppass word"},
+      {R"({"mode":"synchronize","level":"Best","format":"7z","codepage":"CP932"})",
+       "a|ARCHIVE||-mx6"},
   };
-  const std::string archive = At("vol1/photo/z.7z");
-  EXPECT_EQ(arguments(0),
-            "|/usr/bin/7z||-utf16|" + archive + "|||-lang|-xr!@eaDir|@LIST|-progress");
-  EXPECT_EQ(arguments(1), "|/usr/bin/7z|u|-utf16|" + archive +
-                              "|-up1q0r2x1y2z1w2|-mx9|-ppass word|-xr!@eaDir|@LIST|-progress");
-  EXPECT_EQ(arguments(2),
-            "|/usr/bin/7z|a|-utf16|" + archive + "||-mx6|-lang|-xr!@eaDir|@LIST|-progress");
+  ScriptArchiver("");
+  for (const auto& row : rows) {
+    Json::Value params = Device::ParseJson(row.params);
+    params["path"] = "/photo/a.txt";
+    params["dest_file_path"] = "/photo/z.zip";
+    RunJob(params);
+    std::string text;
+    const Json::Value arguments = Calls("KLIBCPopenv").back().args[2];
+    for (const Json::Value& argument : arguments) {
+      text += argument.asString() + "|";
+    }
+    std::string expected =
+        std::string("/usr/bin/7z|") + row.arguments + "|-xr!@eaDir|@LIST|-progress|";
+    expected.replace(expected.find("ARCHIVE"), 7, "-utf16|DEV/vol1/photo/z.zip");
+    expected.replace(expected.find("LIST"), 4, "/tmp/lumozip*");
+    EXPECT_EQ(Plain(text), expected);
+  }
 }
 
 TEST_F(RunTest, ProgressLinesReachTheTask) {
-  Print(
-      "Progress: 7\nTotal: 5000000000\nCompressing photo/a.txt\nProgress: 42\nnoise\nProgress: 99");
+  ScriptArchiver(
+      "Progress: 7\nTotal: 5000000000\nCompressing photo/a.txt\nProgress: 42\nnoise\n Progress: 8\n"
+      "Compressing b\nProgress: 43\nProgress: 99");
   const Json::Value answer = Run();
-  const std::vector<TracedCall> saved = Calls("SaveTaskData");
-  ASSERT_EQ(saved.size(), 4U);
-  EXPECT_EQ(saved[0].args[1]["total_size"], 0);
-  EXPECT_EQ(saved[1].args[1]["total_size"].asUInt64(), 5000000000U);
-  EXPECT_EQ(saved[1].args[2], 0.0);
-  EXPECT_EQ(saved[1].args[1]["file"], "");
-  EXPECT_EQ(saved[2].args[1]["file"], "\n");
-  EXPECT_FLOAT_EQ(saved[2].args[2].asFloat(), 0.42F);
+  Strings saved;
+  for (const TracedCall& call : Calls("SaveTaskData")) {
+    saved.push_back(Device::ToText(call.args[1]["file"]) + call.args[1]["total_size"].asString() +
+                    " " + std::to_string(call.args[2].asFloat()));
+  }
+  EXPECT_EQ(saved,
+            (Strings{"\"\"0 0.070000", "\"\"5000000000 0.000000", "\"\\n\"5000000000 0.420000",
+                     "\"\\n\"5000000000 0.430000", "\"\\n\"5000000000 0.990000"}));
   // The last fraction stands, also when it is not 1.
   EXPECT_FLOAT_EQ(answer["progress"].asFloat(), 0.99F);
   EXPECT_FALSE(answer.isMember("errors"));
 }
 
 TEST_F(RunTest, AFileNameIsNoErrorLine) {
-  Print("Compressing Error: No space left on device\nTotal: Error: 3\nProgress: 3 Error:\n");
+  ScriptArchiver(
+      "Compressing Error: No space left on device\nTotal: Error: 3\nProgress: 3 Error:\n");
   EXPECT_FALSE(Run().isMember("errors"));
 }
 
 TEST_F(RunTest, ACompressingLineThatIsCutOffFailsTheJobAndLeavesNothing) {
-  Print("Total: 3\nCompressing ");
+  ScriptArchiver("Total: 3\nCompressing ");
   EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, "/photo/z.zip")), Strings{"/photo/z.zip: 1300"});
   EXPECT_EQ(Calls("KLIBCPclose").size(), 1U);
   EXPECT_TRUE(StagedPaths().empty());
 }
 
-TEST_F(RunTest, ProgressThatIsNotStoredIsLoggedAndNoMore) {
+TEST_F(RunTest, WhatFailsBesideTheArchiverIsLoggedAndNoMore) {
+  const struct {
+    const char *fault, *line;
+    int owner_calls;
+  } rows[] = {
+      {"SaveTaskData=0", "Failed to save task data", 1},
+      {"KAVOFSAclChmod=-1", "failed to ACL chmod 'DEV/vol1/photo/z.zip' to 777, errno: Success", 1},
+      {"LumoLibChown2Admin=-1", "LumoLibChown2Admin fail", 1},
+      {"LumoLibChown2Admin=1", "LumoLibChown2Admin fail", 1},
+      {"KLIBGroupIsAdminGroupMem=-1", "KLIBGroupIsAdminGroupMem(alice) failed. [0x0000 :0]", 0},
+  };
   Add("vol1/photo/z.zip", "an archive");
-  Print("Total: 3\n");
-  Device::AddFault("SaveTaskData=0");
-  EXPECT_FALSE(Run().isMember("errors"));
-  EXPECT_EQ(Log(), Strings{"Failed to save task data"});
+  ScriptArchiver("Total: 3\n");
+  for (const auto& row : rows) {
+    Watch();
+    Device::AddFault(row.fault);
+    EXPECT_FALSE(Run().isMember("errors"));
+    ASSERT_EQ(Log().size(), 1U) << row.fault;
+    EXPECT_EQ(Log()[0].substr(0, Log()[0].rfind("errno")),
+              std::string(row.line).substr(0, std::string(row.line).rfind("errno")));
+    EXPECT_EQ(Calls("LumoLibChown2Admin").size(), static_cast<std::size_t>(row.owner_calls));
+    EXPECT_EQ(Calls("KLIBKavoIndexAdd").size(), 1U);
+  }
 }
 
-TEST_F(RunTest, ModeAndOwnerThatAreNotSetAreLoggedAndNoMore) {
-  const std::string archive = Add("vol1/photo/z.zip", "an archive");
-  Print("");
-  Device::AddFault("KAVOFSAclChmod=-1");
+TEST_F(RunTest, AnErrorLineComesAfterAnArchiveIsThereAndItsOwnerIsSetAllTheSame) {
+  Add("vol1/photo/z.zip", "an archive");
   Device::AddFault("LumoLibChown2Admin=-1");
-  EXPECT_FALSE(Run().isMember("errors"));
-  ASSERT_EQ(Log().size(), 2U);
-  EXPECT_EQ(Log()[0].rfind("failed to ACL chmod '" + archive + "' to 777, errno: ", 0), 0U);
-  EXPECT_EQ(Log()[1], "LumoLibChown2Admin fail");
-  EXPECT_EQ(Calls("KAVOFSAclChmod").back().args[2], 0666);
-  EXPECT_EQ(Calls("KLIBKavoIndexAdd").back().args[0], archive);
-
+  ScriptArchiver("Error: Read-only file system\n");
+  EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, "/photo/z.zip")),
+            (Strings{"/photo/z.zip: 411", "/photo/z.zip: 401"}));
   Device::AddFault("KLIBGroupIsAdminGroupMem=-1");
-  RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"), "bob");
-  EXPECT_EQ(Log().back().rfind("KLIBGroupIsAdminGroupMem(bob) failed. [0x0000 :0]", 0), 0U);
-  EXPECT_EQ(Calls("LumoLibChown2Admin").size(), 1U);
+  EXPECT_EQ(FailJob(JobParams({"/photo/a.txt"}, "/photo/z.zip")),
+            (Strings{"/photo/z.zip: 411", "/photo/z.zip: 401"}));
+  EXPECT_EQ(Calls("KLIBKavoIndexAdd").size(), 2U);
+  EXPECT_TRUE(Calls("KAVOFSAclChmod").empty());
 }
 
 TEST_F(RunTest, WithoutASavedMaskTheProcessesMaskCounts) {
-  Print("");
+  ScriptArchiver("");
   Device::AddFault("LumoLibUmask=-1");
   Device::AddFault("LumoLibGetUmask=027");
   Run();

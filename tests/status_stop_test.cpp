@@ -13,7 +13,7 @@
 #include "device/bodies/task_store.h"
 #include "tests/device_fixture.h"
 #include "tests/emulation.h"
-#include "tests/libc_faults.h"
+#include "tests/libc_calls.h"
 
 namespace {
 
@@ -61,7 +61,27 @@ TEST_F(TaskTest, StopEndsWorkerAndArchiverAndLeavesNothing) {
   EXPECT_TRUE(Group(Worker()).empty());
   EXPECT_EQ(EntriesBeside(), 1U);
   EXPECT_TRUE(StagedPaths().empty());
+  const Strings calls = Sequence(Worker(), true);
+  EXPECT_EQ(Strings(calls.end() - 3, calls.end()),
+            (Strings{"kill 0,15", "unlink \"/tmp/lumozip*\"", "exit 1"}));
   EXPECT_EQ(Ask("status", task_id).code, 599);
+}
+
+// What staging has made has no owner yet when the signal comes in the middle of it.
+TEST_F(TaskTest, AStopWhileTheListIsStagedLeavesNoList) {
+  Add("vol1/photo/a.txt", "a");
+  const struct {
+    const char *call, *part;
+  } rows[] = {{"mkstemp", "lumozip"}, {"write", "a.txt"}, {"stat", "a.txt"}};
+  for (const auto& row : rows) {
+    Watch();
+    SetLibcFault({row.call, row.part, 0, SIGTERM});
+    EXPECT_EQ(Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip")).code, 0);
+    ASSERT_TRUE(WaitUntil([&] { return !Calls("exit").empty(); })) << row.call;
+    ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
+    EXPECT_TRUE(StagedPaths().empty()) << row.call;
+    EXPECT_TRUE(Calls("KLIBCPopenv").empty());
+  }
 }
 
 TEST_F(TaskTest, AnArchiverThatIsKilledFailsTheJob) {
@@ -100,24 +120,6 @@ TEST_F(TaskTest, AFinishedTaskIsReportedOnce) {
   }));
   EXPECT_EQ(last.data["progress"], 1.0);
   EXPECT_EQ(Ask("status", task_id).code, 599);
-  // After the error the removal is asked for all the same.
-  const TracedCall removal = Calls("LumoLibRemoveFinishedTask").back();
-  EXPECT_TRUE(removal.args[0].isNull());
-  EXPECT_EQ(removal.args[1], -1);
-  EXPECT_EQ(removal.args[2], false);
-}
-
-TEST_F(TaskTest, MissingTaskIds) {
-  for (const char* method : {"status", "stop"}) {
-    EXPECT_EQ(Call(method, Json::Value(Json::objectValue)).code, 101) << method;
-  }
-  EXPECT_EQ(Calls("LumoLibRemoveFinishedTask").size(), 1U);
-  EXPECT_TRUE(Calls("Vesk::TaskMgr::TaskMgr").empty());
-  EXPECT_EQ(Ask("status", "").code, 599);
-  const Outcome stopped = Ask("stop", "Zantro_unknown");
-  EXPECT_EQ(stopped.code, 0);
-  EXPECT_TRUE(stopped.data.isNull());
-  EXPECT_TRUE(Calls("Vesk::Task::remove").empty());
 }
 
 TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
@@ -135,44 +137,6 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
   }
   EXPECT_EQ(Ask("stop", task_id).code, 0);
   EXPECT_TRUE(Group(Worker()).empty());
-}
-
-TEST_F(TaskTest, StopRemovesTheTaskOnEveryPath) {
-  struct Row {
-    const char* fault;
-    const char* log;
-    int code;
-    bool asks_to_kill;
-  };
-  const Row rows[] = {
-      {"WaitForTaskDataKeyReady=0", "Failed to get json data", 401, false},
-      {"Vesk::Task::isFinished=1", "", 0, false},
-      {"Vesk::Task::getProperty=null", "Failed to get json data", 401, false},
-      {"DoKill=0", "", 401, true},
-  };
-  for (const Row& row : rows) {
-    Device::StopWatching();
-    const std::string task_id = "Zantro_" + std::string(row.fault);
-    {
-      Device::TaskStore store("alice");
-      store.AddTask(task_id, {{"data", R"({"pid":1})"}});
-    }
-    if (geteuid() == 0) {
-      for (const fs::directory_entry& file : fs::directory_iterator(At("users/alice"))) {
-        ASSERT_EQ(chown(file.path().c_str(), 65001, Device::kUsersGroup), 0);
-      }
-    }
-    std::remove((temp_.Path() + "/trace").c_str());
-    std::ofstream(temp_.Path() + "/log", std::ios::trunc).flush();
-    Device::OpenTrace(temp_.Path() + "/trace");
-    Device::AddFault(row.fault);
-    EXPECT_EQ(Ask("stop", task_id).code, row.code) << row.fault;
-    EXPECT_EQ(Log().empty() ? "" : Log().back(), row.log);
-    EXPECT_EQ(!Calls("DoKill").empty(), row.asks_to_kill) << row.fault;
-    EXPECT_EQ(Calls("Vesk::Task::remove").size(), 1U) << row.fault;
-    Device::StopWatching();
-    EXPECT_EQ(Ask("status", task_id).code, 599) << row.fault;
-  }
 }
 
 TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {
@@ -195,16 +159,81 @@ TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {
   EXPECT_TRUE(WaitUntil([&] { return Group(worker).empty(); }));
 }
 
-TEST_F(TaskTest, StatusWithoutDataIsAnErrorAndKeepsTheTask) {
-  Add("vol1/photo/a.txt", "a");
-  const std::string task_id = StartEndlessJob();
-  Device::AddFault("Vesk::Task::getProperty=null");
-  EXPECT_EQ(Ask("status", task_id).code, 401);
-  EXPECT_EQ(Log().back(), "Failed to get json data");
-  EXPECT_EQ(Calls("LumoLibRemoveFinishedTask").back().args[1], -1);
-  Device::StopWatching();
-  EXPECT_EQ(Ask("status", task_id).code, 0);
-  EXPECT_EQ(Ask("stop", task_id).code, 0);
+struct AnswerRow {
+  const char* method;
+  const char* data;    // stored before
+  const char* answer;  // the code and its data
+  const char* last;    // the last call that is as in a request that succeeds
+  const char* after = "";
+  const char* fault = nullptr;
+};
+
+constexpr char kNoData[] = "Failed to get json data";
+constexpr char kHas[] = "KAVO::APIRequest::HasParam";
+constexpr char kFind[] = "Vesk::TaskMgr::getTaskWithThrow";
+constexpr char kGet[] = "Vesk::Task::getProperty";
+constexpr char kGone[] = "LumoLibRemoveFinishedTask";
+
+// clang-format off
+const AnswerRow kAnswers[] = {
+    {"status", nullptr, "101 null", kHas, kGone},
+    {"status", nullptr, "599 null", kFind, kGone},
+    {"status", R"({"pid":7})", "401 null", kGet, "syslog LumoLibRemoveFinishedTask", "Vesk::Task::getProperty=null"},
+    {"status", R"({"pid":7})", R"(0 {"finished":false,"progress":0.0})", kGone},
+    {"status", R"({"pid":7,"params":{}})", R"(0 {"dest_file_path":"","finished":false,"progress":0.0})", kGone},
+    {"status", R"({"params":{"dest_file_path":"/d"}})", R"(0 {"dest_file_path":"/d","finished":true,"progress":0.0})", kGone, "", "Vesk::Task::isFinished=1"},
+    {"status", R"({"errors":[1],"pid":"x"})", R"(0 {"errors":[1],"finished":true})", kGet, kGone},
+    {"status", R"({"params":{"dest_file_path":[]}})", "101 null", kGet, "LumoLibRemoveFinishedTask throws"},
+    {"status", R"([1])", "101 null", kGet, "LumoLibRemoveFinishedTask throws"},
+    {"stop", nullptr, "101 null", kHas},
+    {"stop", nullptr, "0 null", kFind},
+    {"stop", R"({"pid":7})", "401 null", "WaitForTaskDataKeyReady", "syslog Vesk::Task::remove", "WaitForTaskDataKeyReady=0"},
+    {"stop", R"({"pid":7})", "0 null", "Vesk::Task::isFinished", "Vesk::Task::remove", "Vesk::Task::isFinished=1"},
+    {"stop", R"({"pid":7})", "401 null", kGet, "syslog Vesk::Task::remove", "Vesk::Task::getProperty=null"},
+    {"stop", R"({"pid":7})", "401 null", "Vesk::Task::remove", "", "DoKill=0"},
+    {"stop", R"({"pid":"x"})", "101 null", kGet, "Vesk::Task::remove throws"},
+};
+// clang-format on
+
+TEST_F(TaskTest, AnswersForEachTask) {
+  for (const AnswerRow& row : kAnswers) {
+    const std::string name = std::string(row.method) + " " + row.answer + " " + row.after;
+    Watch();
+    const std::string task_id = "Zantro_test";
+    if (row.data != nullptr) {
+      Device::TaskStore("alice").AddTask(task_id, {{"data", row.data}});
+      for (const fs::directory_entry& file : fs::directory_iterator(At("users/alice"))) {
+        EXPECT_EQ(lchown(file.path().c_str(), geteuid() == 0 ? 65001 : -1, -1), 0);
+      }
+    }
+    if (row.fault != nullptr) {
+      Device::AddFault(row.fault);
+    }
+    const Outcome outcome = row.last == kHas ? Call(row.method, Json::Value(Json::objectValue))
+                                             : Ask(row.method, task_id);
+    EXPECT_EQ(std::to_string(outcome.code) + " " + Device::ToText(outcome.data), row.answer)
+        << name;
+    Strings after = Words(row.after);
+    const bool throws = !after.empty() && after.back() == "throws";
+    throws ? after.pop_back() : void();
+    EXPECT_EQ(Sequence(Calls("LumoLibUmask").front().pid),
+              UpTo(NamesOf(ExpectedSequence(row.method)), row.last) + after +
+                  Words(throws ? "" : "KAVO::APIResponse::SetError") + Words("LumoLibRestoreUmask"))
+        << name;
+    if (after.size() == 2) {
+      EXPECT_EQ(Log(), Strings{kNoData}) << name;
+    }
+    // The process id goes with the removal when the data has one.
+    for (const TracedCall& removal : Calls(kGone)) {
+      EXPECT_EQ(removal.args[0].isNull(), row.data == nullptr) << name;
+      EXPECT_EQ(removal.args[1], row.fault == nullptr && outcome.code == 0 &&
+                                         std::string(row.data).find(":7") != std::string::npos
+                                     ? 7
+                                     : -1)
+          << name;
+    }
+    Device::TaskStore("alice").RemoveTask(task_id);
+  }
 }
 
 }  // namespace

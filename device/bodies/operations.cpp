@@ -7,7 +7,6 @@
 #include <array>
 #include <cerrno>
 #include <cstring>
-#include <regex>
 #include <stdexcept>
 
 #include "device/bodies/errors.h"
@@ -112,6 +111,32 @@ std::array<std::uint64_t, kOperationCount>& Counts() {
   throw std::invalid_argument("fault rule '" + rule + "': " + reason);
 }
 
+// Takes the code off a result that ends in ":" and a number.
+void SplitCode(Fault& fault) {
+  const std::size_t colon = fault.result.rfind(':');
+  if (colon == std::string::npos || colon + 1 == fault.result.size() ||
+      fault.result.find_first_not_of("-0123456789", colon + 1) != std::string::npos) {
+    return;
+  }
+  fault.has_code = true;
+  fault.code = std::stoi(fault.result.substr(colon + 1));
+  fault.result.resize(colon);
+}
+
+// Takes the outputs out of a result that is an object with a "result" of its own.
+void SplitOutputs(Fault& fault) {
+  Json::Value object;
+  try {
+    object = ParseJson(fault.result);
+  } catch (const std::runtime_error&) {
+    return;  // a plain text
+  }
+  if (object.isObject() && object.isMember("result")) {
+    fault.result = object["result"].asString();
+    fault.outputs = object;
+  }
+}
+
 }  // namespace
 
 void OpenTrace(const std::string& path) {
@@ -137,16 +162,11 @@ void AddFault(const std::string& rule) {
       fault.number = std::stoull(fault.call.substr(hash + 1));
       fault.call.resize(hash);
     }
-    static const std::regex kWithCode("(.*):(-?[0-9]+)");
-    std::smatch parts;
-    if (std::regex_match(fault.result, parts, kWithCode)) {
-      fault.has_code = true;
-      fault.code = std::stoi(parts[2]);
-      fault.result = std::string(parts[1]);
-    }
+    SplitCode(fault);
   } catch (const std::logic_error&) {
     RefuseRule(rule, "N and CODE are numbers");
   }
+  SplitOutputs(fault);
   if (IndexOf(fault.call) == kOperationCount) {
     RefuseRule(rule, "no operation '" + fault.call + "'");
   }

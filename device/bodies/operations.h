@@ -24,7 +24,8 @@ void OpenTrace(const std::string& path);
 
 // Adds a rule CALL[#N]=RESULT[:CODE]. The Nth call, or every call, answers RESULT instead of doing
 // its work and leaves CODE as the library's last error. RESULT is a number, a text, `null`, or
-// `throw`. Throws std::invalid_argument for a rule that is none or names no operation.
+// `throw`; or an object {"result": RESULT, NAME: VALUE...} that also fills the operation's outputs
+// of those names. Throws std::invalid_argument for a rule that is none or names no operation.
 void AddFault(const std::string& rule);
 
 // The names of all operations, as rules and trace lines have them.
@@ -37,6 +38,7 @@ struct Fault {
   std::string call;
   std::uint64_t number = 0;  // 0: every call
   std::string result;
+  Json::Value outputs;  // by name; null: none
   bool has_code = false;
   int code = 0;
 };
@@ -100,6 +102,20 @@ class Operation {
     }
   }
 
+  // Names an output, which is filled when the fault rule has a value for it. Before Run.
+  Operation& Output(const char* name, int& output) {
+    if (HasOutput(name)) {
+      output = fault_->outputs[name].asInt();
+    }
+    return *this;
+  }
+  Operation& Output(const char* name, std::string& output) {
+    if (HasOutput(name)) {
+      output = fault_->outputs[name].asString();
+    }
+    return *this;
+  }
+
   // Answers with the fault rule's result, or with the body's. Exceptions are traced and pass on.
   template <typename Body>
   auto Run(Body body) -> decltype(body()) {
@@ -128,6 +144,9 @@ class Operation {
   }
 
  private:
+  bool HasOutput(const char* name) const {
+    return fault_ != nullptr && fault_->outputs.isMember(name);
+  }
   static bool IsWatched();
   static const Fault* CountAndMatch(const char* name);
   // Leaves the rule's code, and throws when the rule says so.

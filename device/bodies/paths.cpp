@@ -176,7 +176,13 @@ const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_p
 using Device::Operation;
 
 int PathInfoFactory::create(const char* user, const std::string& path, PathInfo& out) {
-  return Operation("PathInfoFactory::create", user, path).Run([&] {
+  Operation operation("PathInfoFactory::create", user, path);
+  operation.Output("share_path", out.share_path)
+      .Output("real_path", out.real_path)
+      .Output("share_name", out.share_name)
+      .Output("volume_path", out.volume_path)
+      .Output("share_real_path", out.share_real_path);
+  return operation.Run([&] {
     Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), user, path);
     if (resolved.error == 0 && Device::AccessOf(resolved, user) == Device::Access::kNone) {
       resolved.error = Device::kErrNoPrivilege;  // the user does not even see the shared folder
@@ -199,18 +205,20 @@ int PathInfoFactory::create(const char* user, const std::string& path, PathInfo&
 int LumoFullPathGet(const char* path, std::string* full_path, std::string* home_test_path,
                     std::string* aux_1, std::string* aux_2, const std::string* user,
                     const char* charset) {
-  return Operation("LumoFullPathGet", path, *user, charset).Run([&] {
-    const Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), *user, path);
-    if (resolved.error != 0) {
-      Device::SetLastError(resolved.error);
-      return 0;
-    }
-    *full_path = resolved.real_path;
-    *home_test_path = resolved.real_path;
-    *aux_1 = resolved.share_name;
-    *aux_2 = resolved.volume_path;
-    return 1;
-  });
+  return Operation("LumoFullPathGet", path, *user, charset)
+      .Output("full_path", *full_path)
+      .Run([&] {
+        const Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), *user, path);
+        if (resolved.error != 0) {
+          Device::SetLastError(resolved.error);
+          return 0;
+        }
+        *full_path = resolved.real_path;
+        *home_test_path = resolved.real_path;
+        *aux_1 = resolved.share_name;
+        *aux_2 = resolved.volume_path;
+        return 1;
+      });
 }
 
 int IsDirUserHome(const std::string& path, const char* reserved) {

@@ -86,9 +86,10 @@ using Device::Operation;
 
 int LumoLibGetPrivilege(const char* path, const char* user, const char* session_id, int* level,
                         int* flags) {
-  return Operation("LumoLibGetPrivilege", path, user, session_id).Run([&] {
-    return Device::GetPrivilege(path, user, level, flags);
-  });
+  return Operation("LumoLibGetPrivilege", path, user, session_id)
+      .Output("level", *level)
+      .Output("flags", *flags)
+      .Run([&] { return Device::GetPrivilege(path, user, level, flags); });
 }
 
 int CheckShareListPrivilege(const char* user, const char* session_id, const char* path) {

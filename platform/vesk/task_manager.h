@@ -77,8 +77,8 @@ class TaskMgr {
   // An id, beginning with `prefix`, that no task of the user has. Throws std::exception when the
   // store cannot be asked.
   std::string getUniqueTaskId(const char* prefix);
-  // The user's task of that id; the caller owns the object. Throws std::exception when there is
-  // none.
+  // The user's task of that id, made with new; the caller owns the object, which may outlive the
+  // manager. Throws std::exception when there is none.
   Task* getTaskWithThrow(const char* task_id);
 
  private:

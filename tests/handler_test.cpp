@@ -1,0 +1,107 @@
+// What no request reaches: the base class as other handlers use it, and the handler's quoting.
+// Linked with the module's own objects.
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <syslog.h>
+
+#include <array>
+#include <cerrno>
+#include <cstdarg>
+#include <cstring>
+#include <functional>
+
+#include "compress/KAVO.Zantro.Compress.h"
+#include "device/bodies/json_text.h"
+#include "device/bodies/operations.h"
+#include "device/host/request_state.h"
+
+namespace {
+
+std::string last_line;  // of the log, without its file and line
+
+class Handler : public Zantro::FileWebAPI {
+ public:
+  using FileWebAPI::FileWebAPI;
+  using FileWebAPI::ParseErrnoToError;
+  using FileWebAPI::SetError;
+  using FileWebAPI::SetFileError;
+  using FileWebAPI::SetResponse;
+
+  std::function<void(Handler&)> process = [](Handler& /*handler*/) {};
+
+ protected:
+  void Process() override { process(*this); }
+};
+
+// The outcome that a handler with this body hands to the host.
+std::string OutcomeOf(const std::function<void(Handler&)>& process) {
+  Device::AddFault("LumoLibUGIDSet=0");
+  const Device::Request request;
+  KAVO::APIRequest::State request_state{request};
+  KAVO::APIResponse::State response_state;
+  KAVO::APIRequest api_request{&request_state};
+  KAVO::APIResponse api_response{&response_state};
+  Handler handler(&api_request, &api_response);
+  handler.process = process;
+  handler.Run();
+  Device::StopWatching();
+  EXPECT_EQ(handler.GetError(), response_state.outcome.code);
+  return std::to_string(response_state.outcome.code) + " " +
+         Device::ToText(response_state.outcome.data);
+}
+
+TEST(BaseHandler, HandsOnWhatWasRecordedLast) {
+  EXPECT_EQ(OutcomeOf([](Handler& /*handler*/) {}), "0 null");
+  EXPECT_EQ(OutcomeOf([](Handler& handler) {
+              handler.SetError(407, "why");
+              handler.SetResponse("data");
+            }),
+            R"(0 "data")");
+  EXPECT_EQ(OutcomeOf([](Handler& handler) {
+              handler.SetResponse("data");
+              handler.SetError(401);
+            }),
+            "401 null");
+  EXPECT_EQ(OutcomeOf([](Handler& handler) { handler.SetFileError(1300, "/photo/a", 402); }),
+            R"(1300 [{"code":402,"path":"/photo/a"}])");
+}
+
+TEST(BaseHandler, LeavesErrorNumbersToThePlatform) {
+  EXPECT_EQ(Handler::ParseErrnoToError(ENOSPC, nullptr, nullptr), 416);
+  EXPECT_EQ(Handler::ParseErrnoToError(0, "from", "to"), 0);
+}
+
+TEST(Escape, QuotesForAShellOrAnswersNothing) {
+  const auto escape = [](const std::string& text) {
+    last_line.clear();
+    return Zantro::ZantroCompressHandler::LumoEscape(text.c_str());
+  };
+  EXPECT_EQ(escape("a b"), "a\\ b");
+  EXPECT_EQ(escape("\n\n"), "'\n''\n'");  // just fits: three times its length
+  EXPECT_EQ(last_line, "");
+  Device::AddFault("KLIBCEncShParam=-1");
+  EXPECT_EQ(escape("a b"), "");
+  Device::StopWatching();
+  EXPECT_EQ(last_line, "Failed to escape string: a b");
+#if !defined(__SANITIZE_ADDRESS__) && __SIZEOF_POINTER__ == 8  // elsewhere the limit has no effect
+  const std::string text(64U << 20U, 'a');
+  rlimit limit{};
+  ASSERT_EQ(getrlimit(RLIMIT_AS, &limit), 0);
+  const rlimit low = {1, limit.rlim_max};
+  ASSERT_EQ(setrlimit(RLIMIT_AS, &low), 0);
+  EXPECT_EQ(escape(text), "");
+  setrlimit(RLIMIT_AS, &limit);
+  EXPECT_EQ(last_line, "Failed to malloc: (201326593)");
+#endif
+}
+
+}  // namespace
+
+extern "C" void syslog(int /*priority*/, const char* format, ...) {
+  std::array<char, 256> line{};
+  va_list arguments;
+  va_start(arguments, format);
+  std::vsnprintf(line.data(), line.size(), format, arguments);
+  va_end(arguments);
+  last_line = std::strchr(line.data(), ' ') + 1;
+}

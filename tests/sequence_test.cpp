@@ -1,0 +1,77 @@
+// Every call that the module makes in each kind of run, in order and with its arguments; the lists
+// stand in tests/sequences. Failures are tested against their beginnings.
+#include <gmock/gmock.h>
+
+#include "device/bodies/device.h"
+#include "device/bodies/json_text.h"
+#include "device/bodies/operations.h"
+#include "tests/device_fixture.h"
+
+namespace {
+
+using testing::ElementsAreArray;
+
+class SequenceTest : public DeviceTest {
+ protected:
+  SequenceTest() {
+    for (const char* name : {"photo/trip/a.txt", "photo/trip/day/b.txt", "music/m.txt"}) {
+      Add(std::string("vol1/") + name, "text");
+    }
+    Add("vol1/photo/out.zip", "an archive");
+    ScriptArchiver("Total: 9\nCompressing trip/a.txt\nProgress: 50\n");
+    Watch();
+  }
+
+  // The processes of the last request and of its worker.
+  void ExpectRequest(const std::string& name) {
+    EXPECT_THAT(Sequence(Calls("LumoLibUmask").back().pid, true),
+                ElementsAreArray(ExpectedSequence(name)));
+  }
+  void ExpectWorker(const std::string& name) {
+    EXPECT_THAT(Sequence(Fork().result.asInt(), true), ElementsAreArray(ExpectedSequence(name)));
+  }
+};
+
+TEST_F(SequenceTest, StartAndAJobOfOneShare) {
+  Json::Value params = JobParams({"/photo/trip/a.txt", "/photo/trip/day"}, "/photo/out.zip/");
+  params["mode"] = "freshen";
+  params["level"] = "fastest";
+  params["format"] = "zip";
+  params["password"] = "secret";
+  const std::string task_id = Call("start", params).data["taskid"].asString();
+  ExpectRequest("start");
+  ASSERT_TRUE(WaitUntil([&] { return !Calls("_exit").empty(); }));
+  ExpectWorker("job_of_one_share");
+  EXPECT_TRUE(Ask("status", task_id).data["finished"].asBool());
+  ExpectRequest("status");
+  EXPECT_EQ(Log(), Strings{});
+}
+
+TEST_F(SequenceTest, AJobOfTwoSharesThatNotifies) {
+  Add("vol1/homes/alice/z.7z", "an archive");
+  Device::AddFault("Vesk::Task::getBoolProperty=1");
+  Device::AddFault("KLIBGroupIsAdminGroupMem=0");
+  Json::Value params =
+      JobParams({"/photo/trip/a.txt", "/music", "/photo/trip/day/b.txt"}, "/home/z.7z");
+  params["format"] = "7z";
+  params["codepage"] = "CP437";
+  RunJob(params);
+  ExpectWorker("job_of_two_shares");
+}
+
+TEST_F(SequenceTest, AJobThatFails) {
+  RunJob(JobParams({"/photo/none"}, "/photo/<b>.zip"));
+  ExpectWorker("failed_job");
+  EXPECT_EQ(Log(), Strings{"Can't access source files"});
+}
+
+TEST_F(SequenceTest, Stop) {
+  Device::AddFault("DoKill=1");
+  Device::AddFault("Vesk::Task::isFinished=0");
+  const Device::Outcome started = Call("start", JobParams({"/photo/trip"}, "/photo/out.zip"));
+  ASSERT_TRUE(WaitUntil([&] { return !Calls("_exit").empty(); }));
+  EXPECT_EQ(Ask("stop", started.data["taskid"].asString()).code, 0);
+  ExpectRequest("stop");
+}
+
+}  // namespace
