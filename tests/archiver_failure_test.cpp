@@ -9,6 +9,7 @@
 #include "device/archiver/report.h"
 #include "device/archiver/stock_7z.h"
 #include "tests/archiver_test_support.h"
+#include "tests/emulation.h"
 
 namespace ArchiverTest {
 namespace {
@@ -136,7 +137,8 @@ TEST_F(Failing, ReportsAFullDiskInPackingAndInRecoding) {
 
 TEST_F(Failing, StopsAtOnceAndLeavesNothing) {
   MakeHuge();
-  ASSERT_EQ(prctl(PR_SET_CHILD_SUBREAPER, 1), 0);
+  const bool adopts_orphans = prctl(PR_SET_CHILD_SUBREAPER, 1) == 0;
+  ASSERT_TRUE(adopts_orphans || kIsEmulated);  // an emulator may not know of it
   for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGKILL, 0}) {  // 0: nobody reads any more
     Program program(CommandLine(out / "new", {"huge"}), folder);
     ASSERT_TRUE(program.ReadUntil("Compressing huge\n"));
@@ -152,11 +154,11 @@ TEST_F(Failing, StopsAtOnceAndLeavesNothing) {
     EXPECT_EQ(program.Wait(), signal == SIGKILL ? -SIGKILL : 1);
     int status = 0;
     if (signal == SIGKILL) {  // the supervisor's; the job, an orphan now, cancels itself
-      EXPECT_GT(waitpid(-1, &status, 0), 0);
+      EXPECT_EQ(waitpid(-1, &status, 0) > 0, adopts_orphans);
       EXPECT_TRUE(program.ReadUntil("\nError: cancelled\n"));
     }
     EXPECT_EQ(InOut(), Strings{});
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(1));
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(kSlowness));
     EXPECT_EQ(waitpid(-1, &status, WNOHANG), -1);
     WriteFile(share / "a", "a");
   }
@@ -213,6 +215,9 @@ TEST_F(Failing, SparesTheFolderOfARunThatIsAlive) {
 }
 
 TEST_F(Failing, HidesThePasswordFromOtherUsers) {
+  if (kIsEmulated) {
+    GTEST_SKIP() << "what a program makes of its arguments is the emulator's own memory";
+  }
   MakeHuge();
   Options options;
   options.password = "geheim";

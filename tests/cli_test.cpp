@@ -34,7 +34,7 @@ TEST_F(CliTest, SampleDevicePacksFromTwoShares) {
   const Ran ran = Kavo({"compress", sample, "--user", "alice", "/photo/trip/day1/b, the second.jpg",
                         "/music/album", "/photo/both.7z", "--level", "store"});
   EXPECT_EQ(ran.status, 0) << ran.err;
-  EXPECT_THAT(ran.out, testing::EndsWith("\n/photo/both.7z\n"));
+  EXPECT_THAT(ran.out, testing::EndsWith("/photo/both.7z\n"));
   const Ran listing = RunProgram({"/usr/bin/7z", "l", "-ba", sample + "/vol1/photo/both.7z"});
   EXPECT_THAT(listing.out, HasSubstr("photo/trip/day1/b, the second.jpg"));
   EXPECT_THAT(listing.out, HasSubstr("music/album/02.mp3"));

@@ -21,6 +21,7 @@
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
+#include "tests/emulation.h"
 #include "tests/libc_calls.h"
 
 namespace fs = std::filesystem;
@@ -43,7 +44,7 @@ constexpr char kConfig[] = R"({
   ]
 })";
 constexpr uid_t kAliceUid = 65001;
-constexpr std::chrono::seconds kPatience(30);
+const std::chrono::seconds kPatience(30 * kSlowness);
 
 void ReadEnd(int fd, std::string& text) {
   std::array<char, 4096> block{};
@@ -177,6 +178,7 @@ DeviceTest::~DeviceTest() {
   for (const TracedCall& fork : Calls("KLIBCProcFork")) {
     if (fork.result.asInt() > 0) {
       kill(-fork.result.asInt(), SIGKILL);  // what the test left running
+      WaitUntil([&] { return Group(fork.result.asInt()).empty(); });
     }
   }
   while (waitpid(-1, nullptr, 0) > 0) {
@@ -244,9 +246,11 @@ Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& use
   }));
   EXPECT_EQ(last.code, 0);
   // The worker has said its last word in the log when it is gone.
-  EXPECT_TRUE(WaitUntil([] {
+  const int worker = Worker();
+  EXPECT_TRUE(WaitUntil([&] {
     Device::Launcher::Reap();
-    return waitpid(-1, nullptr, WNOHANG) == -1;
+    // Under an emulator the worker may be nobody's child here.
+    return waitpid(-1, nullptr, WNOHANG) == -1 && Group(worker).empty();
   }));
   return last.data;
 }
@@ -275,6 +279,22 @@ std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
     }
   }
   return calls;
+}
+
+Strings DeviceTest::Group(int worker) {
+  Strings names;
+  for (const fs::directory_entry& process : fs::directory_iterator("/proc")) {
+    std::ifstream stat(process.path() / "stat");
+    std::string pid;
+    std::string name;
+    std::string state;
+    int parent = 0;
+    int group = 0;
+    if (stat >> pid >> name >> state >> parent >> group && group == worker && state != "Z") {
+      names.push_back(name);
+    }
+  }
+  return names;
 }
 
 TracedCall DeviceTest::Fork() const {

@@ -89,6 +89,9 @@ class DeviceTest : public testing::Test {
   std::vector<TracedCall> Calls(const std::string& call = "") const;
   // The fork that made the last worker, as the request process saw it.
   TracedCall Fork() const;
+  int Worker() const { return Fork().result.isNull() ? -1 : Fork().result.asInt(); }
+  // The living processes of the worker's group: itself, the archiver's two, the stock 7z.
+  static Strings Group(int worker);
   // What a process called, libc's calls by the module among it: one line for each, the name and,
   // if asked for, the arguments as Plain has them. Getters of the task's id are left out.
   Strings Sequence(int pid, bool with_arguments = false) const;
