@@ -88,53 +88,6 @@ TEST_F(Failing, SaysWhyARequestCannotBeMet) {
   EXPECT_EQ(InOut(), Strings{});
 }
 
-// Packs into a small tmpfs of a private mount namespace; "left" gets the names that remain in it.
-TEST_F(Failing, ReportsAFullDiskInPackingAndInRecoding) {
-  WriteFile(share / "日", std::string(900000, 'x'));
-  Options zip;
-  zip.code_page = "CP932";
-  zip.level = "-mx0";
-  for (const char* size : {"size=500k", "size=1500k"}) {  // the second has room for one copy
-    const Strings argv = CommandLine(out / "new", {"日"}, zip);
-    const Outcome outcome = Execute(argv, folder, [&] {
-      const bool is_root = geteuid() == 0;
-      const auto same_id = [](unsigned id) {
-        return std::to_string(id).append(" ").append(std::to_string(id)).append(" 1");
-      };
-      const std::string uids = same_id(geteuid());
-      const std::string gids = same_id(getegid());
-      if (unshare(CLONE_NEWNS | (is_root ? 0 : CLONE_NEWUSER)) != 0) {
-        _exit(77);
-      }
-      if (!is_root) {
-        WriteFile("/proc/self/uid_map", uids);
-        WriteFile("/proc/self/setgroups", "deny");
-        WriteFile("/proc/self/gid_map", gids);
-      }
-      mount("none", "/", nullptr, MS_REC | MS_PRIVATE, nullptr);
-      if (mount("none", out.c_str(), "tmpfs", 0, size) != 0) {
-        _exit(77);
-      }
-      const pid_t packing = fork();
-      if (packing != 0) {
-        int status = 0;
-        waitpid(packing, &status, 0);
-        std::string left;
-        for (const std::string& name : InOut()) {
-          left += name + '\n';
-        }
-        WriteFile(root / "left", left);
-        _exit(WIFEXITED(status) ? WEXITSTATUS(status) : 124);
-      }
-    });
-    if (outcome.status == 77) {
-      GTEST_SKIP() << "no private mounts here";
-    }
-    Bad(outcome, "No space left on device");
-    EXPECT_EQ(ReadFile(root / "left"), "");
-  }
-}
-
 TEST_F(Failing, StopsAtOnceAndLeavesNothing) {
   MakeHuge();
   const bool adopts_orphans = prctl(PR_SET_CHILD_SUBREAPER, 1) == 0;

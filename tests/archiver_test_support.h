@@ -15,99 +15,17 @@
 #include <functional>
 #include <iterator>
 #include <map>
+#include <optional>
 #include <sstream>
 #include <string>
 #include <utility>
 #include <vector>
 
+#include "tests/programs.h"
+
 namespace ArchiverTest {
 
 namespace fs = std::filesystem;
-using Strings = std::vector<std::string>;
-
-inline std::string ReadFile(const fs::path& path) {
-  std::ifstream in(path, std::ios::binary);
-  return {std::istreambuf_iterator<char>(in), {}};
-}
-
-inline void WriteFile(const fs::path& path, const std::string& text) {
-  fs::create_directories(path.parent_path());
-  std::ofstream(path, std::ios::binary) << text;
-}
-
-// A child whose standard output the test reads. It leads its own process group.
-class Program {
- public:
-  Program(
-      const Strings& argv, const fs::path& folder, const std::function<void()>& prepare = [] {}) {
-    int ends[2];
-    if (pipe2(ends, O_CLOEXEC) != 0) {
-      std::abort();
-    }
-    std::vector<char*> pointers;
-    for (const std::string& argument : argv) {
-      pointers.push_back(const_cast<char*>(argument.c_str()));
-    }
-    pointers.push_back(nullptr);
-    // Opened before `prepare`, after which there may be no way to walk there.
-    const int program = open(argv[0].c_str(), O_PATH | O_CLOEXEC);
-    pid_ = fork();
-    if (pid_ == 0) {
-      setpgid(0, 0);
-      dup2(ends[1], STDOUT_FILENO);
-      prepare();
-      if (chdir(folder.c_str()) == 0) {
-        fexecve(program, pointers.data(), environ);
-        execv(argv[0].c_str(), pointers.data());  // a script is read again by its name
-      }
-      _exit(126);
-    }
-    setpgid(pid_, pid_);
-    close(program);
-    close(ends[1]);
-    output_ = ends[0];
-  }
-  Program(const Program&) = delete;
-  Program& operator=(const Program&) = delete;
-  ~Program() {
-    if (pid_ > 0) {
-      kill(pid_, SIGKILL);
-      Wait();
-    }
-    CloseOutput();
-  }
-
-  pid_t Pid() const { return pid_; }
-  const std::string& Seen() const { return seen_; }
-  void CloseOutput() {
-    if (output_ >= 0) {
-      close(std::exchange(output_, -1));
-    }
-  }
-  // Reads until `text` has come; false when the output ends before.
-  bool ReadUntil(const std::string& text) {
-    char buffer[4096];
-    while (seen_.find(text) == std::string::npos) {
-      const ssize_t size = read(output_, buffer, sizeof buffer);
-      if (size <= 0) {
-        return false;
-      }
-      seen_.append(buffer, static_cast<size_t>(size));
-    }
-    return true;
-  }
-  // The exit status, or minus the signal's number.
-  int Wait() {
-    int status = 0;
-    waitpid(std::exchange(pid_, -1), &status, 0);
-    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
-  }
-
- private:
-  pid_t pid_;
-  int output_;
-  std::string seen_;
-};
 
 struct Outcome {
   int status;
@@ -123,14 +41,8 @@ struct Outcome {
 
 inline Outcome Execute(
     const Strings& argv, const fs::path& folder, const std::function<void()>& prepare = [] {}) {
-  Program program(argv, folder, prepare);
-  program.ReadUntil(std::string(1, '\0'));
-  Outcome outcome{program.Wait(), program.Seen(), {}};
-  std::istringstream in(outcome.text);
-  for (std::string line; std::getline(in, line);) {
-    outcome.lines.push_back(line);
-  }
-  return outcome;
+  const Ran ran = RunProgram(argv, folder, prepare);
+  return {ran.status, ran.out, Lines(ran.out)};
 }
 
 struct Options {
@@ -142,9 +54,7 @@ struct Options {
 class ArchiverFixture : public testing::Test {
  protected:
   void SetUp() override {
-    std::string path = fs::temp_directory_path() / "archiver_test_XXXXXX";
-    ASSERT_NE(mkdtemp(path.data()), nullptr);
-    root = path;
+    root = temp_.emplace().Path();
     fs::permissions(root, fs::perms::all);
     folder = share = root / "share";
     out = root / "out";
@@ -152,7 +62,7 @@ class ArchiverFixture : public testing::Test {
     fs::create_directories(share);
     fs::create_directories(out);
   }
-  void TearDown() override { fs::remove_all(root); }
+  void TearDown() override { temp_.reset(); }
 
   Strings CommandLine(const fs::path& archive, const Strings& sources,
                       const Options& options = {}) {
@@ -213,6 +123,9 @@ class ArchiverFixture : public testing::Test {
 
   fs::path root, share, out, list;
   fs::path folder;  // where the archiver is started
+
+ private:
+  std::optional<TempFolder> temp_;
 };
 
 }  // namespace ArchiverTest

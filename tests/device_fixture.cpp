@@ -46,80 +46,10 @@ constexpr char kConfig[] = R"({
 constexpr uid_t kAliceUid = 65001;
 const std::chrono::seconds kPatience(30 * kSlowness);
 
-void ReadEnd(int fd, std::string& text) {
-  std::array<char, 4096> block{};
-  for (ssize_t got = 0; (got = read(fd, block.data(), block.size())) > 0;) {
-    text.append(block.data(), static_cast<std::size_t>(got));
-  }
-}
-
-Strings Lines(const std::string& text) {
-  std::istringstream in(text);
-  Strings lines;
-  for (std::string line; std::getline(in, line);) {
-    lines.push_back(line);
-  }
-  return lines;
-}
-
 }  // namespace
-
-TempFolder::TempFolder() {
-  char name[] = "/tmp/kavo-test-XXXXXX";
-  path_ = mkdtemp(name);
-  chmod(path_.c_str(), 0755);
-}
-
-TempFolder::~TempFolder() {
-  std::error_code ignored;
-  fs::remove_all(path_, ignored);
-}
 
 std::string ModulePath() {
   return fs::read_symlink("/proc/self/exe").parent_path().string() + "/KAVO.Zantro.Compress.so";
-}
-
-Ran RunProgram(const Strings& arguments, const std::string& folder) {
-  const TempFolder temp;
-  const std::string err_path = temp.Path() + "/err";
-  std::array<int, 2> out{};
-  EXPECT_EQ(pipe2(out.data(), O_CLOEXEC), 0);
-  const pid_t pid = fork();
-  if (pid == 0) {
-    dup2(out[1], STDOUT_FILENO);
-    dup2(open(err_path.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
-    std::vector<char*> argv;
-    argv.reserve(arguments.size() + 1);
-    for (const std::string& argument : arguments) {
-      argv.push_back(const_cast<char*>(argument.c_str()));
-    }
-    argv.push_back(nullptr);
-    if (chdir(folder.c_str()) == 0) {
-      execv(argv[0], argv.data());
-    }
-    _exit(127);
-  }
-  close(out[1]);
-  Ran ran;
-  ReadEnd(out[0], ran.out);
-  close(out[0]);
-  int status = 0;
-  waitpid(pid, &status, 0);
-  ran.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-  ran.err = ReadFile(err_path);
-  return ran;
-}
-
-std::string ReadFile(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
-  std::ostringstream text;
-  text << file.rdbuf();
-  return text.str();
-}
-
-void WriteFile(const std::string& path, const std::string& text) {
-  fs::create_directories(fs::path(path).parent_path());
-  std::ofstream(path, std::ios::binary) << text;
 }
 
 Strings ExpectedSequence(const std::string& name) {

@@ -12,33 +12,8 @@
 
 #include "device/bodies/device.h"
 #include "device/host/launcher.h"
+#include "tests/programs.h"
 #include "tests/table.h"
-
-// A folder that others can walk into; removed with all that is in it.
-class TempFolder {
- public:
-  TempFolder();
-  ~TempFolder();
-  TempFolder(const TempFolder&) = delete;
-  TempFolder& operator=(const TempFolder&) = delete;
-
-  const std::string& Path() const { return path_; }
-
- private:
-  std::string path_;
-};
-
-// What a program printed and how it ended; a signal's number is shown as 128 and more.
-struct Ran {
-  int status = -1;
-  std::string out;
-  std::string err;
-};
-// Runs a program to its end; the path is taken as it is.
-Ran RunProgram(const Strings& arguments, const std::string& folder = "/");
-
-std::string ReadFile(const std::string& path);
-void WriteFile(const std::string& path, const std::string& text);
 
 // The built module, beside the test program.
 std::string ModulePath();

@@ -41,76 +41,67 @@ Function* Real(const char* name) {
   return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, name));
 }
 
-void WriteRaw(int fd, const char* text, std::size_t size) {
-  static auto* const real = Real<ssize_t(int, const void*, size_t)>("write");
-  (void)real(fd, text, size);
-}
-
 // One line of JSON on the stack.
 class TraceLine {
  public:
-  explicit TraceLine(const char* call) {
-    Add(R"({"pid":)");
-    AddNumber(getpid());
-    Add(R"(,"call":")");
-    Add(call);
-    Add(R"(","args":[)");
-  }
-  ~TraceLine() {
-    Add("]}\n");
-    if (trace_file >= 0) {
-      WriteRaw(trace_file, text_.data(), size_);
-    }
-    errno = saved_errno_;
-  }
-  TraceLine(const TraceLine&) = delete;
-  TraceLine& operator=(const TraceLine&) = delete;
-
-  TraceLine& Argument(const char* text) {
-    Add(is_first_ ? "\"" : ",\"");
-    for (; *text != 0; ++text) {
-      const auto byte = static_cast<unsigned char>(*text);
-      if (byte < ' ' || byte == '"' || byte == '\\') {
-        std::array<char, 8> code{};
-        std::snprintf(code.data(), code.size(), "\\u%04x", byte);
-        Add(code.data());
-      } else {
-        Put(*text);
-      }
-    }
-    Add("\"");
-    is_first_ = false;
-    return *this;
-  }
-  TraceLine& Argument(int number) {
-    Add(is_first_ ? "" : ",");
-    AddNumber(number);
-    is_first_ = false;
-    return *this;
-  }
-
- private:
-  void Put(char byte) {
-    if (size_ + 4 < text_.size()) {  // room for the end is kept
-      text_[size_++] = byte;
-    }
-  }
   void Add(const char* text) {
-    for (; *text != 0; ++text) {
-      size_ < text_.size() ? void(text_[size_++] = *text) : void();
+    for (; *text != 0 && size_ < text_.size(); ++text) {
+      text_[size_++] = *text;
     }
   }
-  void AddNumber(int number) {
+  void Add(int number) {
     std::array<char, 16> digits{};
     std::snprintf(digits.data(), digits.size(), "%d", number);
     Add(digits.data());
   }
+  void AddArgument(int number) {
+    Add(number);
+    Add(",");
+  }
+  void AddArgument(const char* text) {
+    Add("\"");
+    for (; *text != 0 && size_ + kRoom < text_.size(); ++text) {
+      const bool is_plain =
+          static_cast<unsigned char>(*text) >= ' ' && *text != '"' && *text != '\\';
+      std::array<char, 8> code{};
+      std::snprintf(code.data(), code.size(), is_plain ? "%c" : "\\u%04x", *text);
+      Add(code.data());
+    }
+    Add("\",");
+  }
+  void Write() {
+    size_ -= text_[size_ - 1] == ',' ? 1 : 0;
+    Add("]}\n");
+    if (trace_file >= 0) {
+      (void)Real<decltype(write)>("write")(trace_file, text_.data(), size_);
+    }
+  }
 
+ private:
+  static constexpr std::size_t kRoom = 16;
   std::array<char, 16384> text_;
   std::size_t size_ = 0;
-  bool is_first_ = true;
-  int saved_errno_ = errno;
 };
+
+// True, and traced, when it is the module that calls.
+template <typename... Arguments>
+bool IsModules(const void* caller, const char* call, Arguments... arguments) {
+  if (module_base == nullptr || BaseOf(caller) != module_base) {
+    return false;
+  }
+  const int saved_errno = errno;
+  TraceLine line;
+  line.Add(R"({"pid":)");
+  line.Add(getpid());
+  line.Add(R"(,"call":")");
+  line.Add(call);
+  line.Add(R"(","args":[)");
+  (line.AddArgument(arguments), ...);
+  line.Write();
+  errno = saved_errno;
+  return true;
+}
+#define IS_MODULES(...) IsModules(__builtin_return_address(0), __VA_ARGS__)
 
 bool Fails(const char* call, const char* argument) {
   if (armed.call != call || std::strstr(argument, armed.part.c_str()) == nullptr) {
@@ -181,135 +172,90 @@ void syslog(int priority, const char* format, ...) {
   va_start(arguments, format);
   std::vsnprintf(line.data() + start, line.size() - start - 1, format, arguments);
   va_end(arguments);
-  if (IsModule(__builtin_return_address(0))) {
-    const TraceLine trace("syslog");
-  }
+  IS_MODULES("syslog");
   const std::size_t size = std::strlen(line.data());
   line[size] = '\n';
-  WriteRaw(log_file, line.data(), size + 1);
+  (void)Real<decltype(write)>("write")(log_file, line.data(), size + 1);
 }
 
 int mkstemp(char* name) {
-  static auto* const real = Real<int(char*)>("mkstemp");
-  if (!IsModule(__builtin_return_address(0))) {
-    return real(name);
-  }
-  TraceLine("mkstemp").Argument(name);
-  const int fd = Fails("mkstemp", name) ? -1 : real(name);
-  if (fd >= 0) {
-    NoteMade(name);
-  }
+  const bool is_modules = IS_MODULES("mkstemp", name);
+  const int fd =
+      is_modules && Fails("mkstemp", name) ? -1 : Real<decltype(mkstemp)>("mkstemp")(name);
+  is_modules&& fd >= 0 ? NoteMade(name) : void();
   return fd;
 }
 
 char* mkdtemp(char* name) {
-  static auto* const real = Real<char*(char*)>("mkdtemp");
-  if (!IsModule(__builtin_return_address(0))) {
-    return real(name);
+  const bool is_modules = IS_MODULES("mkdtemp", name);
+  if (is_modules && Fails("mkdtemp", name)) {
+    return nullptr;
   }
-  TraceLine("mkdtemp").Argument(name);
-  char* const made = Fails("mkdtemp", name) ? nullptr : real(name);
-  if (made != nullptr) {
-    NoteMade(name);
-  }
+  char* const made = Real<decltype(mkdtemp)>("mkdtemp")(name);
+  is_modules&& made != nullptr ? NoteMade(name) : void();
   return made;
 }
 
 int chdir(const char* path) {
-  static auto* const real = Real<int(const char*)>("chdir");
-  if (!IsModule(__builtin_return_address(0))) {
-    return real(path);
-  }
-  TraceLine("chdir").Argument(path);
-  return Fails("chdir", path) ? -1 : real(path);
+  const bool fails = IS_MODULES("chdir", path) && Fails("chdir", path);
+  return fails ? -1 : Real<decltype(chdir)>("chdir")(path);
 }
 
 int stat(const char* path, struct stat* status) {
-  if (!IsModule(__builtin_return_address(0))) {
-    return fstatat(AT_FDCWD, path, status, 0);
-  }
-  TraceLine("stat").Argument(path);
-  return Fails("stat", path) ? -1 : fstatat(AT_FDCWD, path, status, 0);
+  const bool fails = IS_MODULES("stat", path) && Fails("stat", path);
+  return fails ? -1 : fstatat(AT_FDCWD, path, status, 0);
 }
 
 int lstat(const char* path, struct stat* status) {
-  if (IsModule(__builtin_return_address(0))) {
-    TraceLine("lstat").Argument(path);
-  }
+  IS_MODULES("lstat", path);
   return fstatat(AT_FDCWD, path, status, AT_SYMLINK_NOFOLLOW);
 }
 
 int access(const char* path, int mode) {
-  if (IsModule(__builtin_return_address(0))) {
-    TraceLine("access").Argument(path).Argument(mode);
-  }
+  IS_MODULES("access", path, mode);
   return faccessat(AT_FDCWD, path, mode, 0);
 }
 
 int symlink(const char* target, const char* link) {
-  if (!IsModule(__builtin_return_address(0))) {
-    return symlinkat(target, AT_FDCWD, link);
-  }
-  TraceLine("symlink").Argument(target).Argument(link);
-  return Fails("symlink", target) ? -1 : symlinkat(target, AT_FDCWD, link);
+  const bool fails = IS_MODULES("symlink", target, link) && Fails("symlink", target);
+  return fails ? -1 : symlinkat(target, AT_FDCWD, link);
 }
 
 int unlink(const char* path) {
-  if (IsModule(__builtin_return_address(0))) {
-    TraceLine("unlink").Argument(path);
-  }
+  IS_MODULES("unlink", path);
   return unlinkat(AT_FDCWD, path, 0);
 }
 
 ssize_t write(int fd, const void* data, size_t size) {
-  static auto* const real = Real<ssize_t(int, const void*, size_t)>("write");
-  if (!IsModule(__builtin_return_address(0))) {
-    return real(fd, data, size);
-  }
-  const std::string text(static_cast<const char*>(data), size);
-  TraceLine("write").Argument(text.c_str());
-  return real(fd, data, Fails("write", text.c_str()) ? size - 1 : size);
+  const auto* const text = static_cast<const char*>(data);  // the module's ends with a zero
+  const bool fails = IS_MODULES("write", text) && Fails("write", text);
+  return Real<decltype(write)>("write")(fd, data, fails ? size - 1 : size);
 }
 
 int close(int fd) {
-  static auto* const real = Real<int(int)>("close");
-  if (IsModule(__builtin_return_address(0))) {
-    const TraceLine trace("close");
-  }
-  return real(fd);
+  IS_MODULES("close");
+  return Real<decltype(close)>("close")(fd);
 }
 
 int kill(pid_t pid, int signal_number) noexcept {
-  static auto* const real = Real<int(pid_t, int)>("kill");
-  if (IsModule(__builtin_return_address(0))) {
-    TraceLine("kill").Argument(pid).Argument(signal_number);
-  }
-  return real(pid, signal_number);
+  IS_MODULES("kill", pid, signal_number);
+  return Real<int(pid_t, int)>("kill")(pid, signal_number);
 }
 
 sighandler_t signal(int signal_number, sighandler_t handler) noexcept {
-  static auto* const real = Real<sighandler_t(int, sighandler_t)>("signal");
-  if (IsModule(__builtin_return_address(0))) {
-    TraceLine("signal").Argument(signal_number);
-  }
-  return real(signal_number, handler);
+  IS_MODULES("signal", signal_number);
+  return Real<sighandler_t(int, sighandler_t)>("signal")(signal_number, handler);
 }
 
 void exit(int status) noexcept {
-  if (IsModule(__builtin_return_address(0))) {
-    TraceLine("exit").Argument(status);
-  }
+  IS_MODULES("exit", status);
   Real<void(int)>("exit")(status);
   abort();
 }
 
 void _exit(int status) {  // NOLINT: the system's name
-  if (IsModule(__builtin_return_address(0))) {
-    TraceLine("_exit").Argument(status);
-  }
-  if (dump_coverage != nullptr) {
-    dump_coverage();
-  }
+  IS_MODULES("_exit", status);
+  dump_coverage != nullptr ? dump_coverage() : void();
   Real<void(int)>("_exit")(status);
   abort();
 }

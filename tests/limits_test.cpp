@@ -46,10 +46,18 @@ class LimitTest : public DeviceTest {
 };
 
 TEST_F(LimitTest, FullVolume) {
-  ASSERT_EQ(mount("tmpfs", folder_.c_str(), "tmpfs", 0, "size=8m"), 0);
-  Open();
-  EXPECT_EQ(Fail(), Strings{"/photo/limited/z.zip: 416"});
-  EXPECT_TRUE(fs::is_empty(folder_));
+  const std::string big(900000, 'x');
+  Add("vol1/photo/日", big);
+  Json::Value params = JobParams({"/photo/日"}, "/photo/limited/z.zip");
+  params["level"] = "store";
+  params["codepage"] = "CP932";
+  for (const char* size : {"size=500k", "size=1500k"}) {  // one more copy, to recode, has no room
+    ASSERT_EQ(mount("tmpfs", folder_.c_str(), "tmpfs", 0, size), 0);
+    Open();
+    EXPECT_EQ(FailJob(params), Strings{"/photo/limited/z.zip: 416"});
+    EXPECT_TRUE(fs::is_empty(folder_));
+    ASSERT_EQ(umount(folder_.c_str()), 0);
+  }
 }
 
 TEST_F(LimitTest, ReadOnlyVolume) {

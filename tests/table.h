@@ -10,7 +10,7 @@
 #include <string>
 #include <vector>
 
-using Strings = std::vector<std::string>;
+#include "tests/programs.h"
 
 struct TableRow {
   // The first value of the key, or the fallback.
