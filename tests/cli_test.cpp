@@ -57,6 +57,15 @@ TEST_F(CliTest, CallAnswersOnOneLineAndDoesNotWaitForTheWorker) {
   EXPECT_EQ(Kavo({"tasks", device_, "--user", "alice"}).out, "");
 }
 
+TEST_F(CliTest, WhatCallAcceptsTheTaskListReadsBack) {
+  const std::string deep(Device::kParamDepth, '[');
+  EXPECT_EQ(Kavo({"call", device_, "--user", "alice", "start", "path=/photo/a", "dest_file_path=/z",
+                  "mode:=" + deep + std::string(deep.size(), ']')})
+                .status,
+            0);
+  EXPECT_THAT(Kavo({"tasks", device_, "--user", "alice"}).out, HasSubstr("Zantro_"));
+}
+
 TEST_F(CliTest, NobodyFollowsACallSoTheDesktopIsNotified) {
   Add("vol1/photo/a.txt", "a");
   EXPECT_EQ(Kavo({"call", device_, "--user", "alice", "start", "path=/photo/a.txt",
@@ -120,6 +129,9 @@ const UsageRow kUsage[] = {
     {"ParameterWithoutName", {"call", "DEV", "--user", "alice", "status", "=x"}, "parameter '=x'"},
     {"ParameterIsNoJson", {"call", "DEV", "--user", "alice", "status", "x:={"},
      "parameter 'x': line 1"},
+    {"ParameterIsNestedTooDeep",
+     {"call", "DEV", "--user", "alice", "status", "x:=\n" + std::string(1000, '[')},
+     "parameter 'x': line 2: nested too deep\n"},
     {"UnknownOperation", {"call", "DEV", "--user", "alice", "status", "--fault", "Lumo=1"},
      "fault rule 'Lumo=1': no operation 'Lumo'"},
     {"RuleWithoutResult", {"call", "DEV", "--user", "alice", "status", "--fault", "DoKill"},

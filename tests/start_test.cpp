@@ -37,6 +37,8 @@ constexpr char kTwoDestinations[] =
 constexpr char kNoSource[] = "Bad parameter: no input source file";
 const std::string kName256 =
     R"({"path":"/photo/a","dest_file_path":"/photo/)" + std::string(256, 'n') + "\"}";
+const std::string kLongWord =
+    R"({"path":"[)" + std::string(1 << 20, '1') + R"(x]","dest_file_path":"/photo/z"})";
 
 INSTANTIATE_TEST_SUITE_P(
     Parameters, StartRefuses,
@@ -52,6 +54,7 @@ INSTANTIATE_TEST_SUITE_P(
                    101, kNoSource},
            Refusal{"BrokenArray", R"({"path":"[\"/photo/a\"","dest_file_path":"/photo/z"})", 101,
                    kNoSource},
+           Refusal{"BrokenArrayWithALongWord", kLongWord.c_str(), 101, kNoSource},
            Refusal{"TwoDestinations", R"({"path":"/photo/a","dest_file_path":"/photo/b,/photo/c"})",
                    101, kTwoDestinations},
            Refusal{"CommaInFirstVersion",
