@@ -7,6 +7,8 @@
 
 #include "tests/fuzz/targets.h"
 
+void PrintTo(const FuzzTarget& target, std::ostream* out) { *out << target.name; }
+
 namespace {
 
 class CorpusTest : public testing::TestWithParam<FuzzTarget> {};
