@@ -40,7 +40,10 @@ class FuzzDevice {
                             "users": [{"name": "alice", "uid": 65001, "home": "vol1"}]})");
     Device::Open(path_);
   }
-  ~FuzzDevice() { std::filesystem::remove_all(path_); }
+  ~FuzzDevice() {
+    std::error_code ignored;
+    std::filesystem::remove_all(path_, ignored);
+  }
   FuzzDevice(const FuzzDevice&) = delete;
   FuzzDevice& operator=(const FuzzDevice&) = delete;
 
@@ -56,18 +59,16 @@ Device::TaskStore& Store() {
 Json::Value ReadScene(const std::string& input) {
   Json::Value scene(Json::objectValue);
   for (const std::string& line : SplitAt('\n', input)) {
+    const std::size_t colon = line.find(":=");
     const std::size_t equals = line.find('=');
-    if (equals == 0 || equals == std::string::npos) {
-      continue;
-    }
-    const std::string value = line.substr(equals + 1);
-    try {
-      if (line[equals - 1] == ':') {
-        scene[line.substr(0, equals - 1)] = Device::ParseJson(value);
-      } else {
-        scene[line.substr(0, equals)] = value;
+    if (colon != std::string::npos) {
+      try {
+        scene[line.substr(0, colon)] =
+            Device::ParseJson(line.substr(colon + 2), Device::kParamDepth);
+      } catch (const std::runtime_error&) {  // no JSON: not there
       }
-    } catch (const std::runtime_error&) {  // not there, then
+    } else if (equals != std::string::npos) {
+      scene[line.substr(0, equals)] = line.substr(equals + 1);
     }
   }
   return scene;
