@@ -10,9 +10,14 @@ namespace Device {
 
 std::string ToText(const Json::Value& value);
 
+// How deep arrays and objects may lie in each other: in a text, and in a parameter, which tasks and
+// trace lines hold within objects of their own.
+inline constexpr int kTextDepth = 1000;
+inline constexpr int kParamDepth = kTextDepth - 10;
+
 // Throws std::runtime_error, with line and reason, for a text that is no JSON. Comments, trailing
 // commas and repeated keys are refused.
-Json::Value ParseJson(const std::string& text);
+Json::Value ParseJson(const std::string& text, int depth = kTextDepth);
 
 }  // namespace Device
 

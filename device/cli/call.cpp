@@ -24,7 +24,7 @@ void AddParam(const std::string& text, Json::Value& params) {
   }
   const std::string name = text.substr(0, equals - 1);
   try {
-    params[name] = ParseJson(value);
+    params[name] = ParseJson(value, kParamDepth);
   } catch (const std::exception& error) {
     throw std::runtime_error("parameter '" + name + "': " + error.what());
   }

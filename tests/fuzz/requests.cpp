@@ -1,0 +1,166 @@
+// The module's methods, linked into this program, on a device in a temporary folder; nothing forks.
+// An input is lines NAME=TEXT and NAME:=JSON: the request's parameters, and among them `version`,
+// `faults` (a bit for each of kRules), and what the task Zantro_1 holds: `data`, `progress`,
+// `finished`.
+#include <syslog.h>
+#include <unistd.h>
+
+#include <climits>
+#include <filesystem>
+#include <set>
+
+#include "device/bodies/device.h"
+#include "device/bodies/json_text.h"
+#include "device/bodies/operations.h"
+#include "device/bodies/task_store.h"
+#include "device/host/request_state.h"
+#include "tests/fuzz/targets.h"
+
+extern "C" void* GetAPITable();
+
+namespace {
+
+constexpr char kTask[] = "Zantro_1";
+constexpr const char* kRules[] = {
+    "KLIBCProcFork=-1",         "Vesk::TaskMgr::getTaskWithThrow=throw",
+    "Vesk::Task::endUpdate=0",  "Vesk::TaskMgr::getUniqueTaskId=throw",
+    "Vesk::Task::Task=throw",   "KavoSettings::loadUserJsonSettings=0",
+    "LumoLibUGIDSet=-1:402",    "DoKill=0",
+    "Vesk::Task::setProperty=0"};
+constexpr unsigned kNoFork = 1;
+constexpr unsigned kNoTask = 2;
+constexpr unsigned kNoData = 256;
+
+class FuzzDevice {
+ public:
+  FuzzDevice() {
+    setlogmask(LOG_MASK(LOG_EMERG));
+    Require(mkdtemp(path_.data()) != nullptr, "there is a temporary folder");
+    Device::Make(path_, R"({"volumes": ["vol1"], "shares": [],
+                            "users": [{"name": "alice", "uid": 65001, "home": "vol1"}]})");
+    Device::Open(path_);
+  }
+  ~FuzzDevice() {
+    std::error_code ignored;
+    std::filesystem::remove_all(path_, ignored);
+  }
+  FuzzDevice(const FuzzDevice&) = delete;
+  FuzzDevice& operator=(const FuzzDevice&) = delete;
+
+ private:
+  std::string path_ = std::filesystem::temp_directory_path() / "kavo-fuzz-XXXXXX";
+};
+
+Device::TaskStore& Store() {
+  static const FuzzDevice device;
+  return Device::StoreOf("alice");
+}
+
+Json::Value ReadScene(const std::string& input) {
+  Json::Value scene(Json::objectValue);
+  for (const std::string& line : SplitAt('\n', input)) {
+    const std::size_t colon = line.find(":=");
+    const std::size_t equals = line.find('=');
+    if (colon != std::string::npos) {
+      try {
+        scene[line.substr(0, colon)] =
+            Device::ParseJson(line.substr(colon + 2), Device::kParamDepth);
+      } catch (const std::runtime_error&) {  // no JSON: not there
+      }
+    } else if (equals != std::string::npos) {
+      scene[line.substr(0, equals)] = line.substr(equals + 1);
+    }
+  }
+  return scene;
+}
+
+unsigned Faults(const Json::Value& scene) {
+  return scene["faults"].isUInt() ? scene["faults"].asUInt() : 0;
+}
+
+// INT_MIN as the code when an exception for the host left the module.
+Device::Outcome Serve(const Json::Value& scene, const std::string& method,
+                      const std::set<int>& codes) {
+  Device::StopWatching();
+  for (std::size_t rule = 0; rule < std::size(kRules); ++rule) {
+    if ((Faults(scene) >> rule & 1U) != 0) {
+      Device::AddFault(kRules[rule]);
+    }
+  }
+  const Json::Value& data = scene["data"];
+  if (!data.isObject() || !data.isMember("pid")) {
+    Device::AddFault("WaitForTaskDataKeyReady=0");  // without the minute's wait
+  }
+  for (const char* rule : {"LumoLibUGIDSet=0", "KLIBCProcFork=2147483647", "DoKill=1",
+                           "KAVO::APIResponse::SetError#2=throw"}) {
+    Device::AddFault(rule);
+  }
+  const Json::Value& version = scene["version"];
+  Device::Request request;
+  request.method = method;
+  request.version = version == 1 || version == 2 ? version.asInt() : 3;
+  request.params = scene;
+  request.user = "alice";
+  KAVO::APIRequest::State request_state{request};
+  KAVO::APIResponse::State state{{INT_MIN, {}}};
+  KAVO::APIRequest api_request{&request_state};
+  KAVO::APIResponse api_response{&state};
+  bool threw = false;
+  try {
+    static_cast<const Device::ApiRow*>(GetAPITable())->handler(&api_request, &api_response);
+  } catch (const Json::Exception&) {
+    threw = true;
+  }
+  Require(threw == (state.outcome.code == INT_MIN), "a request has one outcome or throws");
+  Require(threw || codes.count(state.outcome.code) != 0, "the code is one of the method's");
+  return state.outcome;
+}
+
+void PutTask(const Json::Value& scene) {
+  std::map<std::string, std::string> properties;
+  for (const char* name : {"data", "progress"}) {
+    if (!scene[name].isNull()) {
+      properties[name] = Device::ToText(scene[name]);
+    }
+  }
+  Store().RemoveTask(kTask);
+  Store().AddTask(kTask, properties);
+  Store().UpdateTask(kTask, {}, scene["finished"] == true);
+}
+
+}  // namespace
+
+void FuzzStartRequest(const std::string& input) {
+  const Json::Value scene = ReadScene(input);
+  Store();
+  const Device::Outcome outcome = Serve(scene, "start", {0, 101, 401, 402, 1300, 1301});
+  const std::vector<Device::TaskRow> tasks = Store().AllTasks();
+  for (const Device::TaskRow& task : tasks) {
+    Store().RemoveTask(task.id);
+  }
+  const bool has_task =
+      outcome.code == 0 || (outcome.code == 1300 && (Faults(scene) & kNoFork) == 0);
+  Require(tasks.size() == (has_task ? 1U : 0U), "a job that has begun has a task, and no other");
+  if (outcome.code != 0 || (Faults(scene) & kNoData) != 0) {
+    return;
+  }
+  Require(outcome.data["taskid"] == tasks[0].id, "the answer names the task");
+  const Json::Value params = Device::ParseJson(tasks[0].properties.at("data"))["params"];
+  Require(!params["path"].empty() && !params["path"][0].asString().empty(), "there is a source");
+  Require(!params["dest_file_path"].asString().empty(), "there is a destination");
+  Require(Device::ToText(params["password"]) == Device::ToText(scene["password"]),
+          "a password is stored as it was given");
+}
+
+void FuzzTaskRequest(const std::string& input) {
+  const Json::Value scene = ReadScene(input);
+  PutTask(scene);
+  const Json::Value answer = Serve(scene, "status", {0, 101, 401, 402, 599}).data;
+  Require(!answer["finished"].asBool() || !Store().FindTask(kTask), "an end is reported once");
+  PutTask(scene);
+  const int code = Serve(scene, "stop", {0, 101, 401, 402}).code;
+  const Json::Value& id = scene["taskid"];
+  const bool is_meant = id.isString() && std::string(id.asCString()) == kTask;
+  const bool is_stopped = is_meant && (Faults(scene) & kNoTask) == 0 && (code == 0 || code == 401);
+  Require(!Store().FindTask(kTask) == is_stopped, "what is stopped is removed, and nothing else");
+}

@@ -1,0 +1,47 @@
+// What a fuzzer, and the suite over tests/corpus, feed with any bytes. Each target throws when a
+// property does not hold, and lets out whatever the code under it should not have thrown.
+#ifndef TESTS_FUZZ_TARGETS_H_
+#define TESTS_FUZZ_TARGETS_H_
+
+#include <sstream>
+#include <stdexcept>
+#include <string>
+#include <vector>
+
+void FuzzArchiverCommandLine(const std::string& input);
+void FuzzArchiverOutput(const std::string& input);
+void FuzzDeviceConfig(const std::string& input);
+void FuzzStagingList(const std::string& input);
+void FuzzStartRequest(const std::string& input);
+void FuzzTaskRequest(const std::string& input);
+
+struct FuzzTarget {
+  const char* name;  // of its folder in tests/corpus
+  void (*run)(const std::string& input);
+};
+inline constexpr FuzzTarget kFuzzTargets[] = {
+    {"archiver_command_line", FuzzArchiverCommandLine},
+    {"archiver_output", FuzzArchiverOutput},
+    {"device_config", FuzzDeviceConfig},
+    {"staging_list", FuzzStagingList},
+    {"start_request", FuzzStartRequest},
+    {"task_request", FuzzTaskRequest},
+};
+
+inline void Require(bool holds, const char* property) {
+  if (!holds) {
+    throw std::logic_error(std::string("does not hold: ") + property);
+  }
+}
+
+// The parts between separators, the last one included.
+inline std::vector<std::string> SplitAt(char separator, const std::string& text) {
+  std::vector<std::string> parts;
+  std::istringstream stream(text + separator);
+  for (std::string part; std::getline(stream, part, separator);) {
+    parts.push_back(part);
+  }
+  return parts;
+}
+
+#endif  // TESTS_FUZZ_TARGETS_H_
