@@ -21,6 +21,7 @@
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
+#include "device/host/sessions.h"
 #include "tests/emulation.h"
 #include "tests/libc_calls.h"
 

@@ -238,24 +238,36 @@ void TaskStore::AddNotification(const NotificationRow& row) {
       .Step();
 }
 
-std::vector<NotificationRow> TaskStore::AllNotifications() {
+std::vector<NotificationRow> TaskStore::NotificationsAfter(std::int64_t number) {
   std::vector<NotificationRow> rows;
   Statement select(database_.get(),
-                   "SELECT time, app, task, title, message, arguments FROM notifications "
-                   "ORDER BY rowid");
+                   "SELECT rowid, time, app, task, title, message, arguments FROM notifications "
+                   "WHERE rowid > ? ORDER BY rowid");
+  select.Bind(number);
   while (select.Step()) {
     NotificationRow row;
-    row.time = select.Number(0);
-    row.app = select.Text(1);
-    row.task = select.Text(2);
-    row.title = select.Text(3);
-    row.message = select.Text(4);
-    for (const Json::Value& argument : ParseJson(select.Text(5))) {
+    row.number = select.Number(0);
+    row.time = select.Number(1);
+    row.app = select.Text(2);
+    row.task = select.Text(3);
+    row.title = select.Text(4);
+    row.message = select.Text(5);
+    for (const Json::Value& argument : ParseJson(select.Text(6))) {
       row.arguments.push_back(argument.asString());
     }
     rows.push_back(std::move(row));
   }
   return rows;
+}
+
+std::int64_t TaskStore::LastNotification() {
+  Statement select(database_.get(), "SELECT ifnull(max(rowid), 0) FROM notifications");
+  return select.Step() ? select.Number(0) : 0;
+}
+
+std::int64_t TaskStore::Version() {
+  Statement select(database_.get(), "PRAGMA data_version");
+  return select.Step() ? select.Number(0) : 0;
 }
 
 void TaskStore::AddToIndex(const std::string& path) {

@@ -25,7 +25,8 @@ struct TaskRow {
 };
 
 struct NotificationRow {
-  std::int64_t time = 0;  // seconds since 1970
+  std::int64_t number = 0;  // from 1 on, in the order of sending
+  std::int64_t time = 0;    // seconds since 1970
   std::string app;
   std::string task;
   std::string title;
@@ -55,7 +56,12 @@ class TaskStore {
   void RemoveWorker(pid_t pid);
 
   void AddNotification(const NotificationRow& row);
-  std::vector<NotificationRow> AllNotifications();
+  // Those behind the one of that number; all behind 0.
+  std::vector<NotificationRow> NotificationsAfter(std::int64_t number);
+  std::int64_t LastNotification();
+
+  // A number that changes whenever another connection has changed the store.
+  std::int64_t Version();
 
   void AddToIndex(const std::string& path);
 

@@ -169,7 +169,7 @@ void Task::remove() {
 
 void Task::sendNotifyMessageNoEncode(const char* app, const char* task_id, const char* title,
                                      const char* message, ...) {
-  Device::NotificationRow row{std::time(nullptr), app, task_id, title, message, {}};
+  Device::NotificationRow row{0, std::time(nullptr), app, task_id, title, message, {}};
   va_list arguments;
   va_start(arguments, message);
   for (std::size_t count = ArgumentCount(message); count > 0; --count) {
