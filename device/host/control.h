@@ -14,7 +14,7 @@ namespace Device {
 inline constexpr std::size_t kMostControlBytes = 8192;
 
 enum class ControlKind : char {
-  kListening = 'l',  // text: the address to open; no stream
+  kListening = 'l',  // text: ADDRESS:PORT; no stream
   kRequest = 'r',    // the request comes as a frame on the stream; a process of its own reads it
   kSignIn = 'i',     // text: {"user","password"}
   kSignOut = 'o'     // text: the session's id

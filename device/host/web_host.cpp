@@ -170,8 +170,10 @@ bool WebHost::TakeMessage() {
   switch (message->kind) {
     case ControlKind::kListening:
       is_listening_ = true;
-      if (!is_said_) {
-        std::cout << "serving '" << TheDevice().root << "' on " << message->text << std::endl;
+      if (listen_ != message->text || !is_said_) {
+        listen_ = message->text;  // where any free port was asked for, this one from now on
+        std::cout << "serving '" << TheDevice().root << "' on http://" << listen_ << '/'
+                  << std::endl;
         is_said_ = true;
       }
       break;

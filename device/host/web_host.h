@@ -65,7 +65,7 @@ class WebHost {
   void EndDeadTasksOfAll();
 
   const FrontEndFiles& files_;
-  const std::string listen_;
+  std::string listen_;
   FileDescriptor lock_;
   FileDescriptor signals_;
   sigset_t saved_mask_{};

@@ -92,14 +92,21 @@ const char* ReasonFor(int status) {
   }
 }
 
-// The body as it came: the library would cut a long form. Nothing when it is too long.
-std::optional<std::string> ReadBody(const httplib::ContentReader& reader) {
-  std::string body;
+// The body as it came: the library would cut a long form. False, with the response's status, when
+// it is too long or breaks off.
+bool ReadBody(const httplib::ContentReader& reader, std::string& body, Response& response) {
+  bool is_too_long = false;
   const bool is_read = reader([&](const char* data, std::size_t size) {
-    body.append(data, size);
-    return body.size() <= kMostBodyBytes;
+    is_too_long = is_too_long || body.size() + size > kMostBodyBytes;
+    if (!is_too_long) {
+      body.append(data, size);
+    }
+    return true;  // to its end, where the connection's next request begins
   });
-  return is_read ? std::optional(std::move(body)) : std::nullopt;
+  if (is_too_long) {
+    response.status = Device::kHttpTooLarge;
+  }
+  return is_read && !is_too_long;
 }
 
 std::string EventText(const Json::Value& frame) {
@@ -168,6 +175,10 @@ void FrontEnd::AddRoutes() {
     });
   }
   server_.Get("/files", [](const Request& request, Response& response) {
+    if (!request.has_param("path")) {
+      Refuse(response, Device::kHttpBadRequest, "'path' is missing");
+      return;
+    }
     Json::Value asked = Asked(request, "files");
     asked["path"] = request.get_param_value("path");
     Pass(asked, response);
@@ -182,16 +193,14 @@ void FrontEnd::Post(const char* route,
   server_.Post(route, [this, handler](const Request& request, Response& response,
                                       const httplib::ContentReader& reader) {
     ++serving_;
-    const std::optional<std::string> body = ReadBody(reader);
-    if (!body) {
-      response.status = response.status > 0 ? response.status : int{Device::kHttpTooLarge};
-    } else {
-      try {
-        (this->*handler)(request, ParseBody(request.get_header_value("Content-Type"), *body),
+    std::string body;
+    try {
+      if (ReadBody(reader, body, response)) {
+        (this->*handler)(request, ParseBody(request.get_header_value("Content-Type"), body),
                          response);
-      } catch (const std::runtime_error& error) {
-        Refuse(response, Device::kHttpBadRequest, error.what());
       }
+    } catch (const std::runtime_error& error) {
+      Refuse(response, Device::kHttpBadRequest, error.what());
     }
     --serving_;
   });

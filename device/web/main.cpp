@@ -94,9 +94,8 @@ void Serve(const std::string& listen, int page) {
   }
   sigprocmask(SIG_BLOCK, &ending, nullptr);
   std::thread([&] { WaitForTheEnd(ending, front_end); }).detach();
-  const std::string url =
-      "http://" + listen.substr(0, listen.rfind(':')) + ":" + std::to_string(port) + "/";
-  Device::SendControl(STDIN_FILENO, Device::ControlKind::kListening, url, -1);
+  const std::string bound = listen.substr(0, listen.rfind(':') + 1) + std::to_string(port);
+  Device::SendControl(STDIN_FILENO, Device::ControlKind::kListening, bound, -1);
   front_end.Listen();
 }
 
