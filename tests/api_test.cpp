@@ -13,6 +13,7 @@
 
 #include "device/bodies/operations.h"
 #include "device/host/request_state.h"
+#include "device/host/sessions.h"
 #include "tests/device_fixture.h"
 
 // Null without the leak checker.
