@@ -2,11 +2,14 @@
 
 #include <poll.h>
 
+#include <algorithm>
 #include <map>
+#include <vector>
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/task_store.h"
 #include "device/bodies/task_view.h"
+#include "device/bodies/workers.h"
 #include "device/host/frame.h"
 #include "device/host/sessions.h"
 
@@ -19,21 +22,44 @@ constexpr int kPauseMs = 200;
 class Watcher {
  public:
   Watcher(int stream, std::string user)
-      : stream_(stream), user_(std::move(user)), last_(StoreOf(user_).LastNotification()) {}
+      : stream_(stream), user_(std::move(user)), last_(StoreOf(user_).LastNotification()) {
+    EndDeadTasks(user_);
+  }
 
   // False when nobody reads any more.
   bool Look() {
-    EndDeadTasks(user_);
+    EndTasksOfLostWorkers();
     const std::int64_t version = StoreOf(user_).Version();
     if (version != version_) {
       SendTasks();
       SendNotifications();
+      FindWorkers();
     }
     version_ = version;
     return is_read_;
   }
 
  private:
+  void FindWorkers() {
+    workers_.clear();
+    for (const pid_t pid : StoreOf(user_).AllWorkers()) {
+      if (IsWorkerAlive(user_, pid)) {
+        workers_.push_back(pid);
+      }
+    }
+  }
+
+  // Tasks are read only when a worker has gone: they can be large.
+  void EndTasksOfLostWorkers() {
+    const auto is_lost = [&](pid_t pid) { return !IsWorkerAlive(user_, pid); };
+    const auto lost = std::remove_if(workers_.begin(), workers_.end(), is_lost);
+    if (lost != workers_.end()) {
+      workers_.erase(lost, workers_.end());
+      EndDeadTasks(user_);
+      version_ = -1;  // this process's own changes do not count as such
+    }
+  }
+
   void Send(const char* event, const Json::Value& data) {
     Json::Value frame(Json::objectValue);
     frame["event"] = event;
@@ -78,8 +104,9 @@ class Watcher {
 
   int stream_;
   std::string user_;
-  std::int64_t last_;          // notification that was sent
-  std::int64_t version_ = -1;  // of the store, when it was looked at
+  std::int64_t last_;           // notification that was sent
+  std::int64_t version_ = -1;   // of the store, when it was looked at
+  std::vector<pid_t> workers_;  // that were alive
   std::map<std::string, Json::Value> tasks_;
   bool is_read_ = true;
 };
