@@ -1,0 +1,69 @@
+// The sign-in form.
+import { Refusal, signIn } from './api.js';
+import { byId, setText } from './dom.js';
+import { counted } from './format.js';
+
+const UNAUTHORIZED = 401;
+const TOO_MANY = 429;
+
+const view = byId('sign-in');
+const form = byId('sign-in-form');
+const error = byId('sign-in-error');
+const user = byId('user');
+const password = byId('sign-in-password');
+
+export class SignIn {
+  #onSignedIn;
+  #isSending = false;
+
+  constructor({ onSignedIn }) {
+    this.#onSignedIn = onSignedIn;
+    form.addEventListener('submit', (event) => {
+      event.preventDefault();
+      this.#submit();
+    });
+  }
+
+  show(message) {
+    view.hidden = false;
+    document.title = 'Sign in';
+    password.value = '';
+    setText(error, message);
+    (user.value ? password : user).focus();
+  }
+
+  hide() {
+    view.hidden = true;
+    password.value = '';
+  }
+
+  async #submit() {
+    if (this.#isSending) return;
+    setText(error, '');
+    if (!user.value || !password.value) {
+      setText(error, 'Give your user name and password.');
+      (user.value ? password : user).focus();
+      return;
+    }
+    this.#isSending = true;
+    form.setAttribute('aria-busy', 'true');
+    try {
+      this.#onSignedIn(await signIn(user.value, password.value));
+    } catch (refusal) {
+      if (!(refusal instanceof Refusal)) throw refusal;
+      setText(error, reasonOf(refusal));
+      password.select();
+      password.focus();
+    } finally {
+      this.#isSending = false;
+      form.removeAttribute('aria-busy');
+    }
+  }
+}
+
+function reasonOf({ status, retryAfter, message }) {
+  if (status === UNAUTHORIZED) return 'Wrong user name or password.';
+  if (status !== TOO_MANY) return `Signing in did not work: ${message}.`;
+  const when = retryAfter > 0 ? `in ${counted(retryAfter, 'second')}` : 'later';
+  return `Too many wrong passwords. Try again ${when}.`;
+}
