@@ -29,8 +29,8 @@ const dialog = new CompressDialog({
   onStarted: (taskid) => {
     tasks.expect(taskid);
     tray.clear();
-    // The button that had opened the dialog may have been disabled with its focus.
-    if (document.activeElement === document.body) files.focus();
+    // The button that opened the dialog has the focus again, but with an empty tray it may be disabled.
+    if (byId('compress').disabled) files.focus();
   },
 });
 const signInForm = new SignIn({ onSignedIn: (signedIn) => enter(signedIn) });
@@ -39,7 +39,7 @@ const events = new Events({
   gone: ({ taskid }) => tasks.remove(taskid),
   notification: (notification) => tasks.tellNotification(notification),
   connected: (isConnected) => tasks.connected(isConnected),
-  sessionEnd: () => leave(SESSION_ENDED),
+  sessionEnd: () => endSession(),
 });
 
 function enter(signedIn) {
@@ -51,7 +51,11 @@ function enter(signedIn) {
   files.openLocation();
 }
 
-function leave(message) {
+function endSession() {
+  if (session) leave(SESSION_ENDED, session.user);
+}
+
+function leave(message, userName) {
   session = null;
   events.close();
   dialog.close();
@@ -60,7 +64,7 @@ function leave(message) {
   files.clear();
   clearNotices();
   app.hidden = true;
-  signInForm.show(message);
+  signInForm.show(message, userName);
 }
 
 // What a job takes: the tray first, then what is selected on show, each path once.
@@ -111,9 +115,7 @@ app.querySelector('.skip-link').addEventListener('click', (event) => {
 window.addEventListener('hashchange', () => {
   if (session) files.openLocation();
 });
-onSessionEnd(() => {
-  if (session) leave(SESSION_ENDED);
-});
+onSessionEnd(endSession);
 
 try {
   const found = await currentSession();

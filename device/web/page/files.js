@@ -64,8 +64,7 @@ export class Files {
   async openLocation() {
     const hash = location.hash.slice(HASH.length);
     this.#wanted = hash.startsWith(ROOT) ? decodePath(hash).replace(/(.)\/+$/s, '$1') : ROOT;
-    const refocus = this.#main.contains(document.activeElement) || document.activeElement === document.body;
-    if (await this.#list() && refocus) this.focus();
+    if (await this.#list() && document.activeElement === document.body) this.focus();
   }
 
   // Lists the folder as it is now.

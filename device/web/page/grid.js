@@ -4,7 +4,7 @@ import { dateText, sizeText } from './format.js';
 import { shown } from './names.js';
 import { Selection } from './selection.js';
 
-const ROWS_PER_CHUNK = 500;
+const ROWS_PER_BLOCK = 250;
 const ROWS_PER_PAGE = 10;
 const HEADER_ROWS = 1;
 
@@ -67,7 +67,7 @@ export class FileGrid {
     this.#body.replaceChildren();
     clearTimeout(this.#filling);
     this.#renderTo(this.#active + 1);
-    this.#renderChunk();
+    this.#renderRest();
     this.#afterChange();
   }
 
@@ -79,23 +79,24 @@ export class FileGrid {
     this.#selection.clear();
   }
 
-  // In chunks, so that a large folder answers at once while the rest of it is filled in.
-  #renderChunk() {
-    this.#renderTo(this.#rows.length + ROWS_PER_CHUNK);
+  // Block by block, so that a large folder answers at once while the rest of it is filled in.
+  #renderRest() {
+    this.#renderTo(this.#rows.length + 1);
     if (this.#rows.length < this.#entries.length) {
-      this.#filling = setTimeout(() => this.#renderChunk());
+      this.#filling = setTimeout(() => this.#renderRest());
     }
   }
 
   #renderTo(count) {
-    const end = Math.min(count, this.#entries.length);
-    const fresh = document.createDocumentFragment();
-    for (let index = this.#rows.length; index < end; ++index) {
-      const row = this.#makeRow(this.#entries[index], index);
-      this.#rows.push(row);
-      fresh.append(row);
+    while (this.#rows.length < Math.min(count, this.#entries.length)) {
+      const first = this.#rows.length;
+      const entries = this.#entries.slice(first, first + ROWS_PER_BLOCK);
+      const rows = entries.map((entry, offset) => this.#makeRow(entry, first + offset));
+      const block = element('div', { role: 'rowgroup', class: 'block' }, ...rows);
+      block.style.setProperty('--rows', rows.length);
+      this.#rows.push(...rows);
+      this.#body.append(block);
     }
-    this.#body.append(fresh);
   }
 
   #makeRow(entry, index) {

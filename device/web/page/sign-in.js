@@ -24,15 +24,19 @@ export class SignIn {
     });
   }
 
-  show(message) {
+  // A user whose session has ended need not give the name again.
+  show(message, userName = '') {
     view.hidden = false;
     document.title = 'Sign in';
+    user.value = userName;
     password.value = '';
     setText(error, message);
     (user.value ? password : user).focus();
   }
 
+  // Lets go of the focus itself, as a browser does so for a hidden field only later.
   hide() {
+    document.activeElement.blur();
     view.hidden = true;
     password.value = '';
   }
