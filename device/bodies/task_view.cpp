@@ -1,7 +1,6 @@
 #include "device/bodies/task_view.h"
 
 #include "device/bodies/errors.h"
-#include "device/bodies/json_text.h"
 #include "device/bodies/workers.h"
 
 namespace Device {
@@ -12,15 +11,16 @@ constexpr char kPropData[] = "data";
 constexpr char kRunning[] = "running";
 constexpr char kDead[] = "dead";
 
-Json::Value Property(const TaskRow& row, const std::string& name) {
+const Json::Value& Property(const TaskRow& row, const std::string& name) {
   const auto found = row.properties.find(name);
-  return found == row.properties.end() ? Json::Value() : ParseJson(found->second);
+  return found == row.properties.end() ? Json::Value::nullSingleton() : found->second;
 }
 
 // The task's data; an empty object as long as there is none.
-Json::Value DataOf(const TaskRow& row) {
-  Json::Value data = Property(row, kPropData);
-  return data.isObject() ? data : Json::Value(Json::objectValue);
+const Json::Value& DataOf(const TaskRow& row) {
+  static const Json::Value kNone(Json::objectValue);
+  const Json::Value& data = Property(row, kPropData);
+  return data.isObject() ? data : kNone;
 }
 
 std::string StateOf(const std::string& user, const TaskRow& row, const Json::Value& data) {
@@ -46,9 +46,9 @@ bool IsDead(const std::string& user, const TaskRow& row) {
 }  // namespace
 
 Json::Value TaskView(const std::string& user, const TaskRow& row) {
-  const Json::Value data = DataOf(row);
-  const Json::Value progress = Property(row, "progress");
-  const Json::Value info = data[row.id];
+  const Json::Value& data = DataOf(row);
+  const Json::Value& progress = Property(row, "progress");
+  const Json::Value& info = data[row.id];
   Json::Value view(Json::objectValue);
   view["taskid"] = row.id;
   view["dest_file_path"] = Destination(data);
@@ -68,7 +68,7 @@ void EndDeadTasks(const std::string& user) {
       continue;
     }
     // What the worker stored last counts: it may have ended between the two looks.
-    const std::optional<TaskRow> row = StoreOf(user).FindTask(seen.id);
+    std::optional<TaskRow> row = StoreOf(user).FindTask(seen.id);
     if (!row || !IsDead(user, *row)) {
       continue;
     }
@@ -77,7 +77,7 @@ void EndDeadTasks(const std::string& user) {
     item["path"] = Destination(data);
     item["code"] = kErrArchive;
     data["errors"].append(item);
-    StoreOf(user).UpdateTask(row->id, {{kPropData, ToText(data)}}, true);
+    StoreOf(user).UpdateTask(*row, {{kPropData, &data}}, true);
   }
 }
 

@@ -69,10 +69,11 @@ class Watcher {
 
   void SendTasks() {
     std::map<std::string, Json::Value> tasks;
-    for (const TaskRow& row : StoreOf(user_).AllTasks()) {
+    StoreOf(user_).RefreshTasks(rows_);
+    for (const auto& [id, row] : rows_) {
       const Json::Value view = TaskView(user_, row);
-      tasks[row.id] = view;
-      if (const auto known = tasks_.find(row.id); known == tasks_.end() || known->second != view) {
+      tasks[id] = view;
+      if (const auto known = tasks_.find(id); known == tasks_.end() || known->second != view) {
         Send("task", view);
       }
     }
@@ -107,7 +108,8 @@ class Watcher {
   std::int64_t last_;           // notification that was sent
   std::int64_t version_ = -1;   // of the store, when it was looked at
   std::vector<pid_t> workers_;  // that were alive
-  std::map<std::string, Json::Value> tasks_;
+  std::map<std::string, TaskRow> rows_;
+  std::map<std::string, Json::Value> tasks_;  // as they were sent
   bool is_read_ = true;
 };
 
