@@ -115,25 +115,6 @@ TEST_F(ApiTest, MethodNamesAreComparedExactly) {
   EXPECT_EQ(*static_cast<void**>(Symbol("pTask")), nullptr);
 }
 
-TEST_F(ApiTest, IdentityThatIsNotTakenOnIsTheOutcome) {
-  Device::AddFault("LumoLibUGIDSet=-1:402");
-  const Outcome outcome = Call("status", {});
-  EXPECT_EQ(outcome.code, 402);
-  EXPECT_TRUE(outcome.data.isNull());
-  ASSERT_EQ(Log().size(), 1U);
-  EXPECT_EQ(Log().front().rfind("Failed to set UGID, ", 0), 0U);
-  EXPECT_EQ(Sequence(Calls("LumoLibUmask").front().pid),
-            Words("LumoLibUmask KAVO::APIRequest::GetLoginUserName LumoLibUGIDSet LumoLibGetErr "
-                  "syslog KAVO::APIResponse::SetError LumoLibRestoreUmask"));
-}
-
-TEST_F(ApiTest, MaskIsRestoredWhenAnExceptionPassesThrough) {
-  Device::AddFault("LumoLibRemoveFinishedTask=throw");
-  EXPECT_EQ(Call("status", {}).code, 100);
-  EXPECT_EQ(Calls("LumoLibRestoreUmask").front().args[0], Calls("LumoLibUmask").front().result);
-  EXPECT_TRUE(Calls("KAVO::APIResponse::SetError").empty());
-}
-
 // A request that fails early must not free the task of the one before it.
 TEST_F(ApiTest, OneProcessImageServesManyRequestsAlike) {
   Add("vol1/photo/a.txt", "a");

@@ -22,8 +22,7 @@ using testing::HasSubstr;
 class CliTest : public DeviceTest {
  protected:
   static Ran Kavo(Strings arguments) {
-    const fs::path here = fs::read_symlink("/proc/self/exe");
-    arguments.insert(arguments.begin(), (here.parent_path() / "kavo-device").string());
+    arguments.insert(arguments.begin(), Built("kavo-device"));
     return RunProgram(arguments);
   }
 };
@@ -84,21 +83,14 @@ TEST_F(CliTest, CompressShowsEachErrorInWordsAndTheLogOnStandardError) {
 TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
   const std::string trace = temp_.Path() + "/cli-trace";
-  const std::string program =
-      (fs::read_symlink("/proc/self/exe").parent_path() / "kavo-device").string();
-  const pid_t pid = fork();
-  if (pid == 0) {
-    dup2(open((temp_.Path() + "/out").c_str(), O_WRONLY | O_CREAT, 0600), STDOUT_FILENO);
-    execl(program.c_str(), program.c_str(), "compress", device_.c_str(), "--user", "alice",
-          "/photo/zeros", "/photo/z.7z", "--trace", trace.c_str(), nullptr);
-    _exit(127);
-  }
+  Program compress({Built("kavo-device"), "compress", device_, "--user", "alice", "/photo/zeros",
+                    "/photo/z.7z", "--trace", trace},
+                   "/");
   ASSERT_TRUE(WaitUntil([&] { return ReadFile(trace).find("KLIBCPopenv") != std::string::npos; }));
-  kill(pid, SIGINT);
-  int status = 0;
-  waitpid(pid, &status, 0);
-  EXPECT_EQ(WEXITSTATUS(status), 1);
-  EXPECT_THAT(ReadFile(temp_.Path() + "/out"), testing::EndsWith("/photo/z.7z: stopped\n"));
+  kill(compress.Pid(), SIGINT);
+  EXPECT_EQ(compress.Wait(), 1);
+  compress.ReadToEnd();
+  EXPECT_THAT(compress.Seen(), testing::EndsWith("/photo/z.7z: stopped\n"));
   EXPECT_EQ(Kavo({"tasks", device_, "--user", "alice"}).out, "");
 }
 

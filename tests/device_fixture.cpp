@@ -48,9 +48,11 @@ const std::chrono::seconds kPatience(30 * kSlowness);
 
 }  // namespace
 
-std::string ModulePath() {
-  return fs::read_symlink("/proc/self/exe").parent_path().string() + "/KAVO.Zantro.Compress.so";
+std::string Built(const std::string& name) {
+  return fs::read_symlink("/proc/self/exe").parent_path() / name;
 }
+
+std::string ModulePath() { return Built("KAVO.Zantro.Compress.so"); }
 
 Strings ExpectedSequence(const std::string& name) {
   const Strings lines = Lines(ReadFile(std::string(KAVO_TESTS_DIR) + "/sequences/" + name));
@@ -84,11 +86,6 @@ Strings Behind(const Strings& names, const std::string& call) {
 Strings operator+(Strings first, const Strings& second) {
   first.insert(first.end(), second.begin(), second.end());
   return first;
-}
-
-Strings Words(const std::string& text) {
-  std::istringstream in(text);
-  return {std::istream_iterator<std::string>(in), {}};
 }
 
 DeviceTest::DeviceTest() {
@@ -125,6 +122,10 @@ std::string DeviceTest::Add(const std::string& path, const std::string& text) {
     EXPECT_EQ(chown(At(path).c_str(), kAliceUid, Device::kUsersGroup), 0);
   }
   return At(path);
+}
+
+void DeviceTest::AddFaults(const Strings& rules) {
+  std::for_each(rules.begin(), rules.end(), Device::AddFault);
 }
 
 Json::Value DeviceTest::JobParams(const Strings& sources, const std::string& dest) {
@@ -165,16 +166,20 @@ bool DeviceTest::WaitUntil(const std::function<bool()>& condition) {
   return true;
 }
 
-Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& user) {
-  const Device::Outcome started = Call("start", params, user);
-  EXPECT_EQ(started.code, 0);
-  const std::string task_id = started.data["taskid"].asString();
+Json::Value DeviceTest::Follow(const std::string& task_id, const std::string& user) {
   Device::Outcome last;
   EXPECT_TRUE(WaitUntil([&] {
     last = Ask("status", task_id, user);
     return last.code != 0 || last.data["finished"].asBool();
   }));
   EXPECT_EQ(last.code, 0);
+  return last.data;
+}
+
+Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& user) {
+  const Device::Outcome started = Call("start", params, user);
+  EXPECT_EQ(started.code, 0);
+  const Json::Value answer = Follow(started.data["taskid"].asString(), user);
   // The worker has said its last word in the log when it is gone.
   const int worker = Worker();
   EXPECT_TRUE(WaitUntil([&] {
@@ -182,7 +187,7 @@ Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& use
     // Under an emulator the worker may be nobody's child here.
     return waitpid(-1, nullptr, WNOHANG) == -1 && Group(worker).empty();
   }));
-  return last.data;
+  return answer;
 }
 
 Strings DeviceTest::FailJob(const Json::Value& params, const std::string& user) {
@@ -197,7 +202,9 @@ Strings DeviceTest::FailJob(const Json::Value& params, const std::string& user) 
 
 Strings DeviceTest::Log() const {
   static const std::regex kPlace("(^|\n)(KAVO\\.Zantro\\.Compress|lumo_webapi):[0-9]+ ");
-  return Lines(Plain(std::regex_replace(ReadFile(temp_.Path() + "/log"), kPlace, "$1")));
+  static const std::regex kError("(errno: |set UGID, ).*");
+  const std::string text = std::regex_replace(ReadFile(temp_.Path() + "/log"), kPlace, "$1");
+  return Lines(Plain(std::regex_replace(text, kError, "$1*")));
 }
 
 std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
@@ -211,20 +218,20 @@ std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
   return calls;
 }
 
-Strings DeviceTest::Group(int worker) {
-  Strings names;
+std::set<pid_t> DeviceTest::Group(pid_t worker) {
+  std::set<pid_t> processes;
   for (const fs::directory_entry& process : fs::directory_iterator("/proc")) {
     std::ifstream stat(process.path() / "stat");
-    std::string pid;
+    pid_t pid = 0;
+    pid_t parent = 0;
+    pid_t group = 0;
     std::string name;
     std::string state;
-    int parent = 0;
-    int group = 0;
     if (stat >> pid >> name >> state >> parent >> group && group == worker && state != "Z") {
-      names.push_back(name);
+      processes.insert(pid);
     }
   }
-  return names;
+  return processes;
 }
 
 TracedCall DeviceTest::Fork() const {
@@ -275,6 +282,6 @@ void DeviceTest::Watch() {
 void DeviceTest::ScriptArchiver(const std::string& text) {
   WriteFile(temp_.Path() + "/output", text);
   setenv("KAVO_SCRIPTED_OUTPUT", (temp_.Path() + "/output").c_str(), 1);
-  const std::string program = fs::path(ModulePath()).parent_path().string() + "/scripted-7z";
-  Device::TheDevice().archiver = Device::FileDescriptor(open(program.c_str(), O_PATH | O_CLOEXEC));
+  Device::TheDevice().archiver =
+      Device::FileDescriptor(open(Built("scripted-7z").c_str(), O_PATH | O_CLOEXEC));
 }

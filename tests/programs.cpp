@@ -1,6 +1,7 @@
 #include "tests/programs.h"
 
 #include <fcntl.h>
+#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -10,7 +11,11 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <sstream>
+#include <utility>
+
+namespace fs = std::filesystem;
 
 TempFolder::TempFolder() {
   char name[] = "/tmp/kavo-test-XXXXXX";
@@ -20,7 +25,7 @@ TempFolder::TempFolder() {
 
 TempFolder::~TempFolder() {
   std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
+  fs::remove_all(path_, ignored);
 }
 
 std::string ReadFile(const std::string& path) {
@@ -31,7 +36,7 @@ std::string ReadFile(const std::string& path) {
 }
 
 void WriteFile(const std::string& path, const std::string& text) {
-  std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+  fs::create_directories(fs::path(path).parent_path());
   std::ofstream(path, std::ios::binary) << text;
 }
 
@@ -42,6 +47,11 @@ Strings Lines(const std::string& text) {
     lines.push_back(line);
   }
   return lines;
+}
+
+Strings Words(const std::string& text) {
+  std::istringstream in(text);
+  return {std::istream_iterator<std::string>(in), {}};
 }
 
 Program::Program(const Strings& arguments, const std::string& folder,
@@ -106,15 +116,31 @@ int Program::Wait() {
   return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
 }
 
-Ran RunProgram(const Strings& arguments, const std::string& folder,
-               const std::function<void()>& prepare) {
+Ran RunProgram(const Strings& arguments, const std::string& folder) {
   const TempFolder temp;
   const std::string err_path = temp.Path() + "/err";
-  Program program(arguments, folder, [&] {
-    dup2(open(err_path.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
-    prepare();
-  });
+  Program program(arguments, folder,
+                  [&] { dup2(open(err_path.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO); });
   program.ReadToEnd();
   const int status = program.Wait();
   return {status, program.Seen(), ReadFile(err_path)};
+}
+
+Tree Unpacked(const std::string& archive, const std::string& password) {
+  const TempFolder to;
+  const Ran ran = RunProgram({"/usr/bin/7z", "x", "-spd", "-snld20", "-bso0", "-bsp0",
+                              "-p" + password, "-o" + to.Path(), archive});
+  EXPECT_EQ(ran.status, 0) << ran.err;
+  if (ReadFile(archive).substr(0, 2) == "PK") {
+    const Ran tested = RunProgram({"/usr/bin/unzip", "-tqq", "-P", password, archive});
+    EXPECT_EQ(tested.status, 0) << tested.out << tested.err;
+  }
+  Tree tree;
+  for (const auto& entry : fs::recursive_directory_iterator(to.Path())) {
+    tree[entry.path().lexically_relative(to.Path())] =
+        entry.is_symlink()     ? "-> " + fs::read_symlink(entry.path()).string()
+        : entry.is_directory() ? "/"
+                               : ReadFile(entry.path());
+  }
+  return tree;
 }

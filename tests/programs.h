@@ -5,11 +5,13 @@
 #include <sys/types.h>
 
 #include <functional>
+#include <map>
 #include <string>
-#include <utility>
 #include <vector>
 
 using Strings = std::vector<std::string>;
+// Path to contents; "/" for a folder, "-> x" for a link.
+using Tree = std::map<std::string, std::string>;
 
 // A folder that others can walk into; removed with all that is in it.
 class TempFolder {
@@ -29,6 +31,7 @@ std::string ReadFile(const std::string& path);
 // Makes the folders above it too.
 void WriteFile(const std::string& path, const std::string& text);
 Strings Lines(const std::string& text);
+Strings Words(const std::string& text);
 
 // A child whose standard output the test reads. It leads its own process group, and does not
 // outlive the object.
@@ -63,8 +66,9 @@ struct Ran {
   std::string out;
   std::string err;
 };
-Ran RunProgram(
-    const Strings& arguments, const std::string& folder = "/",
-    const std::function<void()>& prepare = [] {});
+Ran RunProgram(const Strings& arguments, const std::string& folder = "/");
+
+// All that 7z unpacks from an archive; unzip must find a zip sound too.
+Tree Unpacked(const std::string& archive, const std::string& password = "none");
 
 #endif  // TESTS_PROGRAMS_H_
