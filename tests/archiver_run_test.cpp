@@ -16,7 +16,7 @@
 #include "device/archiver/report.h"
 #include "device/archiver/stock_7z.h"
 #include "tests/emulation.h"
-#include "tests/programs.h"
+#include "tests/unpacked.h"
 
 namespace {
 

@@ -135,16 +135,23 @@ Json::Value DeviceTest::JobParams(const Strings& sources, const std::string& des
   return params;
 }
 
-Device::Outcome DeviceTest::Call(const std::string& method, const Json::Value& params,
-                                 const std::string& user, int version, bool is_followed) {
+Device::Request DeviceTest::MakeRequest(const std::string& method, const Json::Value& params,
+                                        const std::string& user) {
   Device::Request request;
   request.api = "KAVO.Zantro.Compress";
   request.method = method;
-  request.version = version;
+  request.version = 3;
   request.params = params;
   request.user = user;
   request.session_id = Device::SignIn(user);
-  request.is_followed = is_followed;
+  request.is_followed = true;
+  return request;
+}
+
+Device::Outcome DeviceTest::Call(const std::string& method, const Json::Value& params,
+                                 const std::string& user, int version) {
+  Device::Request request = MakeRequest(method, params, user);
+  request.version = version;
   return launcher_->Call(request);
 }
 

@@ -48,8 +48,10 @@ class DeviceTest : public testing::Test {
 
   static void AddFaults(const Strings& rules);
   static Json::Value JobParams(const Strings& sources, const std::string& dest);
+  static Device::Request MakeRequest(const std::string& method, const Json::Value& params,
+                                     const std::string& user = "alice");
   Device::Outcome Call(const std::string& method, const Json::Value& params,
-                       const std::string& user = "alice", int version = 3, bool is_followed = true);
+                       const std::string& user = "alice", int version = 3);
   Device::Outcome Ask(const std::string& method, const std::string& task_id,
                       const std::string& user = "alice");
   // The status answer that reports the end of a job, after waiting for it.

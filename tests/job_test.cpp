@@ -7,6 +7,7 @@
 #include "device/bodies/operations.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
+#include "tests/unpacked.h"
 
 namespace {
 

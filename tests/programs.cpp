@@ -1,7 +1,6 @@
 #include "tests/programs.h"
 
 #include <fcntl.h>
-#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -18,8 +17,8 @@
 namespace fs = std::filesystem;
 
 TempFolder::TempFolder() {
-  char name[] = "/tmp/kavo-test-XXXXXX";
-  path_ = mkdtemp(name);
+  path_ = fs::temp_directory_path() / "kavo-test-XXXXXX";
+  path_ = mkdtemp(path_.data());
   chmod(path_.c_str(), 0755);
 }
 
@@ -29,9 +28,8 @@ TempFolder::~TempFolder() {
 }
 
 std::string ReadFile(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
   std::ostringstream text;
-  text << file.rdbuf();
+  text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
 }
 
@@ -54,8 +52,7 @@ Strings Words(const std::string& text) {
   return {std::istream_iterator<std::string>(in), {}};
 }
 
-Program::Program(const Strings& arguments, const std::string& folder,
-                 const std::function<void()>& prepare) {
+Program::Program(const Strings& arguments, const std::string& folder, const std::string& errors) {
   std::array<int, 2> ends{};
   if (pipe2(ends.data(), O_CLOEXEC) != 0) {
     std::abort();
@@ -65,21 +62,19 @@ Program::Program(const Strings& arguments, const std::string& folder,
     pointers.push_back(const_cast<char*>(argument.c_str()));
   }
   pointers.push_back(nullptr);
-  // Opened before `prepare`, after which there may be no way to walk there.
-  const int program = open(pointers[0], O_PATH | O_CLOEXEC);
   pid_ = fork();
   if (pid_ == 0) {
     setpgid(0, 0);
     dup2(ends[1], STDOUT_FILENO);
-    prepare();
+    if (!errors.empty()) {
+      dup2(open(errors.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
+    }
     if (chdir(folder.c_str()) == 0) {
-      fexecve(program, pointers.data(), environ);
-      execv(pointers[0], pointers.data());  // a script is read again by its name
+      execve(pointers[0], pointers.data(), environ);
     }
     _exit(126);
   }
   setpgid(pid_, pid_);
-  close(program);
   close(ends[1]);
   output_ = ends[0];
 }
@@ -118,29 +113,8 @@ int Program::Wait() {
 
 Ran RunProgram(const Strings& arguments, const std::string& folder) {
   const TempFolder temp;
-  const std::string err_path = temp.Path() + "/err";
-  Program program(arguments, folder,
-                  [&] { dup2(open(err_path.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO); });
+  Program program(arguments, folder, temp.Path() + "/err");
   program.ReadToEnd();
   const int status = program.Wait();
-  return {status, program.Seen(), ReadFile(err_path)};
-}
-
-Tree Unpacked(const std::string& archive, const std::string& password) {
-  const TempFolder to;
-  const Ran ran = RunProgram({"/usr/bin/7z", "x", "-spd", "-snld20", "-bso0", "-bsp0",
-                              "-p" + password, "-o" + to.Path(), archive});
-  EXPECT_EQ(ran.status, 0) << ran.err;
-  if (ReadFile(archive).substr(0, 2) == "PK") {
-    const Ran tested = RunProgram({"/usr/bin/unzip", "-tqq", "-P", password, archive});
-    EXPECT_EQ(tested.status, 0) << tested.out << tested.err;
-  }
-  Tree tree;
-  for (const auto& entry : fs::recursive_directory_iterator(to.Path())) {
-    tree[entry.path().lexically_relative(to.Path())] =
-        entry.is_symlink()     ? "-> " + fs::read_symlink(entry.path()).string()
-        : entry.is_directory() ? "/"
-                               : ReadFile(entry.path());
-  }
-  return tree;
+  return {status, program.Seen(), ReadFile(temp.Path() + "/err")};
 }

@@ -4,14 +4,10 @@
 
 #include <sys/types.h>
 
-#include <functional>
-#include <map>
 #include <string>
 #include <vector>
 
 using Strings = std::vector<std::string>;
-// Path to contents; "/" for a folder, "-> x" for a link.
-using Tree = std::map<std::string, std::string>;
 
 // A folder that others can walk into; removed with all that is in it.
 class TempFolder {
@@ -37,10 +33,8 @@ Strings Words(const std::string& text);
 // outlive the object.
 class Program {
  public:
-  // Starts the program of that full path in a folder. `prepare` runs in the child.
-  Program(
-      const Strings& arguments, const std::string& folder,
-      const std::function<void()>& prepare = [] {});
+  // Starts the program of that full path in a folder. Its standard error may go to a file.
+  Program(const Strings& arguments, const std::string& folder, const std::string& errors = "");
   ~Program();
   Program(const Program&) = delete;
   Program& operator=(const Program&) = delete;
@@ -67,8 +61,5 @@ struct Ran {
   std::string err;
 };
 Ran RunProgram(const Strings& arguments, const std::string& folder = "/");
-
-// All that 7z unpacks from an archive; unzip must find a zip sound too.
-Tree Unpacked(const std::string& archive, const std::string& password = "none");
 
 #endif  // TESTS_PROGRAMS_H_
