@@ -12,7 +12,6 @@
 #include <sstream>
 
 #include "device/bodies/operations.h"
-#include "device/host/request_state.h"
 #include "tests/device_fixture.h"
 
 // Null without the leak checker.
@@ -92,24 +91,6 @@ TEST_F(ApiTest, HostRefusesWhatNoRowServes) {
   EXPECT_EQ(Call("begin", {}).code, 103);
   EXPECT_EQ(Call("status", {}, "alice", 4).code, 104);
   EXPECT_TRUE(Calls().empty());
-}
-
-TEST_F(ApiTest, MethodNamesAreComparedExactly) {
-  Device::Request request;
-  request.user = "alice";
-  const auto* const rows = static_cast<const ApiRow*>(Symbol("gTable"));
-  KAVO::APIRequest::State request_state{request};
-  KAVO::APIResponse::State response_state;
-  KAVO::APIRequest api_request{&request_state};
-  KAVO::APIResponse api_response{&response_state};
-  Device::AddFault("LumoLibUGIDSet=0");
-  for (const char* method : {"START", "Stop", "status ", ""}) {
-    request.method = method;
-    rows->handler(&api_request, &api_response);
-    EXPECT_EQ(response_state.outcome.code, 101) << method;
-  }
-  EXPECT_EQ(Calls("KAVO::APIResponse::SetError").size(), 4U);
-  EXPECT_EQ(*static_cast<void**>(Symbol("pTask")), nullptr);
 }
 
 // A request that fails early must not free the task of the one before it.

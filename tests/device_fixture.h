@@ -67,9 +67,8 @@ class DeviceTest : public testing::Test {
   Strings Log() const;
   // The calls of one operation, or of all.
   std::vector<TracedCall> Calls(const std::string& call = "") const;
-  // The fork that made the last worker, as the request process saw it.
-  TracedCall Fork() const;
-  int Worker() const { return Fork().result.isNull() ? -1 : Fork().result.asInt(); }
+  // The last worker's process id, -1 when there was none.
+  int Worker() const;
   // The living processes of the worker's group: itself, the archiver's two, the stock 7z.
   static std::set<pid_t> Group(pid_t worker);
   // What a process called, libc's calls by the module among it: one line for each, the name and,

@@ -5,12 +5,12 @@
 #include <gtest/gtest.h>
 
 #include <filesystem>
-#include <map>
+#include <set>
 
 #include "tests/programs.h"
 
-// Path to contents; "/" for a folder, "-> x" for a link.
-using Tree = std::map<std::string, std::string>;
+// "folder/", "link -> target", "file=contents".
+using Tree = std::set<std::string>;
 
 // All that 7z unpacks; unzip must find a zip sound too.
 inline Tree Unpacked(const std::string& archive) {
@@ -24,10 +24,10 @@ inline Tree Unpacked(const std::string& archive) {
   }
   Tree tree;
   for (const auto& entry : std::filesystem::recursive_directory_iterator(to.Path())) {
-    tree[entry.path().lexically_relative(to.Path())] =
-        entry.is_symlink()     ? "-> " + std::filesystem::read_symlink(entry.path()).string()
-        : entry.is_directory() ? "/"
-                               : ReadFile(entry.path());
+    tree.insert(entry.path().lexically_relative(to.Path()).string() +
+                (entry.is_symlink()     ? " -> " + read_symlink(entry.path()).string()
+                 : entry.is_directory() ? "/"
+                                        : "=" + ReadFile(entry.path())));
   }
   return tree;
 }
