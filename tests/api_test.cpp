@@ -12,8 +12,6 @@
 #include <sstream>
 
 #include "device/bodies/operations.h"
-#include "device/host/request_state.h"
-#include "device/host/sessions.h"
 #include "tests/device_fixture.h"
 
 // Null without the leak checker.

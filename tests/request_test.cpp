@@ -20,7 +20,10 @@ TEST_P(RequestTest, AnswersWithItsCodeAndLinesAndNoFurtherCall) {
   const TableRow& row = GetParam();
   const std::string method = row.Get("method");
   if (row.Has("data")) {
-    Device::TaskStore("alice").AddTask("Zantro_test", {{"data", row.Get("data")}});
+    Device::TaskRow task;
+    task.id = "Zantro_test";
+    task.properties["data"] = Device::ParseJson(row.Get("data"));
+    Device::TaskStore("alice").AddTask(task);
     for (const auto& file : std::filesystem::directory_iterator(At("users/alice"))) {
       EXPECT_EQ(lchown(file.path().c_str(), geteuid() == 0 ? 65001 : -1, -1), 0);
     }
