@@ -9,7 +9,6 @@ const ICONS = {
   link: 'M10 14a4 4 0 0 0 5.7 0l3.1-3.1a4 4 0 0 0-5.7-5.7L12 6.3M14 10a4 4 0 0 0-5.7 0l-3.1 3.1a4 4 0 0 0 5.7 5.7L12 17.7',
   other: 'M12 3l8 4.5v9L12 21l-8-4.5v-9zM12 12l8-4.5M12 12v9M12 12L4 7.5',
   close: 'M6 6l12 12M18 6L6 18',
-  up: 'M12 19V5M6 11l6-6 6 6',
 };
 
 export const byId = (id) => document.getElementById(id);
