@@ -21,10 +21,12 @@ using testing::HasSubstr;
 
 class CliTest : public DeviceTest {
  protected:
-  static Ran Kavo(Strings arguments) {
-    const fs::path here = fs::read_symlink("/proc/self/exe");
-    arguments.insert(arguments.begin(), (here.parent_path() / "kavo-device").string());
-    return RunProgram(arguments);
+  static Ran Kavo(const Strings& arguments) {
+    return RunProgram(Strings{Built("kavo-device")} + arguments);
+  }
+  // On the test's own device.
+  Ran As(const std::string& user, const std::string& command, const Strings& arguments = {}) {
+    return Kavo(Strings{command, device_, "--user", user} + arguments);
   }
 };
 
@@ -43,28 +45,27 @@ TEST_F(CliTest, SampleDevicePacksFromTwoShares) {
 
 TEST_F(CliTest, CallAnswersOnOneLineAndDoesNotWaitForTheWorker) {
   fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
-  const Ran started = Kavo({"call", device_, "--user", "alice", "start", "path=/photo/zeros",
-                            R"(dest_file_path=["/photo/z.7z"])", "format=7z", "level=best"});
+  const Ran started = As("alice", "call",
+                         {"start", "path=/photo/zeros", R"(dest_file_path=["/photo/z.7z"])",
+                          "format=7z", "level=best"});
   EXPECT_EQ(started.status, 0) << started.err;
   const Json::Value answer = Device::ParseJson(started.out);
   const std::string task = answer["data"]["taskid"].asString();
   EXPECT_EQ(started.out, R"({"code":0,"data":{"taskid":")" + task + "\"}}\n");
-  EXPECT_THAT(Kavo({"tasks", device_, "--user", "alice"}).out, HasSubstr(task + "\trunning\t"));
-  EXPECT_EQ(Kavo({"tasks", device_, "--user", "bob"}).out, "");
-  const Ran stopped = Kavo({"call", device_, "--user", "alice", "stop", "taskid=" + task});
+  EXPECT_THAT(As("alice", "tasks").out, HasSubstr(task + "\trunning\t"));
+  EXPECT_EQ(As("bob", "tasks").out, "");
+  const Ran stopped = As("alice", "call", {"stop", "taskid=" + task});
   EXPECT_EQ(stopped.out, "{\"code\":0,\"data\":null}\n");
-  EXPECT_EQ(Kavo({"tasks", device_, "--user", "alice"}).out, "");
+  EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
 TEST_F(CliTest, NobodyFollowsACallSoTheDesktopIsNotified) {
   Add("vol1/photo/a.txt", "a");
-  EXPECT_EQ(Kavo({"call", device_, "--user", "alice", "start", "path=/photo/a.txt",
-                  "dest_file_path=/photo/z.zip"})
-                .status,
-            0);
+  EXPECT_EQ(
+      As("alice", "call", {"start", "path=/photo/a.txt", "dest_file_path=/photo/z.zip"}).status, 0);
   Ran ran;
   ASSERT_TRUE(WaitUntil([&] {
-    ran = Kavo({"notifications", device_, "--user", "alice"});
+    ran = As("alice", "notifications");
     return !ran.out.empty();
   }));
   EXPECT_THAT(ran.out, HasSubstr("filebrowser:filebrowser_compress_completed\t/photo/z.zip\n"));
@@ -72,8 +73,9 @@ TEST_F(CliTest, NobodyFollowsACallSoTheDesktopIsNotified) {
 
 TEST_F(CliTest, CompressShowsEachErrorInWordsAndTheLogOnStandardError) {
   Add("vol1/photo/a.txt", "a");
-  const Ran ran = Kavo({"compress", device_, "--user", "alice", "/photo/a.txt", "/photo/no.txt",
-                        "/photo/z.zip", "--fault", "ACLAccess#2=1:407"});
+  const Ran ran =
+      As("alice", "compress",
+         {"/photo/a.txt", "/photo/no.txt", "/photo/z.zip", "--fault", "ACLAccess#2=1:407"});
   EXPECT_EQ(ran.status, 1);
   EXPECT_THAT(ran.out, testing::EndsWith("/photo/a.txt: 407 no privilege\n"
                                          "/photo/no.txt: 408 no such file or folder\n"));
@@ -84,22 +86,15 @@ TEST_F(CliTest, CompressShowsEachErrorInWordsAndTheLogOnStandardError) {
 TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
   const std::string trace = temp_.Path() + "/cli-trace";
-  const std::string program =
-      (fs::read_symlink("/proc/self/exe").parent_path() / "kavo-device").string();
-  const pid_t pid = fork();
-  if (pid == 0) {
-    dup2(open((temp_.Path() + "/out").c_str(), O_WRONLY | O_CREAT, 0600), STDOUT_FILENO);
-    execl(program.c_str(), program.c_str(), "compress", device_.c_str(), "--user", "alice",
-          "/photo/zeros", "/photo/z.7z", "--trace", trace.c_str(), nullptr);
-    _exit(127);
-  }
+  Program compress({Built("kavo-device"), "compress", device_, "--user", "alice", "/photo/zeros",
+                    "/photo/z.7z", "--trace", trace},
+                   "/");
   ASSERT_TRUE(WaitUntil([&] { return ReadFile(trace).find("KLIBCPopenv") != std::string::npos; }));
-  kill(pid, SIGINT);
-  int status = 0;
-  waitpid(pid, &status, 0);
-  EXPECT_EQ(WEXITSTATUS(status), 1);
-  EXPECT_THAT(ReadFile(temp_.Path() + "/out"), testing::EndsWith("/photo/z.7z: stopped\n"));
-  EXPECT_EQ(Kavo({"tasks", device_, "--user", "alice"}).out, "");
+  kill(compress.Pid(), SIGINT);
+  EXPECT_EQ(compress.Wait(), 1);
+  compress.ReadToEnd();
+  EXPECT_THAT(compress.Seen(), testing::EndsWith("/photo/z.7z: stopped\n"));
+  EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
 // In the arguments "DEV" stands for the device.

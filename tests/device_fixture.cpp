@@ -21,6 +21,7 @@
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
+#include "device/host/sessions.h"
 #include "tests/emulation.h"
 #include "tests/libc_calls.h"
 
@@ -48,9 +49,11 @@ const std::chrono::seconds kPatience(30 * kSlowness);
 
 }  // namespace
 
-std::string ModulePath() {
-  return fs::read_symlink("/proc/self/exe").parent_path().string() + "/KAVO.Zantro.Compress.so";
+std::string Built(const std::string& name) {
+  return fs::read_symlink("/proc/self/exe").parent_path() / name;
 }
+
+std::string ModulePath() { return Built("KAVO.Zantro.Compress.so"); }
 
 Strings ExpectedSequence(const std::string& name) {
   const Strings lines = Lines(ReadFile(std::string(KAVO_TESTS_DIR) + "/sequences/" + name));
@@ -84,11 +87,6 @@ Strings Behind(const Strings& names, const std::string& call) {
 Strings operator+(Strings first, const Strings& second) {
   first.insert(first.end(), second.begin(), second.end());
   return first;
-}
-
-Strings Words(const std::string& text) {
-  std::istringstream in(text);
-  return {std::istream_iterator<std::string>(in), {}};
 }
 
 DeviceTest::DeviceTest() {
@@ -127,6 +125,10 @@ std::string DeviceTest::Add(const std::string& path, const std::string& text) {
   return At(path);
 }
 
+void DeviceTest::AddFaults(const Strings& rules) {
+  std::for_each(rules.begin(), rules.end(), Device::AddFault);
+}
+
 Json::Value DeviceTest::JobParams(const Strings& sources, const std::string& dest) {
   Json::Value params;
   params["path"] = Device::ToText(Device::ToJson(sources));
@@ -134,16 +136,23 @@ Json::Value DeviceTest::JobParams(const Strings& sources, const std::string& des
   return params;
 }
 
-Device::Outcome DeviceTest::Call(const std::string& method, const Json::Value& params,
-                                 const std::string& user, int version, bool is_followed) {
+Device::Request DeviceTest::MakeRequest(const std::string& method, const Json::Value& params,
+                                        const std::string& user) {
   Device::Request request;
   request.api = "KAVO.Zantro.Compress";
   request.method = method;
-  request.version = version;
+  request.version = 3;
   request.params = params;
   request.user = user;
   request.session_id = Device::SignIn(user);
-  request.is_followed = is_followed;
+  request.is_followed = true;
+  return request;
+}
+
+Device::Outcome DeviceTest::Call(const std::string& method, const Json::Value& params,
+                                 const std::string& user, int version) {
+  Device::Request request = MakeRequest(method, params, user);
+  request.version = version;
   return launcher_->Call(request);
 }
 
@@ -165,16 +174,20 @@ bool DeviceTest::WaitUntil(const std::function<bool()>& condition) {
   return true;
 }
 
-Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& user) {
-  const Device::Outcome started = Call("start", params, user);
-  EXPECT_EQ(started.code, 0);
-  const std::string task_id = started.data["taskid"].asString();
+Json::Value DeviceTest::Follow(const std::string& task_id, const std::string& user) {
   Device::Outcome last;
   EXPECT_TRUE(WaitUntil([&] {
     last = Ask("status", task_id, user);
     return last.code != 0 || last.data["finished"].asBool();
   }));
   EXPECT_EQ(last.code, 0);
+  return last.data;
+}
+
+Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& user) {
+  const Device::Outcome started = Call("start", params, user);
+  EXPECT_EQ(started.code, 0);
+  const Json::Value answer = Follow(started.data["taskid"].asString(), user);
   // The worker has said its last word in the log when it is gone.
   const int worker = Worker();
   EXPECT_TRUE(WaitUntil([&] {
@@ -182,7 +195,7 @@ Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& use
     // Under an emulator the worker may be nobody's child here.
     return waitpid(-1, nullptr, WNOHANG) == -1 && Group(worker).empty();
   }));
-  return last.data;
+  return answer;
 }
 
 Strings DeviceTest::FailJob(const Json::Value& params, const std::string& user) {
@@ -197,7 +210,9 @@ Strings DeviceTest::FailJob(const Json::Value& params, const std::string& user) 
 
 Strings DeviceTest::Log() const {
   static const std::regex kPlace("(^|\n)(KAVO\\.Zantro\\.Compress|lumo_webapi):[0-9]+ ");
-  return Lines(Plain(std::regex_replace(ReadFile(temp_.Path() + "/log"), kPlace, "$1")));
+  static const std::regex kError("(errno: |set UGID, ).*");
+  const std::string text = std::regex_replace(ReadFile(temp_.Path() + "/log"), kPlace, "$1");
+  return Lines(Plain(std::regex_replace(text, kError, "$1*")));
 }
 
 std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
@@ -211,26 +226,26 @@ std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
   return calls;
 }
 
-Strings DeviceTest::Group(int worker) {
-  Strings names;
+std::set<pid_t> DeviceTest::Group(pid_t worker) {
+  std::set<pid_t> processes;
   for (const fs::directory_entry& process : fs::directory_iterator("/proc")) {
     std::ifstream stat(process.path() / "stat");
-    std::string pid;
+    pid_t pid = 0;
+    pid_t parent = 0;
+    pid_t group = 0;
     std::string name;
     std::string state;
-    int parent = 0;
-    int group = 0;
     if (stat >> pid >> name >> state >> parent >> group && group == worker && state != "Z") {
-      names.push_back(name);
+      processes.insert(pid);
     }
   }
-  return names;
+  return processes;
 }
 
-TracedCall DeviceTest::Fork() const {
-  TracedCall last;
+int DeviceTest::Worker() const {
+  int last = -1;
   for (const TracedCall& fork : Calls("KLIBCProcFork")) {
-    last = fork.result.asInt() > 0 ? fork : last;
+    last = fork.result.asInt() > 0 ? fork.result.asInt() : last;
   }
   return last;
 }
@@ -250,7 +265,7 @@ Strings DeviceTest::Sequence(int pid, bool with_arguments) const {
 
 std::string DeviceTest::Plain(std::string text) const {
   const std::string worker =
-      "(\"pid\":|\nDoKill |RemoveFinishedTask \"object\",)" + Fork().result.asString() + "\\b";
+      "(\"pid\":|\nDoKill |RemoveFinishedTask \"object\",)" + std::to_string(Worker()) + "\\b";
   text = std::regex_replace(text, std::regex(worker), "$1PID");
   static const std::regex kVarying(
       R"((Zantro_)[0-9A-Za-z_-]+|("started":)[0-9]+|(lumozip)[0-9A-Za-z]{6})");
@@ -275,6 +290,6 @@ void DeviceTest::Watch() {
 void DeviceTest::ScriptArchiver(const std::string& text) {
   WriteFile(temp_.Path() + "/output", text);
   setenv("KAVO_SCRIPTED_OUTPUT", (temp_.Path() + "/output").c_str(), 1);
-  const std::string program = fs::path(ModulePath()).parent_path().string() + "/scripted-7z";
-  Device::TheDevice().archiver = Device::FileDescriptor(open(program.c_str(), O_PATH | O_CLOEXEC));
+  Device::TheDevice().archiver =
+      Device::FileDescriptor(open(Built("scripted-7z").c_str(), O_PATH | O_CLOEXEC));
 }

@@ -7,6 +7,7 @@
 
 #include <functional>
 #include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -15,7 +16,8 @@
 #include "tests/programs.h"
 #include "tests/table.h"
 
-// The built module, beside the test program.
+// What is built beside the test program: the module, kavo-device, scripted-7z.
+std::string Built(const std::string& name);
 std::string ModulePath();
 
 // The calls that stand in tests/sequences under that name, one a line; the names alone.
@@ -25,8 +27,6 @@ Strings NamesOf(Strings sequence);
 Strings UpTo(const Strings& names, const std::string& call);
 Strings Behind(const Strings& names, const std::string& call);
 Strings operator+(Strings first, const Strings& second);
-// The words of a text.
-Strings Words(const std::string& text);
 
 struct TracedCall {
   int pid = 0;
@@ -46,12 +46,17 @@ class DeviceTest : public testing::Test {
   std::string Add(const std::string& path, const std::string& text);
   std::string At(const std::string& path) const { return device_ + "/" + path; }
 
+  static void AddFaults(const Strings& rules);
   static Json::Value JobParams(const Strings& sources, const std::string& dest);
+  static Device::Request MakeRequest(const std::string& method, const Json::Value& params,
+                                     const std::string& user = "alice");
   Device::Outcome Call(const std::string& method, const Json::Value& params,
-                       const std::string& user = "alice", int version = 3, bool is_followed = true);
+                       const std::string& user = "alice", int version = 3);
   Device::Outcome Ask(const std::string& method, const std::string& task_id,
                       const std::string& user = "alice");
-  // Starts a job and waits for the status answer that reports its end.
+  // The status answer that reports the end of a job, after waiting for it.
+  Json::Value Follow(const std::string& task_id, const std::string& user = "alice");
+  // Starts a job and follows it until its worker is gone.
   Json::Value RunJob(const Json::Value& params, const std::string& user = "alice");
   // The same; "path: code" for each error item.
   Strings FailJob(const Json::Value& params, const std::string& user = "alice");
@@ -62,11 +67,10 @@ class DeviceTest : public testing::Test {
   Strings Log() const;
   // The calls of one operation, or of all.
   std::vector<TracedCall> Calls(const std::string& call = "") const;
-  // The fork that made the last worker, as the request process saw it.
-  TracedCall Fork() const;
-  int Worker() const { return Fork().result.isNull() ? -1 : Fork().result.asInt(); }
+  // The last worker's process id, -1 when there was none.
+  int Worker() const;
   // The living processes of the worker's group: itself, the archiver's two, the stock 7z.
-  static Strings Group(int worker);
+  static std::set<pid_t> Group(pid_t worker);
   // What a process called, libc's calls by the module among it: one line for each, the name and,
   // if asked for, the arguments as Plain has them. Getters of the task's id are left out.
   Strings Sequence(int pid, bool with_arguments = false) const;

@@ -6,7 +6,6 @@
 #include <spawn.h>
 #include <unistd.h>
 
-#include <cstdarg>
 #include <cstdlib>
 #include <string>
 #include <vector>
@@ -91,25 +90,6 @@ extern "C" {
 int execve(const char* program, char* const* arguments, char* const* environment) noexcept {
   const Start start(program, arguments);
   return Real<decltype(execve)>("execve")(start.Program(), start.Arguments(), environment);
-}
-
-int execv(const char* program, char* const* arguments) noexcept {
-  return execve(program, arguments, environ);
-}
-
-int execl(const char* program, const char* argument, ...) noexcept {
-  std::vector<char*> arguments = {const_cast<char*>(argument)};
-  va_list list;
-  va_start(list, argument);
-  while (arguments.back() != nullptr) {
-    arguments.push_back(va_arg(list, char*));
-  }
-  va_end(list);
-  return execv(program, arguments.data());
-}
-
-int fexecve(int program, char* const* arguments, char* const* environment) noexcept {
-  return execve((kDescriptors + std::to_string(program)).c_str(), arguments, environment);
 }
 
 int posix_spawn(pid_t* pid, const char* program, const posix_spawn_file_actions_t* actions,

@@ -27,31 +27,36 @@ class Handler : public Zantro::FileWebAPI {
   using FileWebAPI::SetFileError;
   using FileWebAPI::SetResponse;
 
-  std::function<void(Handler&)> process = [](Handler& /*handler*/) {};
+  std::function<void(Handler&)> process;
 
  protected:
   void Process() override { process(*this); }
 };
 
-// The outcome that a handler with this body hands to the host.
-std::string OutcomeOf(const std::function<void(Handler&)>& process) {
+// The outcome that a handler with this body, or the module's own, hands to the host.
+std::string OutcomeOf(const std::function<void(Handler&)>& process,
+                      const std::string& method = "") {
   Device::AddFault("LumoLibUGIDSet=0");
-  const Device::Request request;
+  Device::Request request;
+  request.method = method;
   KAVO::APIRequest::State request_state{request};
   KAVO::APIResponse::State response_state;
   KAVO::APIRequest api_request{&request_state};
   KAVO::APIResponse api_response{&response_state};
-  Handler handler(&api_request, &api_response);
-  handler.process = process;
-  handler.Run();
+  if (process) {
+    Handler handler(&api_request, &api_response);
+    handler.process = process;
+    handler.Run();
+    EXPECT_EQ(handler.GetError(), response_state.outcome.code);
+  } else {
+    Zantro::ZantroCompressHandler(&api_request, &api_response).Run();
+  }
   Device::StopWatching();
-  EXPECT_EQ(handler.GetError(), response_state.outcome.code);
   return std::to_string(response_state.outcome.code) + " " +
          Device::ToText(response_state.outcome.data);
 }
 
 TEST(BaseHandler, HandsOnWhatWasRecordedLast) {
-  EXPECT_EQ(OutcomeOf([](Handler& /*handler*/) {}), "0 null");
   EXPECT_EQ(OutcomeOf([](Handler& handler) {
               handler.SetError(407, "why");
               handler.SetResponse("data");
@@ -64,6 +69,12 @@ TEST(BaseHandler, HandsOnWhatWasRecordedLast) {
             "401 null");
   EXPECT_EQ(OutcomeOf([](Handler& handler) { handler.SetFileError(1300, "/photo/a", 402); }),
             R"(1300 [{"code":402,"path":"/photo/a"}])");
+}
+
+TEST(CompressHandler, ComparesMethodNamesExactly) {
+  for (const char* method : {"START", "Stop", "status ", ""}) {
+    EXPECT_EQ(OutcomeOf(nullptr, method), "101 null") << method;
+  }
 }
 
 TEST(BaseHandler, LeavesErrorNumbersToThePlatform) {

@@ -8,6 +8,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <csignal>
@@ -17,6 +18,8 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+
+namespace fs = std::filesystem;
 
 namespace {
 
@@ -32,10 +35,6 @@ const void* BaseOf(const void* address) {
   return dladdr(address, &info) != 0 ? info.dli_fbase : nullptr;
 }
 
-bool IsModule(const void* caller) {
-  return module_base != nullptr && BaseOf(caller) == module_base;
-}
-
 template <typename Function>
 Function* Real(const char* name) {
   return reinterpret_cast<Function*>(dlsym(RTLD_NEXT, name));
@@ -44,43 +43,32 @@ Function* Real(const char* name) {
 // One line of JSON on the stack.
 class TraceLine {
  public:
+  explicit TraceLine(const char* call)
+      : size_(std::snprintf(text_, kRoom, R"({"pid":%d,"call":"%s","args":[)", getpid(), call)) {}
+
+  void Add(int number) { size_ += std::snprintf(text_ + size_, kRoom, "%d,", number); }
   void Add(const char* text) {
-    for (; *text != 0 && size_ < text_.size(); ++text) {
-      text_[size_++] = *text;
-    }
-  }
-  void Add(int number) {
-    std::array<char, 16> digits{};
-    std::snprintf(digits.data(), digits.size(), "%d", number);
-    Add(digits.data());
-  }
-  void AddArgument(int number) {
-    Add(number);
-    Add(",");
-  }
-  void AddArgument(const char* text) {
-    Add("\"");
-    for (; *text != 0 && size_ + kRoom < text_.size(); ++text) {
+    text_[size_++] = '"';
+    for (; *text != 0 && size_ + 2 * kRoom < kSize; ++text) {
       const bool is_plain =
           static_cast<unsigned char>(*text) >= ' ' && *text != '"' && *text != '\\';
-      std::array<char, 8> code{};
-      std::snprintf(code.data(), code.size(), is_plain ? "%c" : "\\u%04x", *text);
-      Add(code.data());
+      size_ += std::snprintf(text_ + size_, kRoom, is_plain ? "%c" : "\\u%04x", *text);
     }
-    Add("\",");
+    size_ += std::snprintf(text_ + size_, kRoom, "\",");
   }
   void Write() {
     size_ -= text_[size_ - 1] == ',' ? 1 : 0;
-    Add("]}\n");
+    size_ += std::snprintf(text_ + size_, kRoom, "]}\n");
     if (trace_file >= 0) {
-      (void)Real<decltype(write)>("write")(trace_file, text_.data(), size_);
+      (void)Real<decltype(write)>("write")(trace_file, text_, static_cast<std::size_t>(size_));
     }
   }
 
  private:
-  static constexpr std::size_t kRoom = 16;
-  std::array<char, 16384> text_;
-  std::size_t size_ = 0;
+  static constexpr int kSize = 16384;
+  static constexpr int kRoom = 128;  // more than all that may follow a text that is cut
+  char text_[kSize];
+  int size_;
 };
 
 // True, and traced, when it is the module that calls.
@@ -90,13 +78,8 @@ bool IsModules(const void* caller, const char* call, Arguments... arguments) {
     return false;
   }
   const int saved_errno = errno;
-  TraceLine line;
-  line.Add(R"({"pid":)");
-  line.Add(getpid());
-  line.Add(R"(,"call":")");
-  line.Add(call);
-  line.Add(R"(","args":[)");
-  (line.AddArgument(arguments), ...);
+  TraceLine line(call);
+  (line.Add(arguments), ...);
   line.Write();
   errno = saved_errno;
   return true;
@@ -117,7 +100,14 @@ bool Fails(const char* call, const char* argument) {
 
 // Keeps what staging has made, with its full path.
 void NoteMade(const char* name) {
-  std::ofstream(made_path, std::ios::app) << std::filesystem::absolute(name).string() << '\n';
+  std::ofstream(made_path, std::ios::app) << fs::absolute(name).string() << '\n';
+}
+
+void Reopen(int& file, const std::string& path) {
+  if (file >= 0) {
+    close(file);
+  }
+  file = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
 }
 
 }  // namespace
@@ -131,32 +121,21 @@ void WatchModule(const void* address) {
   dlclose(module);
 }
 
-void SetLibcTrace(const std::string& path) {
-  if (trace_file >= 0) {
-    close(trace_file);
-  }
-  trace_file = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0600);
-}
+void SetLibcTrace(const std::string& path) { Reopen(trace_file, path); }
 
 void SetLibcFault(const LibcFault& fault) { armed = fault; }
 
 void SetLogFile(const std::string& path) {
-  constexpr mode_t kMode = 0600;
-  if (log_file >= 0) {
-    close(log_file);
-  }
   made_path = path + ".made";
-  log_file = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, kMode);
+  Reopen(log_file, path);
 }
 
-std::vector<std::string> StagedPaths() {
-  std::vector<std::string> paths;
-  std::ifstream file(made_path);
-  for (std::string path; std::getline(file, path);) {
-    if (std::filesystem::exists(std::filesystem::symlink_status(path))) {
-      paths.push_back(path);
-    }
-  }
+Strings StagedPaths() {
+  Strings paths = Lines(ReadFile(made_path));
+  paths.erase(
+      std::remove_if(paths.begin(), paths.end(),
+                     [](const auto& path) { return !fs::exists(fs::symlink_status(path)); }),
+      paths.end());
   return paths;
 }
 
@@ -188,10 +167,8 @@ int mkstemp(char* name) {
 
 char* mkdtemp(char* name) {
   const bool is_modules = IS_MODULES("mkdtemp", name);
-  if (is_modules && Fails("mkdtemp", name)) {
-    return nullptr;
-  }
-  char* const made = Real<decltype(mkdtemp)>("mkdtemp")(name);
+  char* const made =
+      is_modules && Fails("mkdtemp", name) ? nullptr : Real<decltype(mkdtemp)>("mkdtemp")(name);
   is_modules&& made != nullptr ? NoteMade(name) : void();
   return made;
 }

@@ -4,7 +4,8 @@
 #define TESTS_LIBC_CALLS_H_
 
 #include <string>
-#include <vector>
+
+#include "tests/programs.h"
 
 // From now on the calls of the library that holds this address count as the module's.
 void WatchModule(const void* address);
@@ -27,6 +28,6 @@ void SetLibcFault(const LibcFault& fault);
 void SetLogFile(const std::string& path);
 
 // The list files and staging folders made since the log file was set that are still there.
-std::vector<std::string> StagedPaths();
+Strings StagedPaths();
 
 #endif  // TESTS_LIBC_CALLS_H_

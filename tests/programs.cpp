@@ -10,28 +10,31 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <sstream>
+#include <utility>
+
+namespace fs = std::filesystem;
 
 TempFolder::TempFolder() {
-  char name[] = "/tmp/kavo-test-XXXXXX";
-  path_ = mkdtemp(name);
+  path_ = fs::temp_directory_path() / "kavo-test-XXXXXX";
+  path_ = mkdtemp(path_.data());
   chmod(path_.c_str(), 0755);
 }
 
 TempFolder::~TempFolder() {
   std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
+  fs::remove_all(path_, ignored);
 }
 
 std::string ReadFile(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
   std::ostringstream text;
-  text << file.rdbuf();
+  text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
 }
 
 void WriteFile(const std::string& path, const std::string& text) {
-  std::filesystem::create_directories(std::filesystem::path(path).parent_path());
+  fs::create_directories(fs::path(path).parent_path());
   std::ofstream(path, std::ios::binary) << text;
 }
 
@@ -44,8 +47,12 @@ Strings Lines(const std::string& text) {
   return lines;
 }
 
-Program::Program(const Strings& arguments, const std::string& folder,
-                 const std::function<void()>& prepare) {
+Strings Words(const std::string& text) {
+  std::istringstream in(text);
+  return {std::istream_iterator<std::string>(in), {}};
+}
+
+Program::Program(const Strings& arguments, const std::string& folder, const std::string& errors) {
   std::array<int, 2> ends{};
   if (pipe2(ends.data(), O_CLOEXEC) != 0) {
     std::abort();
@@ -55,21 +62,19 @@ Program::Program(const Strings& arguments, const std::string& folder,
     pointers.push_back(const_cast<char*>(argument.c_str()));
   }
   pointers.push_back(nullptr);
-  // Opened before `prepare`, after which there may be no way to walk there.
-  const int program = open(pointers[0], O_PATH | O_CLOEXEC);
   pid_ = fork();
   if (pid_ == 0) {
     setpgid(0, 0);
     dup2(ends[1], STDOUT_FILENO);
-    prepare();
+    if (!errors.empty()) {
+      dup2(open(errors.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
+    }
     if (chdir(folder.c_str()) == 0) {
-      fexecve(program, pointers.data(), environ);
-      execv(pointers[0], pointers.data());  // a script is read again by its name
+      execve(pointers[0], pointers.data(), environ);
     }
     _exit(126);
   }
   setpgid(pid_, pid_);
-  close(program);
   close(ends[1]);
   output_ = ends[0];
 }
@@ -106,15 +111,10 @@ int Program::Wait() {
   return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
 }
 
-Ran RunProgram(const Strings& arguments, const std::string& folder,
-               const std::function<void()>& prepare) {
+Ran RunProgram(const Strings& arguments, const std::string& folder) {
   const TempFolder temp;
-  const std::string err_path = temp.Path() + "/err";
-  Program program(arguments, folder, [&] {
-    dup2(open(err_path.c_str(), O_WRONLY | O_CREAT, 0600), STDERR_FILENO);
-    prepare();
-  });
+  Program program(arguments, folder, temp.Path() + "/err");
   program.ReadToEnd();
   const int status = program.Wait();
-  return {status, program.Seen(), ReadFile(err_path)};
+  return {status, program.Seen(), ReadFile(temp.Path() + "/err")};
 }

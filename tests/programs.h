@@ -4,9 +4,7 @@
 
 #include <sys/types.h>
 
-#include <functional>
 #include <string>
-#include <utility>
 #include <vector>
 
 using Strings = std::vector<std::string>;
@@ -29,15 +27,14 @@ std::string ReadFile(const std::string& path);
 // Makes the folders above it too.
 void WriteFile(const std::string& path, const std::string& text);
 Strings Lines(const std::string& text);
+Strings Words(const std::string& text);
 
 // A child whose standard output the test reads. It leads its own process group, and does not
 // outlive the object.
 class Program {
  public:
-  // Starts the program of that full path in a folder. `prepare` runs in the child.
-  Program(
-      const Strings& arguments, const std::string& folder,
-      const std::function<void()>& prepare = [] {});
+  // Starts the program of that full path in a folder. Its standard error may go to a file.
+  Program(const Strings& arguments, const std::string& folder, const std::string& errors = "");
   ~Program();
   Program(const Program&) = delete;
   Program& operator=(const Program&) = delete;
@@ -63,8 +60,6 @@ struct Ran {
   std::string out;
   std::string err;
 };
-Ran RunProgram(
-    const Strings& arguments, const std::string& folder = "/",
-    const std::function<void()>& prepare = [] {});
+Ran RunProgram(const Strings& arguments, const std::string& folder = "/");
 
 #endif  // TESTS_PROGRAMS_H_

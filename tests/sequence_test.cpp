@@ -28,11 +28,13 @@ class SequenceTest : public DeviceTest {
                 ElementsAreArray(ExpectedSequence(name)));
   }
   void ExpectWorker(const std::string& name) {
-    EXPECT_THAT(Sequence(Fork().result.asInt(), true), ElementsAreArray(ExpectedSequence(name)));
+    EXPECT_THAT(Sequence(Worker(), true), ElementsAreArray(ExpectedSequence(name)));
   }
 };
 
 TEST_F(SequenceTest, StartAndAJobOfOneShare) {
+  // The first of the flags does not matter.
+  Device::AddFault(R"(LumoLibGetPrivilege={"result":0,"level":2,"flags":1})");
   Json::Value params = JobParams({"/photo/trip/a.txt", "/photo/trip/day"}, "/photo/out.zip/");
   params["mode"] = "freshen";
   params["level"] = "fastest";
@@ -49,10 +51,9 @@ TEST_F(SequenceTest, StartAndAJobOfOneShare) {
 
 TEST_F(SequenceTest, AJobOfTwoSharesThatNotifies) {
   Add("vol1/homes/alice/z.7z", "an archive");
-  for (const char* rule : {"Vesk::Task::getBoolProperty=1", "KLIBGroupIsAdminGroupMem=0",
-                           "LumoCheckFileName=3", "VolumePathParse=3", "KAVOFSAclChmod=3"}) {
-    Device::AddFault(rule);  // positive results are no failures
-  }
+  // Positive results are no failures.
+  AddFaults({"Vesk::Task::getBoolProperty=1", "KLIBGroupIsAdminGroupMem=0", "LumoCheckFileName=3",
+             "VolumePathParse=3", "KAVOFSAclChmod=3"});
   Json::Value params =
       JobParams({"/photo/trip/a.txt", "/music", "/photo/trip/day/b.txt"}, "/home/z.7z");
   params["format"] = "7z";
@@ -68,8 +69,7 @@ TEST_F(SequenceTest, AJobThatFails) {
 }
 
 TEST_F(SequenceTest, Stop) {
-  Device::AddFault("DoKill=1");
-  Device::AddFault("Vesk::Task::isFinished=0");
+  AddFaults({"DoKill=1", "Vesk::Task::isFinished=0"});
   const Device::Outcome started = Call("start", JobParams({"/photo/trip"}, "/photo/out.zip"));
   ASSERT_TRUE(WaitUntil([&] { return !Calls("_exit").empty(); }));
   EXPECT_EQ(Ask("stop", started.data["taskid"].asString()).code, 0);

@@ -85,42 +85,11 @@ TEST_F(TaskTest, AStopWhileTheListIsStagedLeavesNoList) {
   }
 }
 
-TEST_F(TaskTest, AnArchiverThatIsKilledFailsTheJob) {
-  const std::string task_id = StartEndlessJob();
-  ASSERT_TRUE(IsPacking());
-  // The newest of the group is the stock 7z.
-  int newest = 0;
-  for (const fs::directory_entry& process : fs::directory_iterator("/proc")) {
-    std::ifstream stat(process.path() / "stat");
-    int pid = 0;
-    int group = 0;
-    std::string skipped;
-    if (stat >> pid >> skipped >> skipped >> skipped >> group && group == Worker()) {
-      newest = std::max(newest, pid);
-    }
-  }
-  ASSERT_EQ(kill(newest, SIGKILL), 0);
-  Outcome last;
-  ASSERT_TRUE(WaitUntil([&] {
-    last = Ask("status", task_id);
-    return last.data["finished"].asBool();
-  }));
-  EXPECT_EQ(last.data["errors"], Device::ParseJson(R"([{"path":"/photo/z.7z","code":1300}])"));
-  EXPECT_FALSE(last.data.isMember("progress"));
-  EXPECT_EQ(EntriesBeside(), 1U);
-}
-
 TEST_F(TaskTest, AFinishedTaskIsReportedOnce) {
   Add("vol1/photo/a.txt", "a");
-  const std::string task_id =
-      Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip")).data["taskid"].asString();
-  Outcome last;
-  ASSERT_TRUE(WaitUntil([&] {
-    last = Ask("status", task_id);
-    return last.data["finished"].asBool();
-  }));
-  EXPECT_EQ(last.data["progress"], 1.0);
-  EXPECT_EQ(Ask("status", task_id).code, 599);
+  EXPECT_EQ(RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"))["progress"], 1.0);
+  const Json::Value task_id = Calls("Vesk::TaskMgr::getUniqueTaskId").front().result;
+  EXPECT_EQ(Ask("status", task_id.asString()).code, 599);
 }
 
 TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
@@ -143,55 +112,10 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
 TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {
   const std::string task_id = StartEndlessJob();
   ASSERT_TRUE(IsPacking());
-  const int worker = Worker();
   // As if the process id were another's now: what the task knows of it no longer fits.
-  {
-    sqlite3* database = nullptr;
-    ASSERT_EQ(sqlite3_open(At("users/alice/store.db").c_str(), &database), SQLITE_OK);
-    sqlite3_busy_timeout(database, 10000);  // the worker writes as well
-    ASSERT_EQ(
-        sqlite3_exec(database, "UPDATE workers SET start_time = 1", nullptr, nullptr, nullptr),
-        SQLITE_OK);
-    sqlite3_close(database);
-  }
+  Device::TaskStore("alice").AddWorker(Worker(), 1);
   Ask("stop", task_id);
-  EXPECT_FALSE(Group(worker).empty());
-  kill(-worker, SIGKILL);
-  EXPECT_TRUE(WaitUntil([&] { return Group(worker).empty(); }));
+  EXPECT_FALSE(Group(Worker()).empty());
 }
-
-// A row names what is stored as "data", the last call that is as in a request that succeeds, and
-// those between it and the answer.
-class TaskAnswers : public TaskTest, public testing::WithParamInterface<TableRow> {};
-
-TEST_P(TaskAnswers, WithItsCodeDataAndCalls) {
-  const TableRow& row = GetParam();
-  const std::string task_id = "Zantro_test";
-  if (row.Has("data")) {
-    Device::TaskStore("alice").AddTask(task_id, {{"data", row.Get("data")}});
-    for (const fs::directory_entry& file : fs::directory_iterator(At("users/alice"))) {
-      EXPECT_EQ(lchown(file.path().c_str(), geteuid() == 0 ? 65001 : -1, -1), 0);
-    }
-  }
-  for (const std::string& fault : row.All("fault")) {
-    Device::AddFault(fault);
-  }
-  const bool has_id = row.Get("last") != "KAVO::APIRequest::HasParam";
-  const Outcome outcome = has_id ? Ask(row.Get("method"), task_id)
-                                 : Call(row.Get("method"), Json::Value(Json::objectValue));
-  EXPECT_EQ(std::to_string(outcome.code) + " " + Device::ToText(outcome.data), row.Get("answer"));
-  EXPECT_EQ(Sequence(Calls("LumoLibUmask").front().pid),
-            UpTo(NamesOf(ExpectedSequence(row.Get("method"))), row.Get("last")) +
-                Words(row.Get("after")) +
-                Words(row.Has("throws") ? "" : "KAVO::APIResponse::SetError") +
-                Words("LumoLibRestoreUmask"));
-  EXPECT_EQ(Log(), row.All("log"));
-  for (const TracedCall& removal : Calls("LumoLibRemoveFinishedTask")) {
-    EXPECT_EQ(removal.args[0].isNull(), !row.Has("data"));
-    EXPECT_EQ(removal.args[1].asString(), row.Get("pid", "-1"));
-  }
-}
-
-INSTANTIATE_TABLE(TaskAnswers, answers);
 
 }  // namespace

@@ -2,19 +2,15 @@
 
 #include <algorithm>
 #include <cstdlib>
-#include <fstream>
 #include <iostream>
+#include <regex>
 
 namespace {
 
-std::string Unescape(std::string text) {
-  for (std::size_t at = 0; (at = text.find('\\', at)) != std::string::npos; ++at) {
-    const char kind = text[at + 1];
-    if (kind == 'n' || kind == 's') {
-      text.replace(at, 2, kind == 'n' ? "\n" : " ");
-    }
-  }
-  return text;
+std::string Unescape(const std::string& text) {
+  static const std::regex kLineFeed(R"(\\n)");
+  static const std::regex kBlank(R"(\\s)");
+  return std::regex_replace(std::regex_replace(text, kLineFeed, "\n"), kBlank, " ");
 }
 
 }  // namespace
@@ -30,10 +26,9 @@ Strings TableRow::All(const std::string& key, const Strings& fallback) const {
 void PrintTo(const TableRow& row, std::ostream* out) { *out << row.name; }
 
 std::vector<TableRow> ReadTable(const std::string& name) {
-  std::ifstream file(std::string(KAVO_TESTS_DIR) + "/tables/" + name);
   std::vector<TableRow> rows;
   bool is_in_row = false;
-  for (std::string line; std::getline(file, line); is_in_row = !line.empty()) {
+  for (const std::string& line : Lines(ReadFile(std::string(KAVO_TESTS_DIR) + "/tables/" + name))) {
     const std::size_t colon = line.find(':');
     if (!is_in_row && !line.empty()) {
       rows.push_back({line, {}});
@@ -41,6 +36,7 @@ std::vector<TableRow> ReadTable(const std::string& name) {
       rows.back().fields[line.substr(0, colon)].push_back(
           Unescape(line.substr(std::min(colon + 2, line.size()))));
     }
+    is_in_row = !line.empty();
   }
   if (rows.empty()) {
     std::cerr << "no table " << name << '\n';

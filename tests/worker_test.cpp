@@ -14,10 +14,8 @@
 
 namespace {
 
-const Strings kSources = {"/photo/trip/a.txt", "/photo/trip/day"};
-
-// A row names the fault, the last call that is as in a job that succeeds, the calls from there to
-// the storing of the outcome, and the items and lines.
+// A row names the fault, or the archiver's output, the last call that is as in a job that succeeds,
+// the calls from there to the storing of the outcome, and the items and lines.
 class JobFails : public DeviceTest, public testing::WithParamInterface<TableRow> {};
 
 TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
@@ -26,21 +24,24 @@ TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
     Add(std::string("vol1/photo/") + name, "text");
   }
   ASSERT_EQ(symlinkat("/etc", AT_FDCWD, At("vol1/photo/host").c_str()), 0);
-  for (const std::string& fault : row.All("fault")) {
-    Device::AddFault(fault);
+  if (row.Has("output")) {
+    ScriptArchiver(row.Get("output"));
   }
+  AddFaults(row.All("fault"));
   std::istringstream libc(row.Get("libc"));
   LibcFault fault;
   libc >> fault.call >> fault.part >> fault.error_number;
   SetLibcFault(fault);
-  Json::Value params = JobParams(row.All("source", kSources), row.Get("dest", "/photo/out.zip"));
-  for (const char* name : {"mode", "level", "password"}) {
-    params[name] = "x";
+  Json::Value params = JobParams(row.All("source", {"/photo/trip/a.txt", "/photo/trip/day"}),
+                                 row.Get("dest", "/photo/out.zip"));
+  const Json::Value options =
+      Device::ParseJson(row.Get("params", R"({"mode":"x","level":"x","password":"x"})"));
+  for (const std::string& name : options.getMemberNames()) {
+    params[name] = options[name];
   }
   Strings items = FailJob(params, row.Get("user", "alice"));
-  for (std::string& item : items) {
-    item = Plain(item);
-  }
+  std::transform(items.begin(), items.end(), items.begin(),
+                 [&](const std::string& item) { return Plain(item); });
   EXPECT_EQ(items, row.All("item"));
   Strings log = Log();
   for (std::string& line : log) {
@@ -52,8 +53,7 @@ TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
   const Strings job =
       NamesOf(ExpectedSequence(is_staged ? "job_of_two_shares" : "job_of_one_share"));
   const Strings end = Behind(NamesOf(ExpectedSequence("failed_job")), "syslog");
-  EXPECT_EQ(Sequence(Fork().result.asInt()),
-            UpTo(job, row.Get("last")) + Words(row.Get("after")) + end);
+  EXPECT_EQ(Sequence(Worker()), UpTo(job, row.Get("last")) + Words(row.Get("after")) + end);
   for (const std::string& path : StagedPaths()) {
     EXPECT_EQ(row.name, "ParentLongerThanSource") << path;
   }
@@ -68,8 +68,7 @@ class WorkerTest : public DeviceTest {
 };
 
 TEST_F(WorkerTest, NotifiesOfAFailureWithTwoArguments) {
-  Device::AddFault("Vesk::Task::getBoolProperty=1");
-  Device::AddFault("LumoLibGetPrivilege=-1:402");
+  AddFaults({"Vesk::Task::getBoolProperty=1", "LumoLibGetPrivilege=-1:402"});
   RunJob(JobParams({"/photo/a.txt"}, "/photo/<b>.zip"));
   const Json::Value sent = Calls("Vesk::Task::sendNotifyMessageNoEncode").front().args;
   EXPECT_EQ(Plain(Device::ToText(sent)),
@@ -84,8 +83,7 @@ TEST_F(WorkerTest, TakesAnArchiveOfItselfForDone) {
   const Json::Value answer = RunJob(JobParams({"/photo/z.zip"}, "/photo/z.zip/"));
   EXPECT_FALSE(answer.isMember("errors"));
   const Strings end = Behind(NamesOf(ExpectedSequence("job_of_one_share")), "unlink");
-  EXPECT_EQ(Sequence(Fork().result.asInt()),
-            Words("KLIBCProcFork signal WaitForTaskDataReady") + end);
+  EXPECT_EQ(Sequence(Worker()), Words("KLIBCProcFork signal WaitForTaskDataReady") + end);
   RunJob(JobParams({"/photo/z.zip", "/photo/z.zip"}, "/photo/z.zip"));
   EXPECT_EQ(LastData()["errors"].size(), 2U);
 }
@@ -96,7 +94,7 @@ TEST_F(WorkerTest, DoesNotFinishATaskItCannotRead) {
   ASSERT_TRUE(WaitUntil([&] { return !Calls("_exit").empty(); }));
   EXPECT_EQ(Log().front(), "Failed to get task data");
   EXPECT_EQ(Log().back(), "Failed to get json data");
-  EXPECT_EQ(Behind(Sequence(Fork().result.asInt()), "Vesk::Task::getProperty"),
+  EXPECT_EQ(Behind(Sequence(Worker()), "Vesk::Task::getProperty"),
             Words("syslog KAVO::APIRequest::GetLoginUserName CleanTimeOutTasks _exit"));
   EXPECT_TRUE(Calls("SaveTaskData").empty());
 }
@@ -117,16 +115,6 @@ TEST_F(WorkerTest, LogsWhatItCannotStoreAndEndsAllTheSame) {
   }
 }
 
-TEST_F(WorkerTest, TakesARequestValueThatIsNoTextForAFailure) {
-  for (const char* param : {"level", "mode", "format", "password"}) {
-    Json::Value params = JobParams({"/photo/a.txt"}, "/photo/z.zip");
-    params[param] = Json::Value(Json::objectValue);
-    EXPECT_EQ(FailJob(params), Strings{"/photo/z.zip: 1300"}) << param;
-  }
-  EXPECT_TRUE(Calls("KLIBCPopenv").empty());
-  EXPECT_TRUE(StagedPaths().empty());
-}
-
 TEST_F(WorkerTest, AsksOncePerShareAndPassesOverSourcesOfOneThatIsNotListed) {
   Add("vol1/photo/b.txt", "text");
   Add("vol1/music/m.txt", "text");
@@ -137,55 +125,28 @@ TEST_F(WorkerTest, AsksOncePerShareAndPassesOverSourcesOfOneThatIsNotListed) {
   // The second source of the share that was asked about already.
   ASSERT_EQ(Calls("stat").size(), 1U);
   EXPECT_EQ(Calls("stat").front().args[0], At("vol1/photo/b.txt"));
-  EXPECT_EQ(LastData().isMember("errors"), false);
-}
-
-TEST_F(WorkerTest, ThePrivilegeOfTheDestinationIsLevelTwoWithoutTheFlag) {
-  ScriptArchiver("");
-  Add("vol1/photo/z.zip", "an archive");
-  const struct {
-    const char* outputs;
-    bool suffices;
-  } rows[] = {{R"("level":2)", true},
-              {R"("level":2,"flags":1)", true},
-              {R"("level":2,"flags":2)", false},
-              {R"("level":2,"flags":3)", false},
-              {R"("level":2,"flags":6)", false},
-              {R"("level":1)", false},
-              {R"("level":3)", false}};
-  for (const auto& row : rows) {
-    Watch();
-    Device::AddFault(std::string(R"(LumoLibGetPrivilege={"result":0,)") + row.outputs + "}");
-    const Json::Value answer = RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"));
-    EXPECT_EQ(!answer.isMember("errors"), row.suffices) << row.outputs;
-    EXPECT_EQ(Log(),
-              row.suffices ? Strings{} : Strings{"Extract destination privilege not enough"});
-  }
 }
 
 TEST_F(WorkerTest, NamesAndPathsOverTheSystemsLimit) {
-  const std::string name = "/photo/" + std::string(256, 'n');
-  EXPECT_EQ(FailJob(JobParams({name}, "/photo/z.zip")), Strings{name + ": 412"});
-  const std::string path = "/photo/" + std::string(1 << 20U, 'p');
-  EXPECT_EQ(FailJob(JobParams({path}, "/photo/z.zip")), Strings{path + ": 412"});
+  for (const std::size_t size : {std::size_t{256}, std::size_t{1} << 20U}) {
+    const std::string path = "/photo/" + std::string(size, 'n');
+    EXPECT_EQ(FailJob(JobParams({path}, "/photo/z.zip")), Strings{path + ": 412"});
+  }
 }
 
 // Resolved paths that no file system holds; an unlisted share is not looked into.
 class LongPathTest : public WorkerTest {
  protected:
-  LongPathTest() {
+  void SetUp() override {
     ScriptArchiver("");
-    Device::AddFault("CheckShareListPrivilege=0");
-    Device::AddFault("LumoCheckPath=0");
+    Watch();
+    AddFaults({"CheckShareListPrivilege=0", "LumoCheckPath=0", "VolumePathParse=0",
+               "FindCommonParent=/", "ACLAccess=0", "LumoCheckFileName=0"});
   }
   static void Resolve(int call, const std::string& field, const std::string& path) {
-    Json::Value outputs;
-    outputs["result"] = 1;
-    outputs["share_name"] = "share" + std::to_string(call);
-    outputs["share_real_path"] = "/";
-    outputs[field] = path;
-    Device::AddFault("PathInfoFactory::create#" + std::to_string(call) + "=" +
-                     Device::ToText(outputs));
+    const std::string number = std::to_string(call);
+    Device::AddFault("PathInfoFactory::create#" + number + R"(={"result":1,"share_name":"share)" +
+                     number + R"(","share_real_path":"/",")" + field + R"(":")" + path + "\"}");
   }
 };
 
@@ -198,11 +159,7 @@ TEST_F(LongPathTest, ALineThatDoesNotFitIsRefused) {
               {"share_path", {"/photo/a.txt", "/music"}, 4117}};
   for (const auto& row : rows) {
     for (const std::size_t excess : {0U, 1U}) {
-      Watch();
-      for (const char* rule : {"CheckShareListPrivilege=0", "LumoCheckPath=0", "VolumePathParse=0",
-                               "FindCommonParent=/"}) {
-        Device::AddFault(rule);
-      }
+      SetUp();
       Resolve(1, row.field, "/" + std::string(row.longest + excess - 1, 'n'));
       Resolve(2, row.field, "/n");
       const Json::Value answer = RunJob(JobParams(row.sources, "/photo/z.zip"));
@@ -214,9 +171,6 @@ TEST_F(LongPathTest, ALineThatDoesNotFitIsRefused) {
 
 TEST_F(LongPathTest, PathsAreCutToTheirBuffers) {
   const std::string path = "/" + std::string(4000, 'd') + "/" + std::string(1000, 'n');
-  for (const char* rule : {"VolumePathParse=0", "ACLAccess=0", "LumoCheckFileName=0"}) {
-    Device::AddFault(rule);
-  }
   Device::AddFault(R"(LumoFullPathGet={"result":1,"full_path":")" + path + "\"}");
   Resolve(2, "real_path", path);
   RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"));

@@ -8,7 +8,7 @@
 #include <cerrno>
 #include <iterator>
 #include <memory>
-#include <unordered_set>
+#include <set>
 
 #include "device/archiver/code_page.h"
 #include "device/archiver/failure.h"
@@ -87,6 +87,7 @@ void Pack(const Request& request, PackRun run, const std::string& folder, const 
   child.folder = folder;
   child.input_fd = password.Get();
   child.kept_fds = {sources.Get(), left_out.Get()};
+  child.left_out = run.left_out_links;
   Run7z(child, cancel, report);
 }
 
@@ -96,7 +97,7 @@ void PackWithSpecials(const Request& request, PackRun run, std::vector<std::stri
                       const std::vector<std::string>& sources, const WorkPlace& place,
                       const Cancel& cancel, Report& report) {
   const std::vector<std::string> specials = FindSpecials(place, sources, request.exclude);
-  const std::unordered_set<std::string> known(specials.begin(), specials.end());
+  const std::set<std::string> known(specials.begin(), specials.end());
   std::vector<std::string> others;
   std::copy_if(sources.begin(), sources.end(), std::back_inserter(others),
                [&](const std::string& source) { return known.count(source) == 0; });
@@ -105,6 +106,7 @@ void PackWithSpecials(const Request& request, PackRun run, std::vector<std::stri
     run.sources = DivideNames(others);
     run.left_out = DivideNames(left_out);
     run.follow_links = !place.shares.empty();
+    run.left_out_links = known;
     Pack(request, run, place.folder, cancel, report);
     if (run.follow_links && FindSpecials(place, sources, request.exclude) != specials) {
       throw Failure("symbolic links changed while they were packed");
@@ -117,6 +119,7 @@ void PackWithSpecials(const Request& request, PackRun run, std::vector<std::stri
     run.sources = DivideNames(specials);
     run.left_out = {};
     run.follow_links = false;
+    run.left_out_links.clear();
     Pack(request, run, mirror.Path(), cancel, report);
   }
 }

@@ -9,6 +9,13 @@ namespace Archiver {
 namespace {
 
 constexpr size_t kEnough = 16384;
+constexpr char kWarning[] = "WARNING: ";
+
+// The end of the two lines of the warning that begins at `mark`, cause and object.
+size_t EndOfWarning(const std::string& text, size_t mark) {
+  const size_t cause_end = text.find('\n', mark);
+  return cause_end == std::string::npos ? cause_end : text.find('\n', cause_end + 1);
+}
 
 std::string WithoutHeading(const std::string& line) {
   for (const std::string heading : {"ERROR:", "Error:", "System ERROR:", "ERRORS:", "WARNING:",
@@ -35,14 +42,23 @@ std::string Explain(const std::string& line) {
 }  // namespace
 
 void ErrorText::Feed(const std::string& bytes) {
-  text_.append(bytes, 0, kEnough - std::min(kEnough, text_.size()));
+  text_ += bytes;
+  for (size_t mark = text_.find(kWarning); mark != std::string::npos;
+       mark = text_.find(kWarning, mark)) {
+    const size_t end = EndOfWarning(text_, mark);
+    const size_t object = text_.find('\n', mark) + 1;
+    if (end == std::string::npos || left_out_.count(text_.substr(object, end - object)) == 0) {
+      break;
+    }
+    text_.erase(mark, end - mark);
+    has_passed_over_ = true;
+  }
+  text_.resize(std::min(kEnough, text_.size()));
 }
 
 bool ErrorText::HasWarning() const {
-  const size_t mark = text_.find("WARNING: ");
-  const size_t cause_end = text_.find('\n', mark);
-  return mark != std::string::npos && cause_end != std::string::npos &&
-         text_.find('\n', cause_end + 1) != std::string::npos;
+  const size_t mark = text_.find(kWarning);
+  return mark != std::string::npos && EndOfWarning(text_, mark) != std::string::npos;
 }
 
 std::string ErrorText::Line() const {

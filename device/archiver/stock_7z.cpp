@@ -22,6 +22,7 @@ const char* const kStock7z = KAVO_STOCK_7Z;
 
 namespace {
 
+constexpr int kWarned = 1;  // its exit status
 constexpr char kCannotStart[] = "cannot start";
 
 struct Pipe {
@@ -196,14 +197,15 @@ void Run7z(const Child7z& child, const Cancel& cancel, Report& report) {
     throw SystemFailure(kCannotStart, child.program, error);
   }
 
-  ErrorText text;
+  ErrorText text(child.left_out);
   Drain(output.reader, errors.reader, &text, cancel, report);
   if (text.HasWarning()) {
     throw Failure("not everything can be packed: " + text.Line());
   }
   const int status = process.Wait();
   cancel.Check();  // the whole group gets the signal, and 7z may have been the first to go
-  if (WIFEXITED(status) && WEXITSTATUS(status) == 0 && text.Empty()) {
+  if (WIFEXITED(status) && WEXITSTATUS(status) <= (text.HasPassedOver() ? kWarned : 0) &&
+      text.Empty()) {
     return;
   }
   const std::string end = WIFSIGNALED(status)

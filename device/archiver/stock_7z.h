@@ -1,6 +1,7 @@
 #ifndef DEVICE_ARCHIVER_STOCK_7Z_H_
 #define DEVICE_ARCHIVER_STOCK_7Z_H_
 
+#include <set>
 #include <string>
 #include <vector>
 
@@ -17,6 +18,7 @@ struct Child7z {
   std::string folder;                  // its working directory
   int input_fd = -1;                   // its standard input; -1 for none
   std::vector<int> kept_fds;           // stay open under their numbers
+  std::set<std::string> left_out;      // it may warn about these and do without them
 };
 
 // Runs 7z to its end and passes on what it reports. Throws Failure when it did not pack everything

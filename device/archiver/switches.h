@@ -1,6 +1,7 @@
 #ifndef DEVICE_ARCHIVER_SWITCHES_H_
 #define DEVICE_ARCHIVER_SWITCHES_H_
 
+#include <set>
 #include <string>
 #include <vector>
 
@@ -18,6 +19,7 @@ struct PackRun {
   std::string sources_file;  // path under which 7z finds the text of sources.list
   std::string left_out_file;
   bool follow_links = false;
+  std::set<std::string> left_out_links;  // among left_out; 7z warns of those that lead nowhere
 };
 
 // The argument vector of `run`, without the program's name.

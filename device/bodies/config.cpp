@@ -115,7 +115,8 @@ User ReadUser(const ConfigReader& reader, const Json::Value& value) {
        {"uid", [&](const Json::Value& each) { user.uid = ReadUid(reader, each); }},
        {"home", [&](const Json::Value& each) { user.home = reader.Name(each); }}},
       {{"admin", [&](const Json::Value& each) { user.admin = reader.Bool(each); }},
-       {"codepage", [&](const Json::Value& each) { user.codepage = reader.Text(each); }}});
+       {"codepage", [&](const Json::Value& each) { user.codepage = reader.Text(each); }},
+       {"password", [&](const Json::Value& each) { user.password = reader.Text(each); }}});
   return user;
 }
 

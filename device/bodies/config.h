@@ -15,6 +15,7 @@ struct User {
   uid_t uid = 0;
   bool admin = false;
   std::string codepage;  // of the personal settings; may be empty
+  std::string password;  // as crypt(3) has it; empty: the user cannot sign in
   std::string home;      // the volume that holds the home folder
 };
 

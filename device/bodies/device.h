@@ -12,6 +12,7 @@
 
 #include "device/bodies/config.h"
 #include "device/bodies/file_descriptor.h"
+#include "device/bodies/session.h"
 
 namespace Device {
 
@@ -29,7 +30,7 @@ struct OpenDevice {
   FileDescriptor archiver;         // the program that runs in place of /usr/bin/7z
   FileDescriptor module;           // the shared library that serves the requests
 
-  std::map<std::string, std::string> sessions;  // session id to user name
+  std::map<std::string, Session> sessions;  // by session id
   std::string current_user;  // whose identity this process has; empty: the device's own
   bool is_followed = false;  // the client of this request watches the task to its end
   FileDescriptor outcome;    // where a request process writes its outcome; no worker may hold it

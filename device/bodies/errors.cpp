@@ -35,9 +35,9 @@ constexpr TextRow kTexts[] = {
     {kErrNoSpace, "no space left on device"},
     {kErrBadName, "not a valid file name"},
     {kErrOutsideShare, "the path leads out of its shared folder"},
-    {599, "no such task"},
-    {1300, "the archive could not be made"},
-    {1301, "the archive's name is longer than 255 bytes"},
+    {kErrNoTask, "no such task"},
+    {kErrArchive, "the archive could not be made"},
+    {kErrArchiveName, "the archive's name is longer than 255 bytes"},
 };
 
 struct ErrnoRow {
@@ -73,6 +73,14 @@ const char* ErrorText(int code) {
   const auto* const row = std::find_if(std::begin(kTexts), std::end(kTexts),
                                        [&](const TextRow& each) { return each.code == code; });
   return row == std::end(kTexts) ? "unknown error" : row->text;
+}
+
+std::map<int, std::string> ErrorTexts() {
+  std::map<int, std::string> texts;
+  for (const TextRow& row : kTexts) {
+    texts[row.code] = row.text;
+  }
+  return texts;
 }
 
 }  // namespace Device

@@ -2,6 +2,9 @@
 #ifndef DEVICE_BODIES_ERRORS_H_
 #define DEVICE_BODIES_ERRORS_H_
 
+#include <map>
+#include <string>
+
 namespace Device {
 
 enum LibraryError : int {
@@ -20,8 +23,11 @@ enum LibraryError : int {
   kErrNameTooLongCrypt = 413,
   kErrQuota = 415,
   kErrNoSpace = 416,
-  kErrBadName = 418,      // a name that no file can have
-  kErrOutsideShare = 419  // a path that leads out of its shared folder or off the volumes
+  kErrBadName = 418,       // a name that no file can have
+  kErrOutsideShare = 419,  // a path that leads out of its shared folder or off the volumes
+  kErrNoTask = 599,
+  kErrArchive = 1300,  // the archive could not be made
+  kErrArchiveName = 1301
 };
 
 // Leaves the code for LumoLibGetErr.
@@ -31,6 +37,8 @@ void SetLastErrno(int error_number);
 
 // What a web API error code means, in English. Never null.
 const char* ErrorText(int code);
+// All of them.
+std::map<int, std::string> ErrorTexts();
 
 }  // namespace Device
 

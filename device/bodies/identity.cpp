@@ -38,7 +38,8 @@ int SwitchTo(const char* session_id, const char* name) {
   }
   if (session_id != nullptr && *session_id != '\0') {
     const auto session = device.sessions.find(session_id);
-    if (session == device.sessions.end() || session->second != user->name) {
+    if (session == device.sessions.end() || session->second.user != user->name ||
+        session->second.has_ended.IsSet()) {
       SetLastError(kErrSession);
       errno = EACCES;
       return -1;

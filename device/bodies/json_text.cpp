@@ -7,12 +7,23 @@ namespace Device {
 
 namespace {
 
+constexpr char kHexDigits[] = "0123456789abcdefABCDEF";
+constexpr int kHexBase = 16;
+constexpr unsigned long kFirstHighSurrogate = 0xD800;
+constexpr unsigned long kLastHighSurrogate = 0xDBFF;
+constexpr unsigned long kFirstByteEscape = 0xDC80;
+constexpr unsigned long kLastByteEscape = 0xDCFF;
+constexpr unsigned long kFirstByte = 0x80;
+
 // The parser says "* Line 4, Column 1\n  Missing ...\n", once for each error. No regular
 // expression: what is missing may be quoted at any length.
 std::string FirstError(const std::string& errors) {
   const std::size_t line = errors.find_first_of("0123456789");
-  const std::size_t reason = errors.find_first_not_of(' ', errors.find('\n') + 1);
-  return "line " + errors.substr(line, errors.find(',') - line) + ": " +
+  const std::size_t column = errors.find_first_of("0123456789", errors.find(','));
+  const std::size_t end = errors.find('\n');
+  const std::size_t reason = errors.find_first_not_of(' ', end + 1);
+  return "line " + errors.substr(line, errors.find(',') - line) + ", column " +
+         errors.substr(column, end - column) + ": " +
          errors.substr(reason, errors.find('\n', reason) - reason);
 }
 
@@ -64,6 +75,32 @@ Json::Value ParseJson(const std::string& text, int depth) {
     throw std::runtime_error(FirstError(errors));
   }
   return value;
+}
+
+std::string DecodeByteEscapes(const std::string& json) {
+  constexpr std::size_t kEscape = sizeof "\\udc80" - 1;
+  const auto code_at = [&](std::size_t at) {
+    const bool is_escape = at + kEscape <= json.size() && json[at] == '\\' && json[at + 1] == 'u';
+    const std::string digits = is_escape ? json.substr(at + 2, kEscape - 2) : "";
+    const bool is_code = is_escape && digits.find_first_not_of(kHexDigits) == std::string::npos;
+    return is_code ? std::stoul(digits, nullptr, kHexBase) : 0;
+  };
+  std::string decoded;
+  for (std::size_t at = 0; at < json.size();) {
+    const unsigned long code = code_at(at);
+    std::size_t length = json[at] == '\\' ? 2 : 1;  // as it stands
+    if (code >= kFirstByteEscape && code <= kLastByteEscape) {
+      decoded += static_cast<char>(code - kFirstByteEscape + kFirstByte);
+      at += kEscape;
+      continue;
+    }
+    if (code >= kFirstHighSurrogate && code <= kLastHighSurrogate) {
+      length = 2 * kEscape;  // with the other half of the pair
+    }
+    decoded.append(json, at, length);
+    at += length;
+  }
+  return decoded;
 }
 
 }  // namespace Device

@@ -19,6 +19,10 @@ inline constexpr int kParamDepth = kTextDepth - 10;
 // commas and repeated keys are refused.
 Json::Value ParseJson(const std::string& text, int depth = kTextDepth);
 
+// Takes the escapes \udc80 to \udcff, where they stand alone, for the bytes 0x80 to 0xFF, so that a
+// JSON text in UTF-8 can hold any file name.
+std::string DecodeByteEscapes(const std::string& json);
+
 }  // namespace Device
 
 #endif  // DEVICE_BODIES_JSON_TEXT_H_

@@ -20,6 +20,7 @@ namespace fs = std::filesystem;
 
 constexpr mode_t kFolderMode = 0755;
 constexpr mode_t kPrivateMode = 0700;
+constexpr mode_t kConfigMode = 0600;  // it holds password hashes
 
 [[noreturn]] void FailFor(const std::string& what) {
   throw std::runtime_error(what + ": " + std::strerror(errno));
@@ -107,7 +108,8 @@ void MakeFolders(const std::string& root, const Config& config, const std::strin
     MakeShare(root, config, share);
   }
   std::ofstream file(root + "/" + kConfigFile);
-  if (!(file << config_text << std::flush)) {
+  if (!(file << config_text << std::flush) ||
+      chmod((root + "/" + kConfigFile).c_str(), kConfigMode) != 0) {
     FailFor(kConfigFile);
   }
 }

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
+#include <csignal>
 #include <cstring>
 #include <stdexcept>
 
@@ -218,6 +219,9 @@ const Fault* Operation::CountAndMatch(const char* name) {
 void Operation::ApplyFault() {
   if (fault_->has_code) {
     SetLastError(fault_->code);
+  }
+  if (fault_->result == "crash") {
+    raise(SIGKILL);
   }
   if (fault_->result == "throw") {
     Trace(Json::Value("throws"));

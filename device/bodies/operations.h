@@ -23,9 +23,10 @@ namespace Device {
 void OpenTrace(const std::string& path);
 
 // Adds a rule CALL[#N]=RESULT[:CODE]. The Nth call, or every call, answers RESULT instead of doing
-// its work and leaves CODE as the library's last error. RESULT is a number, a text, `null`, or
-// `throw`; or an object {"result": RESULT, NAME: VALUE...} that also fills the operation's outputs
-// of those names. Throws std::invalid_argument for a rule that is none or names no operation.
+// its work and leaves CODE as the library's last error. RESULT is a number, a text, `null`,
+// `throw`, or `crash`, by which the process is killed; or an object {"result": RESULT, NAME:
+// VALUE...} that also fills the operation's outputs of those names. Throws std::invalid_argument
+// for a rule that is none or names no operation.
 void AddFault(const std::string& rule);
 
 // The names of all operations, as rules and trace lines have them.

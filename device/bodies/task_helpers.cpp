@@ -49,9 +49,9 @@ bool HoldsErrors(const Json::Value& data) { return data.isObject() && data.isMem
 // The worker that the task's data names, -1 when it names none.
 pid_t WorkerOf(const TaskRow& row) {
   const auto data = row.properties.find(kPropData);
-  const Json::Value value = data == row.properties.end() ? Json::Value() : ParseJson(data->second);
-  const Json::Value pid = value.isObject() ? value[kDataPid] : Json::Value();
-  return pid.isInt() ? pid.asInt() : -1;
+  const bool has_pid =
+      data != row.properties.end() && data->second.isObject() && data->second[kDataPid].isInt();
+  return has_pid ? data->second[kDataPid].asInt() : -1;
 }
 
 // When a worker went is not known; its last word in the store counts.
@@ -92,10 +92,11 @@ using Device::Operation;
 
 int SaveTaskData(Vesk::Task* task, Json::Value& data, float progress) {
   return Operation("SaveTaskData", task, data, progress).Run([&] {
-    task->state->is_updating = true;
-    task->state->Set(Device::kPropData, data);
-    task->state->Set(Device::kPropProgress, static_cast<double>(progress));
-    return task->state->Store(false) ? 1 : 0;
+    const Json::Value fraction = static_cast<double>(progress);
+    return task->state->StoreNow({{Device::kPropData, &data}, {Device::kPropProgress, &fraction}},
+                                 false)
+               ? 1
+               : 0;
   });
 }
 

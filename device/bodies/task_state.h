@@ -1,5 +1,6 @@
-// What is behind a Vesk::Task: the row as this process knows it, and the writes that are gathered.
-// The task manager's own operations work on this, so that a trace shows the module's calls alone.
+// What is behind a Vesk::Task: the row as this process last read or wrote it, and the writes that
+// are gathered. The task manager's own operations work on this, so that a trace shows the module's
+// calls alone.
 #ifndef DEVICE_BODIES_TASK_STATE_H_
 #define DEVICE_BODIES_TASK_STATE_H_
 
@@ -18,15 +19,20 @@ struct Vesk::Task::State {
   bool Set(const std::string& name, const Json::Value& value);
   // Stores what is gathered and closes the update. False, and a line logged, when it is not stored.
   bool Store(bool is_finished);
+  // Stores these, and nothing that is gathered.
+  bool StoreNow(const std::map<std::string, const Json::Value*>& properties, bool is_finished);
   // False when the task was removed meanwhile; it has no properties then. A store that cannot be
   // read is logged and leaves the task as it was known.
   bool Reload();
   void Remove();
 
+  // Makes the row what is stored again.
+  void Forget();
+
   std::string user;
   Device::TaskRow row;
   bool is_updating = false;
-  std::map<std::string, std::string> pending;  // name to JSON text
+  std::map<std::string, Json::Value> pending;
 };
 
 #endif  // DEVICE_BODIES_TASK_STATE_H_

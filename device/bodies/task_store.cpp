@@ -1,7 +1,9 @@
 #include "device/bodies/task_store.h"
 
+#include <algorithm>
 #include <ctime>
 #include <stdexcept>
+#include <utility>
 
 #include "device/bodies/device.h"
 #include "device/bodies/json_text.h"
@@ -16,16 +18,24 @@ constexpr char kSchema[] = R"(
 PRAGMA journal_mode = WAL;
 PRAGMA synchronous = NORMAL;
 CREATE TABLE IF NOT EXISTS tasks (
-  id TEXT PRIMARY KEY, finished INTEGER NOT NULL, updated INTEGER NOT NULL) WITHOUT ROWID;
-CREATE TABLE IF NOT EXISTS properties (
-  task TEXT NOT NULL, name TEXT NOT NULL, value TEXT NOT NULL,
-  PRIMARY KEY (task, name)) WITHOUT ROWID;
+  id TEXT PRIMARY KEY, finished INTEGER NOT NULL, updated INTEGER NOT NULL,
+  version INTEGER NOT NULL) WITHOUT ROWID;
+-- Of each property a row without a member: its value, or "{}" for an object. Of each member of an
+-- object a row, whose value is null when it is gone. So a change of one member costs that member.
+CREATE TABLE IF NOT EXISTS members (
+  task TEXT NOT NULL, name TEXT NOT NULL, member TEXT NOT NULL, value TEXT,
+  version INTEGER NOT NULL, PRIMARY KEY (task, name, member));
 CREATE TABLE IF NOT EXISTS workers (pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL);
 CREATE TABLE IF NOT EXISTS notifications (
   time INTEGER NOT NULL, app TEXT NOT NULL, task TEXT NOT NULL, title TEXT NOT NULL,
   message TEXT NOT NULL, arguments TEXT NOT NULL);
 CREATE TABLE IF NOT EXISTS file_index (path TEXT PRIMARY KEY, time INTEGER NOT NULL) WITHOUT ROWID;
 )";
+
+constexpr char kForReading[] = "BEGIN";
+constexpr char kForWriting[] = "BEGIN IMMEDIATE";
+constexpr char kWhole[] = "";      // in place of a member's name
+constexpr char kMemberMark = '.';  // before it
 
 }  // namespace
 
@@ -48,6 +58,10 @@ class TaskStore::Statement {
     Check(sqlite3_bind_int64(statement_.get(), ++bound_, number));
     return *this;
   }
+  Statement& BindNull() {
+    Check(sqlite3_bind_null(statement_.get(), ++bound_));
+    return *this;
+  }
   // True when there is a row.
   bool Step() {
     const int result = sqlite3_step(statement_.get());
@@ -60,6 +74,9 @@ class TaskStore::Statement {
     const auto* const text =
         reinterpret_cast<const char*>(sqlite3_column_text(statement_.get(), column));
     return {text, static_cast<std::size_t>(sqlite3_column_bytes(statement_.get(), column))};
+  }
+  bool IsNull(int column) const {
+    return sqlite3_column_type(statement_.get(), column) == SQLITE_NULL;
   }
   std::int64_t Number(int column) const { return sqlite3_column_int64(statement_.get(), column); }
 
@@ -90,8 +107,8 @@ TaskStore::TaskStore(const std::string& user) : database_(nullptr, sqlite3_close
   }
 }
 
-void TaskStore::InTransaction(const std::function<void()>& body) {
-  Statement(database_.get(), "BEGIN IMMEDIATE").Step();
+void TaskStore::InTransaction(const char* begin, const std::function<void()>& body) {
+  Statement(database_.get(), begin).Step();
   try {
     body();
     Statement(database_.get(), "COMMIT").Step();
@@ -101,96 +118,159 @@ void TaskStore::InTransaction(const std::function<void()>& body) {
   }
 }
 
-void TaskStore::AddTask(const std::string& id,
-                        const std::map<std::string, std::string>& properties) {
-  InTransaction([&] {
-    Statement(database_.get(), "INSERT INTO tasks VALUES (?, 0, ?)")
-        .Bind(id)
-        .Bind(std::time(nullptr))
+void TaskStore::AddTask(TaskRow& row) {
+  const std::map<std::string, Json::Value> properties = std::exchange(row.properties, {});
+  InTransaction(kForWriting, [&] {
+    row.updated = std::time(nullptr);
+    row.version = 1;
+    Statement(database_.get(), "INSERT INTO tasks VALUES (?, 0, ?, ?)")
+        .Bind(row.id)
+        .Bind(row.updated)
+        .Bind(row.version)
         .Step();
-    WriteProperties(id, properties);
+    for (const auto& [name, value] : properties) {
+      WriteProperty(row, name, value);
+    }
   });
 }
 
-void TaskStore::WriteProperties(const std::string& id,
-                                const std::map<std::string, std::string>& properties) {
-  for (const auto& [name, value] : properties) {
-    Statement(database_.get(), "INSERT OR REPLACE INTO properties VALUES (?, ?, ?)")
-        .Bind(id)
-        .Bind(name)
-        .Bind(value)
-        .Step();
+void TaskStore::WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
+                            const Json::Value* value) {
+  Statement insert(database_.get(), "INSERT OR REPLACE INTO members VALUES (?, ?, ?, ?, ?)");
+  insert.Bind(row.id).Bind(name).Bind(member);
+  if (value == nullptr) {
+    insert.BindNull();
+  } else {
+    insert.Bind(ToText(*value));
+  }
+  insert.Bind(row.version).Step();
+}
+
+void TaskStore::WriteProperty(TaskRow& row, const std::string& name, const Json::Value& value) {
+  const bool is_known = row.properties.count(name) != 0;
+  Json::Value& known = row.properties[name];
+  for (const std::string& member :
+       known.isObject() ? known.getMemberNames() : Json::Value::Members()) {
+    if (!value.isObject() || !value.isMember(member)) {
+      WriteMember(row, name, kMemberMark + member, nullptr);
+      known.removeMember(member);
+    }
+  }
+  if (!value.isObject()) {
+    if (!is_known || known != value) {
+      WriteMember(row, name, kWhole, &value);
+      known = value;
+    }
+    return;
+  }
+  if (!known.isObject()) {
+    known = Json::Value(Json::objectValue);
+    WriteMember(row, name, kWhole, &known);
+  }
+  for (auto member = value.begin(); member != value.end(); ++member) {
+    const std::string key = member.name();
+    if (!known.isMember(key) || known[key] != *member) {
+      WriteMember(row, name, kMemberMark + key, &*member);
+      known[key] = *member;
+    }
   }
 }
 
-void TaskStore::ReadProperties(TaskRow& row) {
-  Statement select(database_.get(), "SELECT name, value FROM properties WHERE task = ?");
-  select.Bind(row.id);
-  while (select.Step()) {
-    row.properties[select.Text(0)] = select.Text(1);
+bool TaskStore::ReadChanges(TaskRow& row) {
+  Statement task(database_.get(), "SELECT finished, updated, version FROM tasks WHERE id = ?");
+  if (!task.Bind(row.id).Step()) {
+    return false;
   }
+  Statement changes(database_.get(),
+                    "SELECT name, member, value FROM members WHERE task = ? AND version > ? "
+                    "ORDER BY name, member");
+  changes.Bind(row.id).Bind(row.version);
+  while (changes.Step()) {
+    Json::Value& property = row.properties[changes.Text(0)];
+    const std::string member = changes.Text(1);
+    if (member == kWhole) {
+      const Json::Value value = ParseJson(changes.Text(2));
+      property = value.isObject() && property.isObject() ? property : value;
+    } else if (changes.IsNull(2)) {
+      property.removeMember(member.substr(sizeof kMemberMark));
+    } else {
+      property[member.substr(sizeof kMemberMark)] = ParseJson(changes.Text(2));
+    }
+  }
+  row.finished = task.Number(0) != 0;
+  row.updated = task.Number(1);
+  row.version = task.Number(2);
+  return true;
+}
+
+bool TaskStore::RefreshTask(TaskRow& row) {
+  bool is_found = false;
+  InTransaction(kForReading, [&] { is_found = ReadChanges(row); });
+  return is_found;
 }
 
 std::optional<TaskRow> TaskStore::FindTask(const std::string& id) {
   TaskRow row;
   row.id = id;
-  bool is_found = false;
-  // One transaction, so that the properties are those of one moment.
-  Statement(database_.get(), "BEGIN").Step();
-  try {
-    Statement select(database_.get(), "SELECT finished, updated FROM tasks WHERE id = ?");
-    is_found = select.Bind(id).Step();
-    if (is_found) {
-      row.finished = select.Number(0) != 0;
-      row.updated = select.Number(1);
-      ReadProperties(row);
+  return RefreshTask(row) ? std::optional<TaskRow>(std::move(row)) : std::nullopt;
+}
+
+void TaskStore::RefreshTasks(std::map<std::string, TaskRow>& rows) {
+  InTransaction(kForReading, [&] {
+    std::map<std::string, TaskRow> known = std::exchange(rows, {});
+    Statement select(database_.get(), "SELECT id FROM tasks");
+    while (select.Step()) {
+      const std::string id = select.Text(0);
+      TaskRow& row = rows[id];
+      row = std::move(known[id]);
+      row.id = id;
+      ReadChanges(row);
     }
-  } catch (...) {
-    sqlite3_exec(database_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
-    throw;
-  }
-  Statement(database_.get(), "COMMIT").Step();
-  return is_found ? std::optional<TaskRow>(std::move(row)) : std::nullopt;
+  });
 }
 
 std::vector<TaskRow> TaskStore::AllTasks() {
-  std::vector<std::string> ids;
-  {
-    Statement select(database_.get(), "SELECT id FROM tasks ORDER BY updated, id");
-    while (select.Step()) {
-      ids.push_back(select.Text(0));
-    }
+  std::map<std::string, TaskRow> rows;
+  RefreshTasks(rows);
+  std::vector<TaskRow> all;
+  for (auto& [id, row] : rows) {
+    all.push_back(std::move(row));
   }
-  std::vector<TaskRow> rows;
-  for (const std::string& id : ids) {
-    if (std::optional<TaskRow> row = FindTask(id)) {
-      rows.push_back(std::move(*row));
-    }
-  }
-  return rows;
+  std::stable_sort(all.begin(), all.end(), [](const TaskRow& one, const TaskRow& other) {
+    return one.updated < other.updated;
+  });
+  return all;
 }
 
-bool TaskStore::UpdateTask(const std::string& id,
-                           const std::map<std::string, std::string>& properties, bool finished) {
+bool TaskStore::UpdateTask(TaskRow& row,
+                           const std::map<std::string, const Json::Value*>& properties,
+                           bool finished) {
   bool is_found = false;
-  InTransaction([&] {
+  InTransaction(kForWriting, [&] {
+    is_found = ReadChanges(row);
+    if (!is_found) {
+      return;
+    }
+    ++row.version;
+    row.finished = row.finished || finished;
+    row.updated = std::time(nullptr);
     Statement(database_.get(),
-              "UPDATE tasks SET finished = max(finished, ?), updated = ? WHERE id = ?")
-        .Bind(finished ? 1 : 0)
-        .Bind(std::time(nullptr))
-        .Bind(id)
+              "UPDATE tasks SET finished = ?, updated = ?, version = ? WHERE id = ?")
+        .Bind(row.finished ? 1 : 0)
+        .Bind(row.updated)
+        .Bind(row.version)
+        .Bind(row.id)
         .Step();
-    is_found = sqlite3_changes(database_.get()) == 1;
-    if (is_found) {
-      WriteProperties(id, properties);
+    for (const auto& [name, value] : properties) {
+      WriteProperty(row, name, *value);
     }
   });
   return is_found;
 }
 
 void TaskStore::RemoveTask(const std::string& id) {
-  InTransaction([&] {
-    Statement(database_.get(), "DELETE FROM properties WHERE task = ?").Bind(id).Step();
+  InTransaction(kForWriting, [&] {
+    Statement(database_.get(), "DELETE FROM members WHERE task = ?").Bind(id).Step();
     Statement(database_.get(), "DELETE FROM tasks WHERE id = ?").Bind(id).Step();
   });
 }
@@ -238,24 +318,36 @@ void TaskStore::AddNotification(const NotificationRow& row) {
       .Step();
 }
 
-std::vector<NotificationRow> TaskStore::AllNotifications() {
+std::vector<NotificationRow> TaskStore::NotificationsAfter(std::int64_t number) {
   std::vector<NotificationRow> rows;
   Statement select(database_.get(),
-                   "SELECT time, app, task, title, message, arguments FROM notifications "
-                   "ORDER BY rowid");
+                   "SELECT rowid, time, app, task, title, message, arguments FROM notifications "
+                   "WHERE rowid > ? ORDER BY rowid");
+  select.Bind(number);
   while (select.Step()) {
     NotificationRow row;
-    row.time = select.Number(0);
-    row.app = select.Text(1);
-    row.task = select.Text(2);
-    row.title = select.Text(3);
-    row.message = select.Text(4);
-    for (const Json::Value& argument : ParseJson(select.Text(5))) {
+    row.number = select.Number(0);
+    row.time = select.Number(1);
+    row.app = select.Text(2);
+    row.task = select.Text(3);
+    row.title = select.Text(4);
+    row.message = select.Text(5);
+    for (const Json::Value& argument : ParseJson(select.Text(6))) {
       row.arguments.push_back(argument.asString());
     }
     rows.push_back(std::move(row));
   }
   return rows;
+}
+
+std::int64_t TaskStore::LastNotification() {
+  Statement select(database_.get(), "SELECT ifnull(max(rowid), 0) FROM notifications");
+  return select.Step() ? select.Number(0) : 0;
+}
+
+std::int64_t TaskStore::Version() {
+  Statement select(database_.get(), "PRAGMA data_version");
+  return select.Step() ? select.Number(0) : 0;
 }
 
 void TaskStore::AddToIndex(const std::string& path) {

@@ -3,6 +3,7 @@
 #ifndef DEVICE_BODIES_TASK_STORE_H_
 #define DEVICE_BODIES_TASK_STORE_H_
 
+#include <json/json.h>
 #include <sqlite3.h>
 #include <sys/types.h>
 
@@ -16,16 +17,18 @@
 
 namespace Device {
 
-// A task as the store has it.
+// A task as the store had it at one moment.
 struct TaskRow {
   std::string id;
   bool finished = false;
-  std::int64_t updated = 0;                       // seconds since 1970
-  std::map<std::string, std::string> properties;  // name to JSON text
+  std::int64_t updated = 0;  // seconds since 1970
+  std::int64_t version = 0;  // grows with every change
+  std::map<std::string, Json::Value> properties;
 };
 
 struct NotificationRow {
-  std::int64_t time = 0;  // seconds since 1970
+  std::int64_t number = 0;  // from 1 on, in the order of sending
+  std::int64_t time = 0;    // seconds since 1970
   std::string app;
   std::string task;
   std::string title;
@@ -39,11 +42,18 @@ class TaskStore {
   // Opens the user's store, and makes it when it is not there yet.
   explicit TaskStore(const std::string& user);
 
-  void AddTask(const std::string& id, const std::map<std::string, std::string>& properties);
+  // A new task, with what is in the row.
+  void AddTask(TaskRow& row);
   std::optional<TaskRow> FindTask(const std::string& id);
   std::vector<TaskRow> AllTasks();
-  // Stores the properties and the finished state together. False when there is no such task.
-  bool UpdateTask(const std::string& id, const std::map<std::string, std::string>& properties,
+  // Brings the row up to date. Only what has changed is read, of a property that is an object only
+  // the members that have. False when there is no such task any more.
+  bool RefreshTask(TaskRow& row);
+  // Brings all rows, by id, up to date: new ones come, and those that are gone go.
+  void RefreshTasks(std::map<std::string, TaskRow>& rows);
+  // Stores the properties and the finished state together, and brings the row up to date. Only what
+  // differs from the store is written. False when there is no such task.
+  bool UpdateTask(TaskRow& row, const std::map<std::string, const Json::Value*>& properties,
                   bool finished);
   void RemoveTask(const std::string& id);
 
@@ -55,16 +65,24 @@ class TaskStore {
   void RemoveWorker(pid_t pid);
 
   void AddNotification(const NotificationRow& row);
-  std::vector<NotificationRow> AllNotifications();
+  // Those behind the one of that number; all behind 0.
+  std::vector<NotificationRow> NotificationsAfter(std::int64_t number);
+  std::int64_t LastNotification();
+
+  // A number that changes whenever another connection has changed the store.
+  std::int64_t Version();
 
   void AddToIndex(const std::string& path);
 
  private:
   class Statement;
 
-  void InTransaction(const std::function<void()>& body);
-  void ReadProperties(TaskRow& row);
-  void WriteProperties(const std::string& id, const std::map<std::string, std::string>& properties);
+  void InTransaction(const char* begin, const std::function<void()>& body);
+  // Within a transaction.
+  bool ReadChanges(TaskRow& row);
+  void WriteProperty(TaskRow& row, const std::string& name, const Json::Value& value);
+  void WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
+                   const Json::Value* value);
 
   std::unique_ptr<sqlite3, int (*)(sqlite3*)> database_;
 };

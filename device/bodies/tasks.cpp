@@ -53,38 +53,59 @@ void LogFailure(const char* operation, const std::exception& error) {
 }  // namespace
 
 Json::Value Task::State::Get(const std::string& name) const {
+  const auto gathered = pending.find(name);
+  if (gathered != pending.end()) {
+    return gathered->second;
+  }
   const auto found = row.properties.find(name);
-  return found == row.properties.end() ? Json::Value() : Device::ParseJson(found->second);
+  return found == row.properties.end() ? Json::Value() : found->second;
 }
 
 bool Task::State::Set(const std::string& name, const Json::Value& value) {
-  const std::string text = Device::ToText(value);
-  row.properties[name] = text;
-  pending[name] = text;
-  return is_updating || Store(false);
+  if (!is_updating) {
+    return StoreNow({{name, &value}}, false);
+  }
+  pending[name] = value;
+  return true;
 }
 
 bool Task::State::Store(bool is_finished) {
   is_updating = false;
-  const std::map<std::string, std::string> writes = std::exchange(pending, {});
+  const std::map<std::string, Json::Value> gathered = std::exchange(pending, {});
+  std::map<std::string, const Json::Value*> properties;
+  for (const auto& [name, value] : gathered) {
+    properties[name] = &value;
+  }
+  return StoreNow(properties, is_finished);
+}
+
+bool Task::State::StoreNow(const std::map<std::string, const Json::Value*>& properties,
+                           bool is_finished) {
   try {
-    const bool is_stored = Device::StoreOf(user).UpdateTask(row.id, writes, is_finished);
-    row.finished = row.finished || (is_stored && is_finished);
-    return is_stored;
+    return Device::StoreOf(user).UpdateTask(row, properties, is_finished);
   } catch (const std::exception& error) {
     LogFailure("store task", error);
+    Forget();
     return false;
+  }
+}
+
+void Task::State::Forget() {
+  try {
+    if (std::optional<Device::TaskRow> stored = Device::StoreOf(user).FindTask(row.id)) {
+      row = std::move(*stored);
+    }
+  } catch (const std::exception&) {
+    row.version = 0;  // all of it is read as soon as it can be
   }
 }
 
 bool Task::State::Reload() {
   try {
-    std::optional<Device::TaskRow> stored = Device::StoreOf(user).FindTask(row.id);
-    if (!stored) {
+    if (!Device::StoreOf(user).RefreshTask(row)) {
       row.properties.clear();
       return false;
     }
-    row = std::move(*stored);
   } catch (const std::exception& error) {
     LogFailure("reload task", error);
   }
@@ -105,8 +126,8 @@ Task::Task(const char* user, const char* task_id) : state(nullptr) {
     task_state->user = user;
     task_state->row.id = task_id;
     // When nobody watches the task, the desktop is to be told of its end.
-    task_state->row.properties[kPropNotify] = Device::ToText(!Device::TheDevice().is_followed);
-    Device::StoreOf(user).AddTask(task_id, task_state->row.properties);
+    task_state->row.properties[kPropNotify] = !Device::TheDevice().is_followed;
+    Device::StoreOf(user).AddTask(task_state->row);
     state = task_state.release();
   });
 }
@@ -169,7 +190,7 @@ void Task::remove() {
 
 void Task::sendNotifyMessageNoEncode(const char* app, const char* task_id, const char* title,
                                      const char* message, ...) {
-  Device::NotificationRow row{std::time(nullptr), app, task_id, title, message, {}};
+  Device::NotificationRow row{0, std::time(nullptr), app, task_id, title, message, {}};
   va_list arguments;
   va_start(arguments, message);
   for (std::size_t count = ArgumentCount(message); count > 0; --count) {

@@ -48,7 +48,7 @@ Json::Value Explode(const Json::Value& value, const std::string& separator, int 
   const std::string text = value.asString();
   if (version >= kFirstVersionWithArrays && !text.empty() && text[0] == '[') {
     try {
-      const Json::Value array = ParseJson(text);
+      const Json::Value array = ParseJson(DecodeByteEscapes(text));
       return array.isArray() ? OnlyTexts(array) : Json::Value(Json::arrayValue);
     } catch (const std::exception&) {
       return {Json::arrayValue};  // begins like an array and is none

@@ -6,6 +6,7 @@
 #include "device/bodies/json_text.h"
 #include "device/cli/commands.h"
 #include "device/host/launcher.h"
+#include "device/host/sessions.h"
 
 namespace Device {
 

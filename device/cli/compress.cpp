@@ -15,6 +15,7 @@
 #include "device/cli/commands.h"
 #include "device/cli/progress_display.h"
 #include "device/host/launcher.h"
+#include "device/host/sessions.h"
 
 namespace Device {
 

@@ -22,12 +22,16 @@ namespace {
 
 namespace fs = std::filesystem;
 
+// Each user's password is the user's name.
 constexpr char kSampleConfig[] = R"({
   "volumes": ["vol1", "vol2"],
   "users": [
-    { "name": "alice", "uid": 65001, "admin": true, "home": "vol1" },
-    { "name": "bob", "uid": 65002, "home": "vol1", "codepage": "CP932" },
-    { "name": "carol", "uid": 65003, "home": "vol2" }
+    { "name": "alice", "uid": 65001, "admin": true, "home": "vol1",
+      "password": "$6$samplealice$7IAtO8BBzswsLOQbnatWFfNt84sWsSkm7epmQW48HkhSWCaFTSfsb6O1V0icOlQCaiDp8Vmcz/HnXpU8FY736/" },
+    { "name": "bob", "uid": 65002, "home": "vol1", "codepage": "CP932",
+      "password": "$6$samplebob$gbYmH/UHuneh2f8m7v2lT6phOuGLjl0UWQEQovenIVq83DqM4AjalW/4LeUcFDKZR25ZaHVjGI1TIu7hqeQF3." },
+    { "name": "carol", "uid": 65003, "home": "vol2",
+      "password": "$6$samplecarol$m4zk1vuCaPypGXoHmMo7HOIqvpbnNfSHoeT03T2uvZEaFgNqSBoC9bSwjIDWJDPNmsbsa/6zKz4pHnLkMyke.1" }
   ],
   "shares": [
     { "name": "photo", "volume": "vol1",

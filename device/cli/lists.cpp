@@ -9,9 +9,8 @@
 #include <stdexcept>
 
 #include "device/bodies/device.h"
-#include "device/bodies/json_text.h"
 #include "device/bodies/task_store.h"
-#include "device/bodies/workers.h"
+#include "device/bodies/task_view.h"
 #include "device/cli/commands.h"
 #include "platform/lumo/file_manager.h"
 
@@ -46,30 +45,11 @@ int RunAs(const std::string& user, const std::function<void()>& body) {
   return WEXITSTATUS(status);
 }
 
-Json::Value Property(const TaskRow& row, const std::string& name) {
-  const auto found = row.properties.find(name);
-  return found == row.properties.end() ? Json::Value() : ParseJson(found->second);
-}
-
-std::string StateOf(const TaskRow& row, const Json::Value& data, const std::string& user) {
-  if (data.isObject() && data.isMember("errors")) {
-    return "failed";
-  }
-  if (row.finished) {
-    return "finished";
-  }
-  const bool has_pid = data.isObject() && data["pid"].isInt();
-  return !has_pid || IsWorkerAlive(user, data["pid"].asInt()) ? "running" : "dead";
-}
-
 void PrintTask(const TaskRow& row, const std::string& user) {
-  const Json::Value data = Property(row, "data");
-  const Json::Value progress = Property(row, "progress");
-  const int percent =
-      progress.isNumeric() ? static_cast<int>(std::lround(progress.asDouble() * 100)) : 0;
-  const Json::Value dest = data.isObject() ? data["params"]["dest_file_path"] : Json::Value();
-  std::cout << row.id << '\t' << StateOf(row, data, user) << '\t' << percent << " %\t"
-            << (dest.isString() ? dest.asString() : "") << '\n';
+  const Json::Value task = TaskView(user, row);
+  std::cout << row.id << '\t' << task["state"].asString() << '\t'
+            << std::lround(task["progress"].asDouble() * 100) << " %\t"
+            << task["dest_file_path"].asString() << '\n';
 }
 
 std::string TimeText(std::time_t time) {
@@ -94,7 +74,7 @@ int TasksCommand(const std::string& folder, const std::string& user) {
 int NotificationsCommand(const std::string& folder, const std::string& user) {
   Open(folder);
   return RunAs(user, [&] {
-    for (const NotificationRow& row : StoreOf(user).AllNotifications()) {
+    for (const NotificationRow& row : StoreOf(user).NotificationsAfter(0)) {
       std::cout << TimeText(row.time) << '\t' << row.task << '\t' << row.message;
       for (const std::string& argument : row.arguments) {
         std::cout << '\t' << argument;

@@ -23,6 +23,7 @@ struct CommandLine {
   std::string config_file;
   std::string trace_file;
   std::vector<std::string> fault_rules;
+  std::string listen = "127.0.0.1:5080";
   CallOptions call;
   CompressOptions compress;
 };
@@ -83,6 +84,14 @@ CLI::App* AddCompress(CLI::App& app, CommandLine& line) {
   return command;
 }
 
+CLI::App* AddServe(CLI::App& app, CommandLine& line) {
+  CLI::App* const command = app.add_subcommand("serve", "Serve the device over HTTP");
+  AddDeviceOption(*command, line);
+  command->add_option("--listen", line.listen, "ADDRESS:PORT")->capture_default_str();
+  AddWatchOptions(*command, line);
+  return command;
+}
+
 // Takes passwords off the process list, on which a worker shows what its starter was called with.
 void HidePasswords(int argc, char** argv) {
   for (int index = 1; index < argc; ++index) {
@@ -102,6 +111,7 @@ int Run(int argc, char** argv) {
   CLI::App* const init = AddInit(app, line);
   CLI::App* const call = AddCall(app, line);
   CLI::App* const compress = AddCompress(app, line);
+  CLI::App* const serve = AddServe(app, line);
   CLI::App* const tasks = app.add_subcommand("tasks", "List a user's tasks");
   AddUserOptions(*tasks, line);
   CLI::App* const notifications =
@@ -129,6 +139,9 @@ int Run(int argc, char** argv) {
   }
   if (compress->parsed()) {
     return Device::CompressCommand(line.compress);
+  }
+  if (serve->parsed()) {
+    return Device::ServeCommand(line.folder, line.listen);
   }
   if (tasks->parsed()) {
     return Device::TasksCommand(line.folder, line.user);

@@ -8,21 +8,19 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstring>
+#include <optional>
 #include <stdexcept>
 
 #include "device/bodies/device.h"
 #include "device/bodies/errors.h"
 #include "device/bodies/json_text.h"
-#include "device/bodies/random_id.h"
 #include "device/bodies/task_store.h"
+#include "device/host/frame.h"
 #include "device/host/request_state.h"
 
 namespace Device {
 
 namespace {
-
-constexpr std::size_t kSessionIdBytes = 16;
 
 std::string DlError() {
   const char* const reason = dlerror();
@@ -46,50 +44,22 @@ const ApiRow* GetTable(void* module) {
   return static_cast<const ApiRow*>(get_table());
 }
 
-// The outcome travels as a frame: its length, then its JSON text. Whoever else still holds the pipe
-// does not matter then.
-bool WriteFrame(int fd, const Outcome& outcome) {
+// False when the other side is gone.
+bool SendOutcome(int fd, const Outcome& outcome) {
   Json::Value frame(Json::objectValue);
   frame["code"] = outcome.code;
   frame["data"] = outcome.data;
-  const std::string text = ToText(frame);
-  const auto length = static_cast<std::uint32_t>(text.size());
-  std::string bytes(reinterpret_cast<const char*>(&length), sizeof length);
-  bytes += text;
-  for (std::size_t at = 0; at < bytes.size();) {
-    const ssize_t written = write(fd, bytes.data() + at, bytes.size() - at);
-    if (written < 0 && errno != EINTR) {
-      return false;
-    }
-    at += written < 0 ? 0 : static_cast<std::size_t>(written);
-  }
-  return true;
+  return WriteFrame(fd, ToText(frame));
 }
 
-bool ReadAll(int fd, char* to, std::size_t size) {
-  for (std::size_t at = 0; at < size;) {
-    const ssize_t got = read(fd, to + at, size - at);
-    if (got == 0 || (got < 0 && errno != EINTR)) {
-      return false;
-    }
-    at += got < 0 ? 0 : static_cast<std::size_t>(got);
+// False when the other side is gone without one.
+bool ReceiveOutcome(int fd, Outcome& outcome) {
+  const std::optional<std::string> text = ReadFrame(fd);
+  if (text) {
+    const Json::Value frame = ParseJson(*text);
+    outcome = {frame["code"].asInt(), frame["data"]};
   }
-  return true;
-}
-
-// False when the other side is gone without a frame.
-bool ReadFrame(int fd, Outcome& outcome) {
-  std::uint32_t length = 0;
-  if (!ReadAll(fd, reinterpret_cast<char*>(&length), sizeof length)) {
-    return false;
-  }
-  std::string text(length, '\0');
-  if (!ReadAll(fd, text.data(), text.size())) {
-    return false;
-  }
-  const Json::Value frame = ParseJson(text);
-  outcome = {frame["code"].asInt(), frame["data"]};
-  return true;
+  return text.has_value();
 }
 
 }  // namespace
@@ -131,19 +101,16 @@ Outcome Launcher::CallHere(const Request& request) {
   return response_state.outcome;
 }
 
-void Launcher::ServeAndExit(const Request& request) {
-  Outcome outcome;
+Outcome Launcher::CallSafely(const Request& request) {
   try {
-    outcome = CallHere(request);
+    return CallHere(request);
   } catch (const Json::Exception& error) {
     syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
-    outcome = {kErrBadParameter, Json::Value()};
+    return {kErrBadParameter, Json::Value()};
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
-    outcome = {kErrInternal, Json::Value()};
+    return {kErrInternal, Json::Value()};
   }
-  CloseStores();
-  _exit(WriteFrame(TheDevice().outcome.Get(), outcome) ? 0 : 1);
 }
 
 Outcome Launcher::Call(const Request& request) {
@@ -164,10 +131,12 @@ Outcome Launcher::Call(const Request& request) {
   }
   if (pid == 0) {
     TheDevice().outcome = std::move(write_end);
-    ServeAndExit(request);
+    const Outcome reached = CallSafely(request);
+    CloseStores();
+    _exit(SendOutcome(TheDevice().outcome.Get(), reached) ? 0 : 1);
   }
   write_end.Close();
-  if (!ReadFrame(read_end.Get(), outcome)) {
+  if (!ReceiveOutcome(read_end.Get(), outcome)) {
     syslog(LOG_ERR, "request process %d ended without an outcome", static_cast<int>(pid));
     outcome = {kErrInternal, Json::Value()};
   }
@@ -179,12 +148,6 @@ Outcome Launcher::Call(const Request& request) {
 void Launcher::Reap() {
   while (waitpid(-1, nullptr, WNOHANG) > 0) {
   }
-}
-
-std::string SignIn(const std::string& user) {
-  std::string id = RandomId(kSessionIdBytes);
-  TheDevice().sessions[id] = user;
-  return id;
 }
 
 }  // namespace Device

@@ -52,6 +52,9 @@ class Launcher {
   // throws passes through.
   Outcome CallHere(const Request& request);
 
+  // The same; what the handler throws becomes an error code of the host's.
+  Outcome CallSafely(const Request& request);
+
   // Takes leave of workers that have ended.
   static void Reap();
 
@@ -59,15 +62,9 @@ class Launcher {
   // Null, and the host's error code in `code`, when no row serves the request.
   const ApiRow* FindRow(const Request& request, int& code) const;
 
-  // The request process: sends the outcome, or the host's error code for what the handler throws.
-  [[noreturn]] void ServeAndExit(const Request& request);
-
   std::unique_ptr<void, int (*)(void*)> module_;
   const ApiRow* table_ = nullptr;
 };
-
-// Makes a session for the user, as signing in does, and returns its id.
-std::string SignIn(const std::string& user);
 
 }  // namespace Device
 

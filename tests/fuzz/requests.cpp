@@ -3,10 +3,8 @@
 // `faults` (a bit for each of kRules), and what the task Zantro_1 holds: `data`, `progress`,
 // `finished`.
 #include <syslog.h>
-#include <unistd.h>
 
 #include <climits>
-#include <filesystem>
 #include <set>
 
 #include "device/bodies/device.h"
@@ -31,24 +29,15 @@ constexpr unsigned kNoFork = 1;
 constexpr unsigned kNoTask = 2;
 constexpr unsigned kNoData = 256;
 
-class FuzzDevice {
- public:
+struct FuzzDevice {
   FuzzDevice() {
     setlogmask(LOG_MASK(LOG_EMERG));
-    Require(mkdtemp(path_.data()) != nullptr, "there is a temporary folder");
-    Device::Make(path_, R"({"volumes": ["vol1"], "shares": [],
-                            "users": [{"name": "alice", "uid": 65001, "home": "vol1"}]})");
-    Device::Open(path_);
+    Device::Make(path, R"({"volumes": ["vol1"], "shares": [],
+                           "users": [{"name": "alice", "uid": 65001, "home": "vol1"}]})");
+    Device::Open(path);
   }
-  ~FuzzDevice() {
-    std::error_code ignored;
-    std::filesystem::remove_all(path_, ignored);
-  }
-  FuzzDevice(const FuzzDevice&) = delete;
-  FuzzDevice& operator=(const FuzzDevice&) = delete;
-
- private:
-  std::string path_ = std::filesystem::temp_directory_path() / "kavo-fuzz-XXXXXX";
+  const TempFolder temp;
+  const std::string path = temp.Path() + "/device";
 };
 
 Device::TaskStore& Store() {
@@ -117,15 +106,16 @@ Device::Outcome Serve(const Json::Value& scene, const std::string& method,
 }
 
 void PutTask(const Json::Value& scene) {
-  std::map<std::string, std::string> properties;
+  Device::TaskRow row;
+  row.id = kTask;
   for (const char* name : {"data", "progress"}) {
     if (!scene[name].isNull()) {
-      properties[name] = Device::ToText(scene[name]);
+      row.properties[name] = scene[name];
     }
   }
   Store().RemoveTask(kTask);
-  Store().AddTask(kTask, properties);
-  Store().UpdateTask(kTask, {}, scene["finished"] == true);
+  Store().AddTask(row);
+  Store().UpdateTask(row, {}, scene["finished"] == true);
 }
 
 }  // namespace
@@ -145,7 +135,7 @@ void FuzzStartRequest(const std::string& input) {
     return;
   }
   Require(outcome.data["taskid"] == tasks[0].id, "the answer names the task");
-  const Json::Value params = Device::ParseJson(tasks[0].properties.at("data"))["params"];
+  const Json::Value params = tasks[0].properties.at("data")["params"];
   Require(!params["path"].empty() && !params["path"][0].asString().empty(), "there is a source");
   Require(!params["dest_file_path"].asString().empty(), "there is a destination");
   Require(Device::ToText(params["password"]) == Device::ToText(scene["password"]),

@@ -13,8 +13,6 @@
 
 namespace {
 
-using Strings = std::vector<std::string>;
-
 void CheckRoundTrip(const Strings& paths) {
   Device::OpenDevice device;
   device.root = "/d";

@@ -8,6 +8,8 @@
 #include <string>
 #include <vector>
 
+#include "tests/programs.h"
+
 void FuzzArchiverCommandLine(const std::string& input);
 void FuzzArchiverOutput(const std::string& input);
 void FuzzDeviceConfig(const std::string& input);
@@ -35,8 +37,8 @@ inline void Require(bool holds, const char* property) {
 }
 
 // The parts between separators, the last one included.
-inline std::vector<std::string> SplitAt(char separator, const std::string& text) {
-  std::vector<std::string> parts;
+inline Strings SplitAt(char separator, const std::string& text) {
+  Strings parts;
   std::istringstream stream(text + separator);
   for (std::string part; std::getline(stream, part, separator);) {
     parts.push_back(part);

@@ -1,0 +1,24 @@
+// What the task store has, as a client of the device sees it. To be used with the user's identity.
+#ifndef DEVICE_BODIES_TASK_VIEW_H_
+#define DEVICE_BODIES_TASK_VIEW_H_
+
+#include <json/json.h>
+
+#include <string>
+
+#include "device/bodies/task_store.h"
+
+namespace Device {
+
+// "taskid", "dest_file_path", "state" ("running", "finished", "failed", or "dead": the worker went
+// without an outcome), "progress" (0 to 1), "total_size" (bytes), "started" (seconds since 1970)
+// and, of a failed one, "errors". No password.
+Json::Value TaskView(const std::string& user, const TaskRow& row);
+
+// Gives every dead task of the user's the outcome that its worker could not store: one error item,
+// the destination with the code of a failed archive.
+void EndDeadTasks(const std::string& user);
+
+}  // namespace Device
+
+#endif  // DEVICE_BODIES_TASK_VIEW_H_

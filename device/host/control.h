@@ -1,0 +1,37 @@
+// What the front end asks of the launcher: short messages over a socket of sequenced packets, each
+// with the end of a stream on which the answer is expected.
+#ifndef DEVICE_HOST_CONTROL_H_
+#define DEVICE_HOST_CONTROL_H_
+
+#include <cstddef>
+#include <optional>
+#include <string>
+
+#include "device/bodies/file_descriptor.h"
+
+namespace Device {
+
+inline constexpr std::size_t kMostControlBytes = 8192;
+
+enum class ControlKind : char {
+  kListening = 'l',  // text: ADDRESS:PORT; no stream
+  kRequest = 'r',    // the request comes as a frame on the stream; a process of its own reads it
+  kSignIn = 'i',     // text: {"user","password"}
+  kSignOut = 'o'     // text: the session's id
+};
+
+struct ControlMessage {
+  ControlKind kind = ControlKind::kRequest;
+  std::string text;         // kMostControlBytes at most
+  FileDescriptor exchange;  // each frame on it is {"status": HTTP status, "body": JSON}
+};
+
+// False when the other side is gone.
+bool SendControl(int socket, ControlKind kind, const std::string& text, int exchange);
+
+// Nothing when the other side is gone, or what came is no message.
+std::optional<ControlMessage> ReceiveControl(int socket);
+
+}  // namespace Device
+
+#endif  // DEVICE_HOST_CONTROL_H_

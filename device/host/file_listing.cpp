@@ -1,0 +1,107 @@
+#include "device/host/file_listing.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <map>
+#include <memory>
+
+#include "device/bodies/device.h"
+#include "device/bodies/errors.h"
+#include "device/bodies/paths.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+namespace {
+
+const char* KindOf(mode_t mode) {
+  return S_ISDIR(mode) ? "folder" : S_ISREG(mode) ? "file" : S_ISLNK(mode) ? "link" : "other";
+}
+
+Json::Value Entry(const std::string& name, const struct stat& status) {
+  Json::Value entry(Json::objectValue);
+  entry["name"] = name;
+  entry["kind"] = KindOf(status.st_mode);
+  entry["size"] = static_cast<Json::Int64>(S_ISDIR(status.st_mode) ? 0 : status.st_size);
+  entry["modified"] = static_cast<Json::Int64>(status.st_mtime);
+  return entry;
+}
+
+Json::Value Body(const std::string& path, bool is_writable,
+                 const std::map<std::string, Json::Value>& entries) {
+  Json::Value body(Json::objectValue);
+  body["path"] = path;
+  body["writable"] = is_writable;
+  body["entries"] = Json::Value(Json::arrayValue);
+  for (const auto& [name, entry] : entries) {
+    body["entries"].append(entry);
+  }
+  return body;
+}
+
+// What the user has no access to at all is not shown.
+Listing ListShares(const std::string& user) {
+  std::map<std::string, Json::Value> entries;
+  std::vector<std::string> names = {kHomeShare};
+  for (const Share& share : TheDevice().config.shares) {
+    names.push_back(share.name);
+  }
+  for (const std::string& name : names) {
+    const ResolvedPath share = Resolve(TheDevice(), user, "/" + name);
+    struct stat status {};
+    if (share.error == 0 && AccessOf(share, user) != Access::kNone &&
+        stat(share.real_path.c_str(), &status) == 0) {
+      entries[name] = Entry(name, status);
+    }
+  }
+  return {0, Body("/", false, entries)};
+}
+
+Listing FailWithErrno(int error_number) {
+  SetLastErrno(error_number);
+  return {LumoLibGetErr(), {}};
+}
+
+bool IsWritable(const ResolvedPath& folder) {
+  return (folder.share == nullptr || !folder.share->read_only) &&
+         faccessat(AT_FDCWD, folder.real_path.c_str(), W_OK | X_OK, AT_EACCESS) == 0;
+}
+
+}  // namespace
+
+Listing ListFolder(const std::string& user, const std::string& path) {
+  if (path.find_first_not_of('/') == std::string::npos && !path.empty()) {
+    return ListShares(user);
+  }
+  const ResolvedPath folder = Resolve(TheDevice(), user, path);
+  if (folder.error != 0) {
+    return {folder.error, {}};
+  }
+  if (AccessOf(folder, user) == Access::kNone) {
+    return {kErrNoPrivilege, {}};
+  }
+  if (LumoCheckPath(folder.real_path.c_str(), false, 0, nullptr, false, false, nullptr) != 0) {
+    return {LumoLibGetErr(), {}};
+  }
+  const std::unique_ptr<DIR, int (*)(DIR*)> directory(opendir(folder.real_path.c_str()), closedir);
+  if (directory == nullptr) {
+    return FailWithErrno(errno);
+  }
+  std::map<std::string, Json::Value> entries;
+  while (const dirent* const found = readdir(directory.get())) {
+    const std::string name = found->d_name;
+    struct stat status {};
+    // One that has gone meanwhile is not there.
+    if (name != "." && name != ".." &&
+        fstatat(dirfd(directory.get()), found->d_name, &status, AT_SYMLINK_NOFOLLOW) == 0) {
+      entries[name] = Entry(name, status);
+    }
+  }
+  return {0, Body(folder.user_path, IsWritable(folder), entries)};
+}
+
+}  // namespace Device

@@ -1,0 +1,22 @@
+// The folders of a user's shared folders, as the user sees them.
+#ifndef DEVICE_HOST_FILE_LISTING_H_
+#define DEVICE_HOST_FILE_LISTING_H_
+
+#include <json/json.h>
+
+#include <string>
+
+namespace Device {
+
+struct Listing {
+  int error = 0;     // a LibraryError; 0: listed
+  Json::Value body;  // {"path", "writable", "entries": [{"name", "kind", "size", "modified"}]}
+};
+
+// Lists a user's folder, "/" for the shared folders. To be called with the user's identity, by
+// which the kernel decides. Links are listed, and not followed.
+Listing ListFolder(const std::string& user, const std::string& path);
+
+}  // namespace Device
+
+#endif  // DEVICE_HOST_FILE_LISTING_H_

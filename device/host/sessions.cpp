@@ -1,0 +1,84 @@
+#include "device/host/sessions.h"
+
+#include <crypt.h>
+
+#include <algorithm>
+#include <memory>
+
+#include "device/bodies/device.h"
+#include "device/bodies/random_id.h"
+
+namespace Device {
+
+namespace {
+
+constexpr std::size_t kSessionIdBytes = 16;
+constexpr std::ptrdiff_t kMostSessions = 64;  // of one user
+constexpr int kFreeTries = 10;
+constexpr std::chrono::seconds kLongestWait(60);
+// In place of that of a user who is not there; no password has it.
+constexpr char kNobodysHash[] = "$6$nobody$";
+
+void EndOldestOf(const std::string& user) {
+  auto& sessions = TheDevice().sessions;
+  const auto is_users = [&](const auto& entry) { return entry.second.user == user; };
+  if (std::count_if(sessions.begin(), sessions.end(), is_users) < kMostSessions) {
+    return;
+  }
+  auto oldest = sessions.end();
+  for (auto at = sessions.begin(); at != sessions.end(); ++at) {
+    if (is_users(*at) && (oldest == sessions.end() || at->second.number < oldest->second.number)) {
+      oldest = at;
+    }
+  }
+  SignOut(std::string(oldest->first));
+}
+
+}  // namespace
+
+std::string SignIn(const std::string& user) {
+  EndOldestOf(user);
+  static std::uint64_t number = 0;
+  std::string id = RandomId(kSessionIdBytes);
+  TheDevice().sessions.emplace(id, Session{user, ++number, {}});
+  return id;
+}
+
+void SignOut(const std::string& session_id) {
+  auto& sessions = TheDevice().sessions;
+  if (const auto found = sessions.find(session_id); found != sessions.end()) {
+    found->second.has_ended.Set();
+    sessions.erase(found);
+  }
+}
+
+std::string UserOfSession(const std::string& session_id) {
+  const auto& sessions = TheDevice().sessions;
+  const auto found = sessions.find(session_id);
+  return found == sessions.end() || found->second.has_ended.IsSet() ? "" : found->second.user;
+}
+
+bool IsPassword(const std::string& user, const std::string& password) {
+  const User* const known = TheDevice().config.FindUser(user);
+  const bool has_password = known != nullptr && !known->password.empty();
+  const std::string hash = has_password ? known->password : kNobodysHash;
+  const auto data = std::make_unique<crypt_data>();
+  const char* const result = crypt_r(password.c_str(), hash.c_str(), data.get());
+  return has_password && result != nullptr && hash == result;
+}
+
+std::chrono::seconds SignInGate::Try(const std::string& user, Clock::time_point now) {
+  // Names that nobody has share one count, so that made-up ones take no room.
+  Tries& tries = tries_[TheDevice().config.FindUser(user) != nullptr ? user : ""];
+  if (now < tries.open_again) {
+    return std::chrono::ceil<std::chrono::seconds>(tries.open_again - now);
+  }
+  if (++tries.count >= kFreeTries) {
+    constexpr int kMostDoublings = 6;
+    const int doublings = std::min(tries.count - kFreeTries, kMostDoublings);
+    tries.open_again = now + std::min(kLongestWait, std::chrono::seconds(1 << doublings));
+  }
+  return {};
+}
+
+}  // namespace Device

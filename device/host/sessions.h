@@ -1,0 +1,45 @@
+// Who is signed in. The sessions of the device live in the launcher; processes forked from it see
+// those that were there, and the end of each.
+#ifndef DEVICE_HOST_SESSIONS_H_
+#define DEVICE_HOST_SESSIONS_H_
+
+#include <chrono>
+#include <map>
+#include <string>
+
+namespace Device {
+
+// Makes a session for the user, as signing in does, and returns its id, which cannot be guessed. A
+// user's oldest sessions end when there are too many.
+std::string SignIn(const std::string& user);
+
+// Ends the session, for requests and workers that are on their way too. Any text may be given.
+void SignOut(const std::string& session_id);
+
+// The user of a session that has not ended; empty when there is none.
+std::string UserOfSession(const std::string& session_id);
+
+// True if the password is the user's. Takes as long for a user that is not there.
+bool IsPassword(const std::string& user, const std::string& password);
+
+// Slows down who tries passwords: after ten wrong ones in a row a user's sign-in is open again only
+// after a while, which doubles each time.
+class SignInGate {
+ public:
+  using Clock = std::chrono::steady_clock;
+
+  // To be called before a password is looked at: 0, or how long to wait before the next try.
+  std::chrono::seconds Try(const std::string& user, Clock::time_point now);
+  void Succeeded(const std::string& user) { tries_.erase(user); }
+
+ private:
+  struct Tries {
+    int count = 0;
+    Clock::time_point open_again;
+  };
+  std::map<std::string, Tries> tries_;
+};
+
+}  // namespace Device
+
+#endif  // DEVICE_HOST_SESSIONS_H_

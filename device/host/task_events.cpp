@@ -1,0 +1,129 @@
+#include "device/host/task_events.h"
+
+#include <poll.h>
+
+#include <algorithm>
+#include <map>
+#include <vector>
+
+#include "device/bodies/json_text.h"
+#include "device/bodies/task_store.h"
+#include "device/bodies/task_view.h"
+#include "device/bodies/workers.h"
+#include "device/host/frame.h"
+#include "device/host/sessions.h"
+
+namespace Device {
+
+namespace {
+
+constexpr int kPauseMs = 200;
+
+class Watcher {
+ public:
+  Watcher(int stream, std::string user)
+      : stream_(stream), user_(std::move(user)), last_(StoreOf(user_).LastNotification()) {
+    EndDeadTasks(user_);
+  }
+
+  // False when nobody reads any more.
+  bool Look() {
+    EndTasksOfLostWorkers();
+    const std::int64_t version = StoreOf(user_).Version();
+    if (version != version_) {
+      SendTasks();
+      SendNotifications();
+      FindWorkers();
+    }
+    version_ = version;
+    return is_read_;
+  }
+
+ private:
+  void FindWorkers() {
+    workers_.clear();
+    for (const pid_t pid : StoreOf(user_).AllWorkers()) {
+      if (IsWorkerAlive(user_, pid)) {
+        workers_.push_back(pid);
+      }
+    }
+  }
+
+  // Tasks are read only when a worker has gone: they can be large.
+  void EndTasksOfLostWorkers() {
+    const auto is_lost = [&](pid_t pid) { return !IsWorkerAlive(user_, pid); };
+    const auto lost = std::remove_if(workers_.begin(), workers_.end(), is_lost);
+    if (lost != workers_.end()) {
+      workers_.erase(lost, workers_.end());
+      EndDeadTasks(user_);
+      version_ = -1;  // this process's own changes do not count as such
+    }
+  }
+
+  void Send(const char* event, const Json::Value& data) {
+    Json::Value frame(Json::objectValue);
+    frame["event"] = event;
+    frame["data"] = data;
+    is_read_ = is_read_ && WriteFrame(stream_, ToText(frame));
+  }
+
+  void SendTasks() {
+    std::map<std::string, Json::Value> tasks;
+    StoreOf(user_).RefreshTasks(rows_);
+    for (const auto& [id, row] : rows_) {
+      const Json::Value view = TaskView(user_, row);
+      tasks[id] = view;
+      if (const auto known = tasks_.find(id); known == tasks_.end() || known->second != view) {
+        Send("task", view);
+      }
+    }
+    for (const auto& [id, task] : tasks_) {
+      if (tasks.count(id) == 0) {
+        Json::Value gone(Json::objectValue);
+        gone["taskid"] = id;
+        Send("gone", gone);
+      }
+    }
+    tasks_ = std::move(tasks);
+  }
+
+  void SendNotifications() {
+    for (const NotificationRow& row : StoreOf(user_).NotificationsAfter(last_)) {
+      Json::Value data(Json::objectValue);
+      data["time"] = static_cast<Json::Int64>(row.time);
+      data["taskid"] = row.task;
+      data["title"] = row.title;
+      data["message"] = row.message;
+      data["arguments"] = Json::Value(Json::arrayValue);
+      for (const std::string& argument : row.arguments) {
+        data["arguments"].append(argument);
+      }
+      Send("notification", data);
+      last_ = row.number;
+    }
+  }
+
+  int stream_;
+  std::string user_;
+  std::int64_t last_;           // notification that was sent
+  std::int64_t version_ = -1;   // of the store, when it was looked at
+  std::vector<pid_t> workers_;  // that were alive
+  std::map<std::string, TaskRow> rows_;
+  std::map<std::string, Json::Value> tasks_;  // as they were sent
+  bool is_read_ = true;
+};
+
+}  // namespace
+
+void SendTaskEvents(int stream, const std::string& user, const std::string& session_id) {
+  Watcher watcher(stream, user);
+  while (watcher.Look() && !UserOfSession(session_id).empty()) {
+    // Nothing is ever sent here: it becomes readable when the other side is closed.
+    pollfd other_side = {stream, POLLIN, 0};
+    if (poll(&other_side, 1, kPauseMs) != 0) {
+      return;
+    }
+  }
+}
+
+}  // namespace Device

@@ -1,0 +1,16 @@
+// The stream of what happens to a user's tasks.
+#ifndef DEVICE_HOST_TASK_EVENTS_H_
+#define DEVICE_HOST_TASK_EVENTS_H_
+
+#include <string>
+
+namespace Device {
+
+// Writes a frame {"event", "data"} for each task there is, then for each change, until the session
+// ends or nobody reads from the stream. To be called with the user's identity. Throws
+// std::runtime_error when the store cannot be read.
+void SendTaskEvents(int stream, const std::string& user, const std::string& session_id);
+
+}  // namespace Device
+
+#endif  // DEVICE_HOST_TASK_EVENTS_H_

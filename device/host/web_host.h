@@ -1,0 +1,84 @@
+// The launcher of a device that is reached over HTTP: one thread, which starts the front end, forks
+// a process for each request, keeps the sessions, and takes leave of every process that ends.
+#ifndef DEVICE_HOST_WEB_HOST_H_
+#define DEVICE_HOST_WEB_HOST_H_
+
+#include <signal.h>
+#include <sys/types.h>
+
+#include <functional>
+#include <map>
+#include <set>
+#include <string>
+
+#include "device/bodies/file_descriptor.h"
+#include "device/host/control.h"
+#include "device/host/launcher.h"
+#include "device/host/sessions.h"
+
+namespace Device {
+
+// What the front end's program needs. Opened before the device, behind which there may be no way to
+// them.
+struct FrontEndFiles {
+  FileDescriptor program;
+  FileDescriptor page;  // the folder with the page's files
+
+  // Opens them beside the executable. Throws std::runtime_error.
+  FrontEndFiles();
+};
+
+class WebHost {
+ public:
+  // `listen` is ADDRESS:PORT. Takes the open device for this process alone; throws
+  // std::runtime_error when another serves it.
+  WebHost(const FrontEndFiles& files, std::string listen);
+  ~WebHost();
+  WebHost(const WebHost&) = delete;
+  WebHost& operator=(const WebHost&) = delete;
+
+  // Serves until SIGTERM or SIGINT. False when the front end cannot listen; it has said why. Jobs
+  // that are under way go on.
+  bool Run();
+
+ private:
+  struct SignInCheck {
+    std::string user;
+    FileDescriptor exchange;
+  };
+
+  void StartFrontEnd();
+  void EndFrontEnd();
+  // The process id of a child that runs the body and leaves with its result.
+  pid_t Fork(const std::function<int()>& body);
+
+  // False when the front end is gone.
+  bool TakeMessage();
+  void TakeRequest(FileDescriptor exchange);
+  void TakeSignIn(const std::string& text, FileDescriptor exchange);
+  void FinishSignIn(const SignInCheck& check, bool is_password);
+
+  // False when serving is to end.
+  bool TakeSignal();
+  void TakeEndedChildren();
+  void TakeEndedWorker(const siginfo_t& ended);
+  void EndDeadTasksOfAll();
+
+  const FrontEndFiles& files_;
+  std::string listen_;
+  FileDescriptor lock_;
+  FileDescriptor signals_;
+  sigset_t saved_mask_{};
+  FileDescriptor control_;
+  pid_t front_end_ = -1;
+  bool is_listening_ = false;
+  bool is_said_ = false;
+  Launcher launcher_;
+  SignInGate gate_;
+  std::map<pid_t, SignInCheck> checks_;
+  std::set<pid_t> requests_;
+};
+
+}  // namespace Device
+
+#endif  // DEVICE_HOST_WEB_HOST_H_

@@ -1,0 +1,33 @@
+// The process of one request that came over HTTP.
+#ifndef DEVICE_HOST_WEB_REQUEST_H_
+#define DEVICE_HOST_WEB_REQUEST_H_
+
+#include "device/bodies/file_descriptor.h"
+#include "device/host/launcher.h"
+
+namespace Device {
+
+// What a frame from the front end asks for, by its "kind"; beside it "session" and what the kind
+// needs.
+inline constexpr char kKindCall[] = "call";  // "api", "version", "method", "params", "followed"
+inline constexpr char kKindSession[] = "session";  // who is signed in
+inline constexpr char kKindFiles[] = "files";      // "path"
+inline constexpr char kKindTasks[] = "tasks";
+inline constexpr char kKindEvents[] = "events";
+inline constexpr char kKindCodes[] = "codes";  // no session needed
+
+// Reads the request from the stream, serves it with the identity of the session's user, and answers
+// on the stream.
+void ServeWebRequest(Launcher& launcher, FileDescriptor exchange);
+
+// What a session tells its user: {"user", "codepage"}.
+Json::Value SessionBody(const std::string& user);
+
+// Answers with a frame {"status", "body"}. False when nobody is there to read it.
+bool Answer(int exchange, int status, const Json::Value& body);
+// The same with a body {"error": reason}.
+bool Refuse(int exchange, int status, const std::string& reason);
+
+}  // namespace Device
+
+#endif  // DEVICE_HOST_WEB_REQUEST_H_

@@ -1,0 +1,155 @@
+#include "device/web/body.h"
+
+#include <cstdlib>
+#include <stdexcept>
+
+#include "device/bodies/json_text.h"
+
+namespace Web {
+
+namespace {
+
+constexpr char kFormType[] = "application/x-www-form-urlencoded";
+
+int HexDigit(char digit) {
+  const std::string digits = "0123456789abcdef";
+  const std::size_t value = digits.find(static_cast<char>(digit | 0x20));
+  return value == std::string::npos ? -1 : static_cast<int>(value);
+}
+
+// Throws std::runtime_error for a "%" without two digits.
+std::string UnquoteField(const std::string& text, std::size_t place) {
+  std::string plain;
+  for (std::size_t at = 0; at < text.size(); ++at) {
+    if (text[at] != '%') {
+      plain += text[at] == '+' ? ' ' : text[at];
+      continue;
+    }
+    const int high = at + 2 < text.size() ? HexDigit(text[at + 1]) : -1;
+    const int low = high < 0 ? -1 : HexDigit(text[at + 2]);
+    if (low < 0) {
+      throw std::runtime_error("body: byte " + std::to_string(place + at + 1) +
+                               ": '%' without two digits");
+    }
+    plain += static_cast<char>(high * 16 + low);
+    at += 2;
+  }
+  return plain;
+}
+
+Json::Value ParseForm(const std::string& body) {
+  Json::Value form(Json::objectValue);
+  for (std::size_t begin = 0; begin < body.size();) {
+    const std::size_t end = std::min(body.find('&', begin), body.size());
+    const std::size_t equals = std::min(body.find('=', begin), end);
+    const std::string name = UnquoteField(body.substr(begin, equals - begin), begin);
+    const std::size_t value = std::min(equals + 1, end);
+    if (form.isMember(name)) {
+      throw std::runtime_error("body: field '" + name + "' stands there twice");
+    }
+    form[name] = UnquoteField(body.substr(value, end - value), value);
+    begin = end + 1;
+  }
+  return form;
+}
+
+int VersionOf(const Json::Value& field) {
+  if (field.isInt()) {
+    return field.asInt();
+  }
+  const std::string text = field.isString() ? field.asString() : "";
+  char* end = nullptr;
+  const long number = std::strtol(text.c_str(), &end, 10);
+  if (text.empty() || *end != 0 || number < 0 || number > 1000) {
+    throw std::runtime_error("'version' is missing or not a number");
+  }
+  return static_cast<int>(number);
+}
+
+// Bytes of the valid UTF-8 sequence at that place, 0 when there is none.
+std::size_t SequenceLength(const std::string& text, std::size_t at) {
+  const auto byte = [&](std::size_t index) {
+    return index < text.size() ? static_cast<unsigned char>(text[index]) : 0U;
+  };
+  const unsigned first = byte(at);
+  if (first < 0x80) {
+    return 1;
+  }
+  const std::size_t length = first >= 0xF5 || first < 0xC2 ? 0
+                             : first >= 0xF0               ? 4
+                             : first >= 0xE0               ? 3
+                                                           : 2;
+  for (std::size_t index = 1; index < length; ++index) {
+    if ((byte(at + index) & 0xC0U) != 0x80U) {
+      return 0;
+    }
+  }
+  // Longer than need be, surrogates, and above the last code point.
+  const unsigned second = byte(at + 1);
+  const bool is_wrong = (first == 0xE0 && second < 0xA0) || (first == 0xED && second >= 0xA0) ||
+                        (first == 0xF0 && second < 0x90) || (first == 0xF4 && second >= 0x90);
+  return is_wrong ? 0 : length;
+}
+
+}  // namespace
+
+Json::Value ParseBody(const std::string& content_type, const std::string& body) {
+  if (content_type.compare(0, sizeof kFormType - 1, kFormType) == 0) {
+    return ParseForm(body);
+  }
+  Json::Value value;
+  try {
+    value = Device::ParseJson(Device::DecodeByteEscapes(body), Device::kParamDepth);
+  } catch (const std::runtime_error& error) {
+    throw std::runtime_error(std::string("body: ") + error.what());
+  }
+  if (!value.isObject()) {
+    throw std::runtime_error("body: not an object");
+  }
+  return value;
+}
+
+Json::Value ApiRequest(const Json::Value& body) {
+  Json::Value request(Json::objectValue);
+  request["api"] = TextField(body, "api");
+  request["method"] = TextField(body, "method");
+  request["version"] = VersionOf(body["version"]);
+  request["params"] = body.get("params", body);
+  if (!request["params"].isObject()) {
+    throw std::runtime_error("'params' is not an object");
+  }
+  for (const char* name : {"api", "method", "version"}) {
+    if (!body.isMember("params")) {
+      request["params"].removeMember(name);
+    }
+  }
+  return request;
+}
+
+std::string TextField(const Json::Value& body, const std::string& name) {
+  if (!body[name].isString()) {
+    throw std::runtime_error("'" + name + "' is missing or no text");
+  }
+  return body[name].asString();
+}
+
+std::string BodyText(const Json::Value& value) {
+  const std::string text = Device::ToText(value);
+  std::string safe;
+  for (std::size_t at = 0; at < text.size();) {
+    const std::size_t length = SequenceLength(text, at);
+    if (length > 0) {
+      safe.append(text, at, length);
+      at += length;
+      continue;
+    }
+    constexpr char kDigits[] = "0123456789abcdef";
+    const auto byte = static_cast<unsigned char>(text[at++]);
+    safe += "\\udc";
+    safe += kDigits[byte >> 4U];
+    safe += kDigits[byte & 0xFU];
+  }
+  return safe;
+}
+
+}  // namespace Web

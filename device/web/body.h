@@ -1,0 +1,29 @@
+// The bodies of HTTP requests and answers. No I/O.
+#ifndef DEVICE_WEB_BODY_H_
+#define DEVICE_WEB_BODY_H_
+
+#include <json/json.h>
+
+#include <string>
+
+namespace Web {
+
+// The object that a body holds: JSON, or a form, whose fields become texts. Throws
+// std::runtime_error with the place and the reason.
+Json::Value ParseBody(const std::string& content_type, const std::string& body);
+
+// A request of the API as the launcher's processes read it. Where there are no "params", as in a
+// form, every field but "api", "version" and "method" is a parameter. Throws std::runtime_error
+// that names the field.
+Json::Value ApiRequest(const Json::Value& body);
+
+// A text field. Throws std::runtime_error that names it when it is missing or none.
+std::string TextField(const Json::Value& body, const std::string& name);
+
+// One line of JSON in UTF-8. A byte of a text that is no part of valid UTF-8 becomes the escape
+// \udc80 to \udcff, which ParseBody turns back.
+std::string BodyText(const Json::Value& value);
+
+}  // namespace Web
+
+#endif  // DEVICE_WEB_BODY_H_

@@ -1,0 +1,53 @@
+#include "device/web/exchange.h"
+
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include "device/bodies/json_text.h"
+#include "device/host/frame.h"
+#include "device/host/http_status.h"
+
+namespace Web {
+
+namespace {
+
+constexpr int kControl = STDIN_FILENO;  // the launcher has put its socket there
+
+}  // namespace
+
+Exchange::Exchange(Device::ControlKind kind, const std::string& text) {
+  int ends[2];
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
+    return;
+  }
+  stream_ = Device::FileDescriptor(ends[0]);
+  const Device::FileDescriptor other_side(ends[1]);
+  Device::SendControl(kControl, kind, text, other_side.Get());
+}
+
+Exchange::Exchange(const Json::Value& request) : Exchange(Device::ControlKind::kRequest, "") {
+  Device::WriteFrame(stream_.Get(), Device::ToText(request));
+}
+
+Answer Exchange::Receive() {
+  const std::optional<Json::Value> frame = Next();
+  if (!frame) {
+    Answer answer{Device::kHttpInternal, Json::Value(Json::objectValue)};
+    answer.body["error"] = "the request ended without an answer";
+    return answer;
+  }
+  return {(*frame)["status"].asInt(), (*frame)["body"]};
+}
+
+std::optional<Json::Value> Exchange::Next() {
+  const std::optional<std::string> text = Device::ReadFrame(stream_.Get());
+  return text ? std::optional(Device::ParseJson(*text)) : std::nullopt;
+}
+
+bool Exchange::Wait(int milliseconds) const {
+  pollfd source = {stream_.Get(), POLLIN, 0};
+  return poll(&source, 1, milliseconds) != 0;
+}
+
+}  // namespace Web

@@ -1,0 +1,40 @@
+// One exchange of the front end with the launcher.
+#ifndef DEVICE_WEB_EXCHANGE_H_
+#define DEVICE_WEB_EXCHANGE_H_
+
+#include <json/json.h>
+
+#include <optional>
+#include <string>
+
+#include "device/bodies/file_descriptor.h"
+#include "device/host/control.h"
+
+namespace Web {
+
+struct Answer {
+  int status = 0;  // HTTP
+  Json::Value body;
+};
+
+class Exchange {
+ public:
+  // Tells the launcher. Where that fails, no frame will come.
+  Exchange(Device::ControlKind kind, const std::string& text);
+  // Tells the launcher to have the request served, and sends it.
+  explicit Exchange(const Json::Value& request);
+
+  // The answer; the status 500 when the other side went without one.
+  Answer Receive();
+  // The next frame of a stream. Nothing at its end.
+  std::optional<Json::Value> Next();
+  // Waits for the next frame. False after the time-out.
+  bool Wait(int milliseconds) const;
+
+ private:
+  Device::FileDescriptor stream_;
+};
+
+}  // namespace Web
+
+#endif  // DEVICE_WEB_EXCHANGE_H_

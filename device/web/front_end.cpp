@@ -1,0 +1,294 @@
+#include "device/web/front_end.h"
+
+#include <poll.h>
+#include <sys/socket.h>
+
+#include <chrono>
+#include <stdexcept>
+
+#include "device/bodies/json_text.h"
+#include "device/host/http_status.h"
+#include "device/web/body.h"
+#include "device/web/connection_threads.h"
+
+namespace Web {
+
+namespace {
+
+using httplib::Request;
+using httplib::Response;
+
+constexpr std::size_t kMostBodyBytes = std::size_t{8} << 20U;
+constexpr int kBacklog = 1024;
+constexpr int kReadTimeout = 10;      // seconds without a byte from a client
+constexpr int kKeepAlive = 30;        // seconds between requests
+constexpr int kKeepAliveMost = 1000;  // requests on one connection
+constexpr int kHeartbeatMs = 5000;
+constexpr std::chrono::seconds kEndGrace(5);
+constexpr char kJson[] = "application/json";
+constexpr char kCookie[] = "session";
+constexpr char kCookieAttributes[] = "; Path=/; HttpOnly; SameSite=Strict";
+constexpr char kPolicy[] =
+    "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self'; connect-src 'self'; "
+    "base-uri 'none'; form-action 'none'; frame-ancestors 'none'";
+
+void Respond(Response& response, int status, const Json::Value& body) {
+  response.status = status;
+  if (!body.isNull()) {
+    response.set_content(BodyText(body) + "\n", kJson);
+  }
+}
+
+void Refuse(Response& response, int status, const std::string& reason) {
+  Json::Value body(Json::objectValue);
+  body["error"] = reason;
+  Respond(response, status, body);
+}
+
+// The cookie's value; empty when there is none.
+std::string SessionOf(const Request& request) {
+  const std::string cookies = "; " + request.get_header_value("Cookie");
+  const std::string name = std::string("; ") + kCookie + "=";
+  const std::size_t begin = cookies.find(name);
+  if (begin == std::string::npos) {
+    return "";
+  }
+  const std::size_t value = begin + name.size();
+  return cookies.substr(value, cookies.find(';', value) - value);
+}
+
+// Browsers name the page that a request comes from; others leave it out.
+bool IsForeign(const Request& request) {
+  const std::string origin = request.get_header_value("Origin");
+  const std::string host = "://" + request.get_header_value("Host");
+  return !origin.empty() && (origin.size() < host.size() ||
+                             origin.compare(origin.size() - host.size(), host.size(), host) != 0 ||
+                             origin.find("://") != origin.size() - host.size());
+}
+
+Json::Value Asked(const Request& request, const char* kind) {
+  Json::Value asked(Json::objectValue);
+  asked["kind"] = kind;
+  asked["session"] = SessionOf(request);
+  return asked;
+}
+
+// Passes what the launcher's process answers on.
+void Pass(const Json::Value& asked, Response& response) {
+  const Answer answer = Exchange(asked).Receive();
+  Respond(response, answer.status, answer.body);
+}
+
+const char* ReasonFor(int status) {
+  switch (status) {
+    case Device::kHttpNotFound:
+      return "no such route";
+    case Device::kHttpTooLarge:
+      return "the body is longer than 8 MiB";
+    case Device::kHttpInternal:
+      return "the front end has failed";
+    default:
+      return "not a request that is understood";
+  }
+}
+
+// The body as it came: the library would cut a long form. False, with the response's status, when
+// it is too long or breaks off.
+bool ReadBody(const httplib::ContentReader& reader, std::string& body, Response& response) {
+  bool is_too_long = false;
+  const bool is_read = reader([&](const char* data, std::size_t size) {
+    is_too_long = is_too_long || body.size() + size > kMostBodyBytes;
+    if (!is_too_long) {
+      body.append(data, size);
+    }
+    return true;  // to its end, where the connection's next request begins
+  });
+  if (is_too_long) {
+    response.status = Device::kHttpTooLarge;
+  }
+  return is_read && !is_too_long;
+}
+
+std::string EventText(const Json::Value& frame) {
+  return "event: " + frame["event"].asString() + "\ndata: " + BodyText(frame["data"]) + "\n\n";
+}
+
+}  // namespace
+
+FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
+  server_.new_task_queue = [] { return new ConnectionThreads; };
+  server_.set_payload_max_length(kMostBodyBytes);
+  server_.set_read_timeout(kReadTimeout);
+  server_.set_keep_alive_timeout(kKeepAlive);
+  server_.set_keep_alive_max_count(kKeepAliveMost);
+  server_.set_tcp_nodelay(true);
+  server_.set_socket_options([this](int socket) {
+    const int yes = 1;
+    setsockopt(socket, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
+    socket_ = socket;
+  });
+  server_.set_default_headers({{"Content-Security-Policy", kPolicy},
+                               {"X-Content-Type-Options", "nosniff"},
+                               {"Referrer-Policy", "no-referrer"},
+                               {"Cross-Origin-Resource-Policy", "same-origin"},
+                               {"Cache-Control", "no-store"}});
+  server_.set_pre_routing_handler([this](const Request& request, Response& response) {
+    if (is_ending_) {
+      Refuse(response, Device::kHttpUnavailable, "the device is ending");
+    } else if (IsForeign(request)) {
+      Refuse(response, Device::kHttpForbidden, "the request comes from another site's page");
+    } else {
+      return httplib::Server::HandlerResponse::Unhandled;
+    }
+    return httplib::Server::HandlerResponse::Handled;
+  });
+  server_.set_error_handler([](const Request& /*request*/, Response& response) {
+    if (response.body.empty()) {
+      Refuse(response, response.status, ReasonFor(response.status));
+    }
+  });
+  AddPage(files);
+  AddRoutes();
+}
+
+void FrontEnd::AddPage(const std::map<std::string, PageFile>& files) {
+  for (const auto& [path, file] : files) {
+    std::string pattern;
+    for (const char each : path) {
+      pattern += each == '.' ? "\\." : std::string(1, each);
+    }
+    server_.Get(pattern, [&file = file](const Request& /*request*/, Response& response) {
+      response.set_content(file.content, file.content_type);
+    });
+  }
+}
+
+void FrontEnd::AddRoutes() {
+  Post("/session", &FrontEnd::SignIn);
+  Post("/webapi", &FrontEnd::CallApi);
+  server_.Delete("/session", [this](const Request& request, Response& response) {
+    SignOut(request, response);
+  });
+  for (const char* kind : {"session", "tasks", "codes"}) {
+    server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
+      Pass(Asked(request, kind), response);
+    });
+  }
+  server_.Get("/files", [](const Request& request, Response& response) {
+    if (!request.has_param("path")) {
+      Refuse(response, Device::kHttpBadRequest, "'path' is missing");
+      return;
+    }
+    Json::Value asked = Asked(request, "files");
+    asked["path"] = request.get_param_value("path");
+    Pass(asked, response);
+  });
+  server_.Get("/events", [this](const Request& request, Response& response) {
+    StreamEvents(request, response);
+  });
+}
+
+void FrontEnd::Post(const char* route,
+                    void (FrontEnd::*handler)(const Request&, const Json::Value&, Response&)) {
+  server_.Post(route, [this, handler](const Request& request, Response& response,
+                                      const httplib::ContentReader& reader) {
+    ++serving_;
+    std::string body;
+    try {
+      if (ReadBody(reader, body, response)) {
+        (this->*handler)(request, ParseBody(request.get_header_value("Content-Type"), body),
+                         response);
+      }
+    } catch (const std::runtime_error& error) {
+      Refuse(response, Device::kHttpBadRequest, error.what());
+    }
+    --serving_;
+  });
+}
+
+void FrontEnd::SignIn(const Request& /*request*/, const Json::Value& body, Response& response) {
+  Json::Value asked(Json::objectValue);
+  asked["user"] = TextField(body, "user");
+  asked["password"] = TextField(body, "password");
+  const std::string text = Device::ToText(asked);
+  if (text.size() > Device::kMostControlBytes) {
+    Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
+    return;
+  }
+  Answer answer = Exchange(Device::ControlKind::kSignIn, text).Receive();
+  if (answer.status == Device::kHttpOk) {
+    response.set_header("Set-Cookie", std::string(kCookie) + "=" +
+                                          answer.body["session"].asString() + kCookieAttributes);
+    answer.body.removeMember("session");
+  } else if (answer.status == Device::kHttpTooMany) {
+    response.set_header("Retry-After", answer.body["retry_after"].asString());
+    answer.body.removeMember("retry_after");
+  }
+  Respond(response, answer.status, answer.body);
+}
+
+void FrontEnd::SignOut(const Request& request, Response& response) {
+  const std::string session = SessionOf(request).substr(0, Device::kMostControlBytes);
+  const Answer answer = Exchange(Device::ControlKind::kSignOut, session).Receive();
+  response.set_header("Set-Cookie", std::string(kCookie) + "=; Max-Age=0" + kCookieAttributes);
+  Respond(response, answer.status, answer.body);
+}
+
+void FrontEnd::CallApi(const Request& request, const Json::Value& body, Response& response) {
+  Json::Value asked = ApiRequest(body);
+  asked["kind"] = "call";
+  asked["session"] = SessionOf(request);
+  asked["followed"] = streams_.HasAny(asked["session"].asString());
+  Pass(asked, response);
+}
+
+void FrontEnd::StreamEvents(const Request& request, Response& response) {
+  const Json::Value asked = Asked(request, "events");
+  const std::shared_ptr<void> counted = streams_.Open(asked["session"].asString());
+  if (counted == nullptr) {
+    response.set_header("Retry-After", "10");
+    Refuse(response, Device::kHttpTooMany, "too many event streams");
+    return;
+  }
+  const auto exchange = std::make_shared<Exchange>(asked);
+  const Answer answer = exchange->Receive();
+  if (answer.status != Device::kHttpOk) {
+    Respond(response, answer.status, answer.body);
+    return;
+  }
+  response.set_chunked_content_provider(
+      "text/event-stream", [exchange, counted, this](std::size_t /*at*/, httplib::DataSink& sink) {
+        // A comment now and then tells whether the client is still there.
+        std::string text = ":\n\n";
+        if (exchange->Wait(kHeartbeatMs)) {
+          const std::optional<Json::Value> frame = exchange->Next();
+          if (!frame) {
+            sink.done();
+            return true;
+          }
+          text = EventText(*frame);
+        }
+        return !is_ending_ && sink.write(text.data(), text.size());
+      });
+}
+
+int FrontEnd::Bind(const std::string& address, int port) {
+  errno = 0;
+  const int bound = port == 0                             ? server_.bind_to_any_port(address)
+                    : server_.bind_to_port(address, port) ? port
+                                                          : -1;
+  if (bound >= 0) {
+    listen(socket_, kBacklog);
+  }
+  return bound;
+}
+
+void FrontEnd::Stop() {
+  is_ending_ = true;
+  const auto deadline = std::chrono::steady_clock::now() + kEndGrace;
+  while (serving_ > 0 && std::chrono::steady_clock::now() < deadline) {
+    poll(nullptr, 0, 1);
+  }
+}
+
+}  // namespace Web

@@ -1,0 +1,78 @@
+// The archiver's own parsers, with input that the whole program hardly gets.
+#include <gtest/gtest.h>
+
+#include "device/archiver/code_page.h"
+#include "device/archiver/command_line.h"
+#include "device/archiver/failure.h"
+#include "device/archiver/list_file.h"
+#include "device/archiver/progress.h"
+#include "tests/programs.h"
+
+namespace Archiver {
+namespace {
+
+TEST(CommandLine, RefusesWhatNoCallerSends) {
+  for (const char* arguments : {"", "x /a @l", "a rel @l", "a @l", "a /a", "a /a @l -mx",
+                                "a /a/ @l", "a /a @l -up1!/etc", "a /a /b @l", "a /a @l -xr!"}) {
+    EXPECT_THROW(ParseCommandLine(Words(arguments)), Failure) << arguments;
+  }
+}
+
+TEST(ListFile, NamesEachSourceOnceWithoutItsDots) {
+  EXPECT_EQ(
+      WithoutNested(ReadSources("./b/\n./b/x\n./a b \n././b//.\n./bx\n./c/d/e\n./c/d\n", "l")),
+      (Strings{"b", "a b ", "bx", "c/d"}));
+  for (const char* text : {"", "\n", "./\n", "/etc\n", "./a/../../b\n", "..\n"}) {
+    EXPECT_THROW(ReadSources(text, "l"), Failure) << text;
+  }
+}
+
+TEST(OutputParser, ReadsTheSameEventsHoweverTheOutputIsCut) {
+  const auto wiped = [](const std::string& text) {
+    const std::string back(text.size(), '\b');
+    return text + back + std::string(text.size(), ' ') + back;
+  };
+  const std::string output =
+      wiped("  0M Scan ") +
+      "1 file, 9 bytes\n\nAdd new data to archive: 2 files, 5000000000 bytes\n" + wiped("  0%") +
+      "+ a/50%\n" + wiped(" 7%") + wiped(" 84% 1") + "U b\b\n= kept\n" + wiped(" 99% 2") +
+      "\n  3% name\n+ c";
+  for (size_t step = 1; step <= output.size(); ++step) {
+    OutputParser parser;
+    std::string found;
+    for (size_t at = 0; at < output.size(); at += step) {
+      for (const Event& event : parser.Feed(output.substr(at, step))) {
+        found += event.kind == Event::Kind::kFile    ? "F" + event.name
+                 : event.kind == Event::Kind::kTotal ? "T" + std::to_string(event.value)
+                                                     : "P" + std::to_string(event.value);
+        found += ' ';
+      }
+    }
+    EXPECT_EQ(found, "T5000000000 P0 Fa/50% P7 P84 Fb\b P99 P3 ") << "in steps of " << step;
+  }
+}
+
+TEST(CodePage, ConvertsOnlyWhatComesBackUnchanged) {
+  const struct {
+    const char *page, *utf8, *bytes;
+  } rows[] = {{"CP932", "日本ソ", "\x93\xFA\x96\x7B\x83\x5C"},
+              {"932", "あ", "\x82\xA0"},
+              {"Shift_JIS", "あ", "\x82\xA0"},
+              {"CP437", "é", "\x82"},
+              {"GBK", "中", "\xD6\xD0"},
+              {"EUC-KR", "가", "\xB0\xA1"},
+              {"ISO-8859-1", "é", "\xE9"},
+              {"ISO-8859-1", "日", "none"},
+              {"CP932", "bad\xFF", "none"},
+              {"CP437", "가", "none"}};
+  for (const auto& row : rows) {
+    EXPECT_EQ(CodePage(row.page).Encode(row.utf8).value_or("none"), row.bytes) << row.utf8;
+  }
+  for (const char* useless_in_paths :
+       {"CP9x32", "UTF-16", "UTF-7", "CP037", "CP932//IGNORE", "CP932,ASCII", "-"}) {
+    EXPECT_THROW(CodePage{useless_in_paths}, Failure) << useless_in_paths;
+  }
+}
+
+}  // namespace
+}  // namespace Archiver

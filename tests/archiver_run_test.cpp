@@ -1,0 +1,381 @@
+// The archiver as a program: what it packs, and what it leaves behind when it cannot.
+#include <gtest/gtest.h>
+#include <sys/prctl.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <zip.h>
+
+#include <algorithm>
+#include <chrono>
+#include <csignal>
+#include <filesystem>
+#include <memory>
+
+#include "device/archiver/cancel.h"
+#include "device/archiver/failure.h"
+#include "device/archiver/report.h"
+#include "device/archiver/stock_7z.h"
+#include "tests/emulation.h"
+#include "tests/unpacked.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+struct Options {
+  std::string command = "a", actions, password;
+  const char* code_page = nullptr;  // set for a zip
+};
+
+// A share to pack from, a folder for archives and the caller's list file, all of the test's own.
+class ArchiverTest : public testing::Test {
+ protected:
+  ArchiverTest() {
+    WriteFile(share / "a", "a");
+    fs::create_directories(out);
+  }
+
+  Strings CommandLine(const std::string& archive, const Strings& sources, const Options& options) {
+    std::string list;
+    for (const std::string& source : sources) {
+      list += "./" + source + '\n';
+    }
+    WriteFile(root / "list", list);
+    Strings argv = {KAVO_7Z_PATH, options.command, "-utf16", out / archive, options.actions, ""};
+    if (options.code_page != nullptr) {
+      argv.push_back(std::string("-lang") + options.code_page);
+    }
+    if (!options.password.empty()) {
+      argv.push_back("-p" + options.password);
+    }
+    argv.insert(argv.end(), {"-xr!@eaDir", "@" + (root / "list").string(), "-progress"});
+    return argv;
+  }
+
+  Strings Good(const std::string& archive, const Strings& sources, const Options& options = {}) {
+    const Ran ran = RunProgram(CommandLine(archive, sources, options), share);
+    Strings lines = Lines(ran.out);
+    EXPECT_EQ(ran.status, 0) << ran.out;
+    EXPECT_EQ(lines.back(), "Progress: 100");
+    for (const std::string& line : lines) {
+      EXPECT_TRUE(line.find("Error:") == line.npos || line.rfind("Compressing ", 0) == 0) << line;
+    }
+    return lines;
+  }
+
+  void Bad(const std::string& archive, const Strings& sources, const std::string& cause,
+           const Options& options = {}) {
+    const Ran ran = RunProgram(CommandLine(archive, sources, options), share);
+    EXPECT_NE(ran.status, 0);
+    const std::string last = Lines(ran.out).back();
+    EXPECT_EQ(last.rfind("Error: ", 0), 0U) << ran.out;
+    EXPECT_NE(last.find(cause), std::string::npos) << ran.out;
+    EXPECT_EQ(ran.out.find("Error:"), ran.out.rfind("Error:")) << ran.out;
+    EXPECT_EQ(ran.out.find("Progress: 100"), std::string::npos);
+  }
+
+  // A run that packs a sparse file of that size, to "new".
+  std::unique_ptr<Program> Pack(const Options& options = {}, std::uintmax_t size = kHuge) {
+    WriteFile(share / "huge", "");
+    fs::resize_file(share / "huge", size);
+    auto run = std::make_unique<Program>(CommandLine("new", {"huge"}, options), share);
+    EXPECT_TRUE(run->ReadUntil("Compressing huge\n")) << run->Seen();
+    return run;
+  }
+
+  Strings InOut() {
+    Strings names;
+    for (const auto& entry : fs::directory_iterator(out)) {
+      names.push_back(entry.path().filename());
+    }
+    std::sort(names.begin(), names.end());
+    return names;
+  }
+
+  static constexpr std::uintmax_t kHuge = 5ULL << 30U;  // it takes seconds to pack
+  const TempFolder temp;
+  const fs::path root = temp.Path(), share = root / "share", out = root / "out";
+};
+
+TEST_F(ArchiverTest, KeepsEveryNameWhateverItHolds) {
+  Strings names = {"*",         "a?[b]",  "\"q\"",     "\"",   "-p",     "@at",
+                   " lead",     "trail ", "tab\t",     "cr\r", "new\\n", "bad\xFF.txt",
+                   "esc\x1B[m", "é日",    "e\xCC\x81", "...",  "!x",     "\xED\xA0\x80"};
+  names.emplace_back("Error: No space left on device");
+  Tree expected = {"d/", "d/a\nError: b=x", "d/pipe=", "d/sub/", "d/sub/e/", "pipe="};
+  for (const std::string& name : names) {
+    WriteFile(share / name, name);
+    WriteFile(share / "d/sub" / name, name);
+    expected.insert({name + "=" + name, "d/sub/" + name + "=" + name});
+  }
+  WriteFile(share / "d/a\nError: b", "x");
+  WriteFile(share / "xother", "matched by a pattern only");
+  fs::create_directories(share / "d/sub/e");
+  ASSERT_EQ(mkfifo((share / "pipe").c_str(), 0600), 0);
+  ASSERT_EQ(mkfifo((share / "d/pipe").c_str(), 0600), 0);
+  Strings sources = names;
+  sources.insert(sources.end(), {"d/sub", "d", "*", "pipe"});
+  for (const char* page : {static_cast<const char*>(nullptr), ""}) {
+    Options options;
+    options.code_page = page;
+    const std::string archive = page == nullptr ? "a*b" : "zip!";
+    const Strings lines = Good(archive, sources, options);
+    EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
+                            [](const auto& line) { return line.rfind("Compressing ", 0) == 0; }),
+              static_cast<long>(2 * names.size() + (page == nullptr ? 1 : 3)));  // with the pipes
+    EXPECT_EQ(Unpacked(out / archive), expected);
+    EXPECT_EQ(ReadFile(out / archive).substr(0, 2), page == nullptr ? "7z" : "PK");
+  }
+}
+
+TEST_F(ArchiverTest, UpdatesAsTheActionsSay) {
+  const std::string name(255, 'n');
+  const struct {
+    const char *command, *actions;
+    Tree expected;
+  } rows[] = {
+      {"a", "", {"d/", "d/gone=1", "d/new=2", "d/same=2"}},
+      {"u", "-up1q1r0x1y2z1w2", {"d/", "d/gone=1", "d/same=2"}},
+      {"u", "-up1q0r2x1y2z1w2", {"d/", "d/new=2", "d/same=2"}},
+  };
+  for (const char* page : {static_cast<const char*>(nullptr), "CP932"}) {
+    for (const auto& row : rows) {
+      fs::remove_all(share / "d");
+      fs::remove(out / name);
+      WriteFile(share / "d/gone", "1");
+      WriteFile(share / "d/same", "1");
+      fs::last_write_time(share / "d/same",
+                          fs::file_time_type::clock::now() - std::chrono::hours(1));
+      Options options;
+      options.code_page = page;
+      Good(name, {"d"}, options);
+      fs::remove(share / "d/gone");
+      WriteFile(share / "d/same", "2");
+      WriteFile(share / "d/new", "2");
+      options.command = row.command;
+      options.actions = row.actions;
+      Good(name, {"d"}, options);
+      EXPECT_EQ(Unpacked(out / name), row.expected) << row.command << row.actions;
+      EXPECT_EQ(InOut(), Strings{name});
+    }
+  }
+}
+
+TEST_F(ArchiverTest, StoresZipNamesInTheCodePageAndFindsThemAgain) {
+  WriteFile(share / "d/가", "cannot go to the code page");
+  WriteFile(share / "d/plain", "1");
+  Options options;
+  options.code_page = "CP932";
+  options.password = "pass word";
+  for (const char* content : {"first", "second"}) {
+    WriteFile(share / "d/日本ソ", content);
+    Good("a.zip", {"d"}, options);
+    zip_t* const zip = zip_open((out / "a.zip").c_str(), ZIP_RDONLY, nullptr);
+    ASSERT_NE(zip, nullptr);
+    std::set<std::string> names;  // as bytes, and whether they are marked as UTF-8
+    for (zip_int64_t entry = zip_get_num_entries(zip, 0); --entry >= 0;) {
+      const auto index = static_cast<zip_uint64_t>(entry);
+      const std::string raw = zip_get_name(zip, index, ZIP_FL_ENC_RAW);
+      names.insert(raw + (raw == zip_get_name(zip, index, ZIP_FL_ENC_STRICT) ? " utf8" : " raw"));
+    }
+    zip_discard(zip);
+    EXPECT_EQ(names, (std::set<std::string>{"d/ utf8", "d/plain utf8", "d/가 utf8",
+                                            "d/\x93\xFA\x96\x7B\x83\x5C raw"}));
+    const Strings unpack = {"/usr/bin/7z", "x", "-so", "-ppass word", out / "a.zip"};
+    EXPECT_NE(RunProgram(unpack).out.find(content), std::string::npos);
+  }
+  EXPECT_EQ(InOut(), Strings{"a.zip"});
+}
+
+TEST_F(ArchiverTest, EncryptsWithThePasswordWhateverItHolds) {
+  for (const std::string password : {" lead", "pä日\"'\\", "-p", "rogress", "tab\tend\r"}) {
+    for (const bool old_header : {false, true}) {  // which asks for the password once more
+      fs::remove(out / "z");
+      if (old_header) {
+        const Strings old = {"/usr/bin/7z", "a", "-mhe", "-sae", "-p" + password, out / "z", "a"};
+        ASSERT_EQ(RunProgram(old, share).status, 0);
+      }
+      Options options;
+      options.password = password;
+      Good("z", {"a"}, options);
+      EXPECT_EQ(RunProgram({"/usr/bin/7z", "t", "-p" + password, out / "z"}).status, 0) << password;
+      EXPECT_NE(RunProgram({"/usr/bin/7z", "t", "-pother", out / "z"}).status, 0) << password;
+    }
+  }
+}
+
+TEST_F(ArchiverTest, MakesAnArchiveOfTheUmasksMode) {
+  for (const mode_t mask : {077U, 022U}) {
+    umask(mask);
+    Good(std::to_string(mask), {"a"});
+    EXPECT_EQ(fs::status(out / std::to_string(mask)).permissions(), fs::perms(0666 & ~mask));
+  }
+}
+
+TEST_F(ArchiverTest, NamesWhatIsMissingAndLeavesTheOldArchive) {
+  Good("old", {"a"});
+  const std::string old = ReadFile(out / "old");
+  for (const char* target : {"new", "old"}) {
+    Bad(target, {"a", "mis*sing"}, "mis*sing");
+    Bad(target, {"a", "a/below"}, "a/below");
+  }
+  EXPECT_EQ(InOut(), Strings{"old"});
+  EXPECT_EQ(ReadFile(out / "old"), old);
+}
+
+TEST_F(ArchiverTest, RefusesTargetsThatAreNoArchiveOfTheType) {
+  WriteFile(out / "junk", "no archive");
+  WriteFile(out / "empty", "");
+  Good("seven", {"a"});
+  const std::string seven = ReadFile(out / "seven");
+  fs::create_symlink("seven", out / "link");
+  fs::create_directory(out / "folder");
+  Options zip;
+  zip.code_page = "CP932";
+  const Strings before = InOut();
+  for (const std::string& name : before) {
+    Bad(name, {"a"}, "", zip);
+  }
+  Bad("link", {"a"}, "link");
+  Bad(std::string(256, 'n'), {"a"}, "File name too long");
+  Bad("no/new", {"a"}, "No such file");
+  EXPECT_EQ(InOut(), before);
+  EXPECT_EQ(ReadFile(out / "junk") + ReadFile(out / "empty"), "no archive");
+  EXPECT_EQ(ReadFile(out / "seven"), seven);
+}
+
+TEST_F(ArchiverTest, SaysWhyARequestCannotBeMet) {
+  const struct {
+    const char *page, *password;
+    Strings sources;
+    const char* cause;
+  } rows[] = {{nullptr, "", {}, "names no files"},
+              {"CP9x32", "", {"a"}, "unknown code page 'CP9x32'"},
+              {"", "pä", {"a"}, "ASCII"},
+              {nullptr, "a\nb", {"a"}, "line break"},
+              {nullptr, "", {"@eaDir/x"}, "excluded"},
+              {nullptr, "", {"../share/a"}, "../share/a"}};
+  for (const auto& row : rows) {
+    Bad("new", row.sources, row.cause, {"a", "", row.password, row.page});
+  }
+  Bad("new", {"a"}, "command", {"x", "", "", nullptr});
+  EXPECT_EQ(InOut(), Strings{});
+}
+
+TEST_F(ArchiverTest, StopsAtOnceAndLeavesNothing) {
+  const bool adopts_orphans = prctl(PR_SET_CHILD_SUBREAPER, 1) == 0;
+  ASSERT_TRUE(adopts_orphans || kIsEmulated);  // an emulator may not know of it
+  for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGKILL, 0}) {  // 0: nobody reads any more
+    const auto run = Pack();
+    EXPECT_NE(run->Seen().find("Total: 5368709120\n"), std::string::npos) << run->Seen();
+    EXPECT_EQ(InOut().size(), 1U);
+    EXPECT_FALSE(fs::exists(out / "new"));
+    const auto start = std::chrono::steady_clock::now();
+    if (signal == 0) {
+      run->CloseOutput();
+    } else {
+      kill(signal == SIGKILL ? run->Pid() : -run->Pid(), signal);
+    }
+    EXPECT_EQ(run->Wait(), signal == SIGKILL ? -SIGKILL : 1);
+    int status = 0;
+    if (signal == SIGKILL) {  // the supervisor's; the job, an orphan now, cancels itself
+      EXPECT_EQ(waitpid(-1, &status, 0) > 0, adopts_orphans);
+      EXPECT_TRUE(run->ReadUntil("\nError: cancelled\n"));
+    }
+    EXPECT_EQ(InOut(), Strings{});
+    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(kSlowness));
+    EXPECT_EQ(waitpid(-1, &status, WNOHANG), -1);
+  }
+}
+
+TEST_F(ArchiverTest, SparesTheFolderOfARunThatIsAliveAndSweepsThatOfOneThatWasKilled) {
+  const auto run = Pack();
+  Strings before = InOut();
+  ASSERT_EQ(before.size(), 1U);
+  Good("other", {"a"});
+  EXPECT_EQ(InOut(), (Strings{before.front(), "other"}));
+
+  const std::string supervisor = std::to_string(run->Pid());
+  const int job = std::stoi(ReadFile("/proc/" + supervisor + "/task/" + supervisor + "/children"));
+  ASSERT_EQ(kill(job, SIGKILL), 0);
+  EXPECT_EQ(run->Wait(), 1);
+  EXPECT_TRUE(run->ReadUntil("\nError: the archiver was killed\n"));
+  EXPECT_EQ(InOut().size(), 2U);
+  // The stock 7z dies with its parent, in its own time; then nothing holds the lock.
+  for (int tries = 0; tries < 1000 && InOut() != Strings{"other"}; ++tries) {
+    Good("other", {"a"});
+  }
+  EXPECT_EQ(InOut(), Strings{"other"});
+}
+
+TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
+  for (const bool exists : {false, true}) {
+    if (exists) {
+      WriteFile(share / "b", "b");
+      Good("new", {"b"});
+    }
+    const auto run = Pack({}, 200 << 20);
+    Good("new", {"a"});
+    const std::string other = ReadFile(out / "new");
+    EXPECT_EQ(run->Wait(), 1);
+    EXPECT_TRUE(run->ReadUntil("it has changed meanwhile"));
+    EXPECT_EQ(ReadFile(out / "new"), other);
+    EXPECT_EQ(InOut(), Strings{"new"});
+  }
+}
+
+TEST_F(ArchiverTest, HidesThePasswordFromOtherUsers) {
+  if (kIsEmulated) {
+    GTEST_SKIP() << "what a program makes of its arguments is the emulator's own memory";
+  }
+  const auto run = Pack({"a", "", "geheim", nullptr});
+  int processes = 0;
+  for (const auto& entry : fs::directory_iterator("/proc")) {
+    const std::string command = ReadFile(entry.path() / "cmdline");
+    processes += command.find(root.string()) != std::string::npos ? 1 : 0;
+    EXPECT_EQ(command.find("geheim"), std::string::npos) << command;
+  }
+  EXPECT_EQ(processes, 3);  // supervisor, job, stock 7z
+}
+
+// What 7z says on standard error, a heading, the cause and the object on lines of their own.
+TEST(Run7z, TellsCauseAndObjectInOneLine) {
+  const struct {
+    const char *script, *line;
+  } rows[] = {
+      {"/nonexistent/7z", "cannot start '/nonexistent/7z': No such file or directory"},
+      {"kill -9 $$", "7z was killed by signal 9"},
+      {"exit 2", "7z failed with status 2"},
+      {"echo 'ERROR: oops' >&2", "7z failed with status 0: oops"},
+      {"printf '\\n\\nSystem ERROR:\\nerrno=28 : No space left\\n' >&2; exit 2",
+       "7z failed with status 2: No space left"},
+      {"printf '\\nWARNING: errno=13 : Permission den' >&2; exit 1",
+       "7z failed with status 1: Permission den"},
+      {"printf 'Error:\\ncannot open file\\n/v/x\\nerrno=36 : Too long\\n\\n\\nSystem ERROR:\\n"
+       "errno=36 : Too long\\n' >&2; exit 2",
+       "7z failed with status 2: cannot open file; /v/x; Too long"},
+      {"printf 'WARNING: errno=2 : Gone\\nleft out\\n' >&2; exit 2", "7z failed with status 2"},
+      {"printf 'WARNING: errno=2 : Gone\\nleft out\\nWARNING: errno=2 : Lost\\na\\n' >&2; exit 1",
+       "not everything can be packed: Lost; a"},
+      // At a warning 7z is not waited for.
+      {"printf 'WARNING: errno=2 : Gone\\nError: No space left on device\\033[m\\n' >&2; exec "
+       "sleep 60",
+       "not everything can be packed: Gone; No_space_left_on_device?[m"}};
+  for (const auto& row : rows) {
+    const Archiver::Cancel cancel(STDOUT_FILENO);
+    Archiver::Report report(cancel);
+    Archiver::Child7z child;
+    child.program = *row.script == '/' ? row.script : "/bin/sh";
+    child.arguments = {"-c", row.script};
+    child.folder = "/";
+    child.left_out = {"left out"};
+    try {
+      Archiver::Run7z(child, cancel, report);
+      ADD_FAILURE() << "succeeded: " << row.script;
+    } catch (const Archiver::Failure& failure) {
+      EXPECT_STREQ(failure.what(), row.line);
+    }
+  }
+}
+
+}  // namespace
