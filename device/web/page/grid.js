@@ -5,6 +5,7 @@ import { shown } from './names.js';
 import { Selection } from './selection.js';
 
 const ROWS_PER_BLOCK = 250;
+const AHEAD = '1500px';
 const ROWS_PER_PAGE = 10;
 const HEADER_ROWS = 1;
 
@@ -17,9 +18,10 @@ export class FileGrid {
   #selection = new Selection((turned) => this.#paint(turned));
   #entries = [];
   #rows = [];
+  #blocks = [];
   #active = 0;
   #touched = false;
-  #filling = 0;
+  #observer = new IntersectionObserver((seen) => this.#fillSeen(seen), { root: this.#root, rootMargin: AHEAD });
   #onOpen;
   #onSelect;
 
@@ -41,7 +43,7 @@ export class FileGrid {
   show(label, entries, active) {
     this.#fill(label, entries, new Set(), active);
     this.#root.scrollTop = 0;
-    this.#rows[this.#active]?.scrollIntoView({ block: 'nearest' });
+    this.#rowAt(this.#active)?.scrollIntoView({ block: 'nearest' });
   }
 
   // Fills the grid with what the same folder holds now: selection, focus and place stay.
@@ -49,54 +51,60 @@ export class FileGrid {
     const selected = new Set(this.selectedEntries.map((entry) => entry.name));
     const hadFocus = this.#body.contains(document.activeElement);
     const scrolled = this.#root.scrollTop;
-    const rendered = this.#rows.length;
+    const filled = this.#blocks.filter((block) => block.hasChildNodes()).map((block) => block.dataset.first);
     this.#fill(label, entries, selected, this.#entries[this.#active]?.name);
-    this.#renderTo(rendered);
+    for (const first of filled) this.#rowAt(Number(first));
     this.#root.scrollTop = scrolled;
-    if (hadFocus) this.#rows[this.#active]?.focus({ preventScroll: true });
+    if (hadFocus) this.#rowAt(this.#active)?.focus({ preventScroll: true });
   }
 
   #fill(label, entries, selected, active) {
     this.#entries = entries;
     this.#rows = [];
+    this.#blocks = [];
     this.#active = Math.max(0, entries.findIndex((entry) => entry.name === active));
     this.#selection.reset([...entries.keys()].filter((index) => selected.has(entries[index].name)), this.#active);
     this.#root.setAttribute('aria-label', label);
     this.#root.setAttribute('aria-rowcount', entries.length + HEADER_ROWS);
     this.#root.hidden = entries.length === 0;
-    this.#body.replaceChildren();
-    clearTimeout(this.#filling);
-    this.#renderTo(this.#active + 1);
-    this.#renderRest();
+    this.#observer.disconnect();
+    for (let first = 0; first < entries.length; first += ROWS_PER_BLOCK) {
+      const block = element('div', { role: 'rowgroup', class: 'block', 'data-first': first });
+      block.style.setProperty('--rows', Math.min(ROWS_PER_BLOCK, entries.length - first));
+      this.#blocks.push(block);
+      this.#observer.observe(block);
+    }
+    this.#body.replaceChildren(...this.#blocks);
+    this.#rowAt(this.#active);
     this.#afterChange();
   }
 
   focus() {
-    this.#rows[this.#active]?.focus();
+    this.#rowAt(this.#active)?.focus();
   }
 
   clearSelection() {
     this.#selection.clear();
   }
 
-  // Block by block, so that a large folder answers at once while the rest of it is filled in.
-  #renderRest() {
-    this.#renderTo(this.#rows.length + 1);
-    if (this.#rows.length < this.#entries.length) {
-      this.#filling = setTimeout(() => this.#renderRest());
+  // A block of rows is filled when it comes near the view, or one of its rows is wanted.
+  #fillSeen(seen) {
+    for (const { isIntersecting, target } of seen) {
+      if (isIntersecting) this.#rowAt(Number(target.dataset.first));
     }
   }
 
-  #renderTo(count) {
-    while (this.#rows.length < Math.min(count, this.#entries.length)) {
-      const first = this.#rows.length;
-      const entries = this.#entries.slice(first, first + ROWS_PER_BLOCK);
-      const rows = entries.map((entry, offset) => this.#makeRow(entry, first + offset));
-      const block = element('div', { role: 'rowgroup', class: 'block' }, ...rows);
-      block.style.setProperty('--rows', rows.length);
-      this.#rows.push(...rows);
-      this.#body.append(block);
+  #rowAt(index) {
+    if (index < this.#entries.length && !this.#rows[index]) {
+      const block = this.#blocks[Math.floor(index / ROWS_PER_BLOCK)];
+      const first = Number(block.dataset.first);
+      const rows = this.#entries.slice(first, first + ROWS_PER_BLOCK)
+        .map((entry, offset) => this.#makeRow(entry, first + offset));
+      rows.forEach((row, offset) => { this.#rows[first + offset] = row; });
+      block.append(...rows);
+      this.#observer.unobserve(block);
     }
+    return this.#rows[index];
   }
 
   #makeRow(entry, index) {
@@ -125,7 +133,7 @@ export class FileGrid {
   }
 
   #paint(indexes) {
-    for (const index of indexes.filter((each) => each < this.#rows.length)) {
+    for (const index of indexes.filter((each) => this.#rows[each])) {
       const isSelected = this.#selection.chosen.has(index);
       this.#rows[index].setAttribute('aria-selected', String(isSelected));
       this.#rows[index].querySelector('input').checked = isSelected;
@@ -147,11 +155,11 @@ export class FileGrid {
 
   #moveTo(index) {
     const target = Math.min(Math.max(index, 0), this.#entries.length - 1);
-    this.#renderTo(target + 1);
-    this.#rows[this.#active].tabIndex = -1;
+    this.#rowAt(this.#active).tabIndex = -1;
     this.#active = target;
-    this.#rows[target].tabIndex = 0;
-    this.#rows[target].focus();
+    const row = this.#rowAt(target);
+    row.tabIndex = 0;
+    row.focus();
   }
 
   #open(index) {
