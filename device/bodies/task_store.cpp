@@ -25,7 +25,8 @@ CREATE TABLE IF NOT EXISTS tasks (
 CREATE TABLE IF NOT EXISTS members (
   task TEXT NOT NULL, name TEXT NOT NULL, member TEXT NOT NULL, value TEXT,
   version INTEGER NOT NULL, PRIMARY KEY (task, name, member));
-CREATE TABLE IF NOT EXISTS workers (pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL);
+CREATE TABLE IF NOT EXISTS workers (
+  pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL, stopped INTEGER NOT NULL);
 CREATE TABLE IF NOT EXISTS notifications (
   time INTEGER NOT NULL, app TEXT NOT NULL, task TEXT NOT NULL, title TEXT NOT NULL,
   message TEXT NOT NULL, arguments TEXT NOT NULL);
@@ -276,18 +277,25 @@ void TaskStore::RemoveTask(const std::string& id) {
 }
 
 void TaskStore::AddWorker(pid_t pid, std::uint64_t start_time) {
-  Statement(database_.get(), "INSERT OR REPLACE INTO workers VALUES (?, ?)")
+  Statement(database_.get(), "INSERT OR REPLACE INTO workers VALUES (?, ?, 0)")
       .Bind(std::int64_t{pid})
       .Bind(static_cast<std::int64_t>(start_time))
       .Step();
 }
 
-std::optional<std::uint64_t> TaskStore::FindWorker(pid_t pid) {
-  Statement select(database_.get(), "SELECT start_time FROM workers WHERE pid = ?");
+std::optional<WorkerRow> TaskStore::FindWorker(pid_t pid) {
+  Statement select(database_.get(), "SELECT start_time, stopped FROM workers WHERE pid = ?");
   if (!select.Bind(std::int64_t{pid}).Step()) {
     return std::nullopt;
   }
-  return static_cast<std::uint64_t>(select.Number(0));
+  return WorkerRow{static_cast<std::uint64_t>(select.Number(0)), select.Number(1)};
+}
+
+void TaskStore::NoteStop(pid_t pid) {
+  Statement(database_.get(), "UPDATE workers SET stopped = ? WHERE pid = ?")
+      .Bind(std::time(nullptr))
+      .Bind(std::int64_t{pid})
+      .Step();
 }
 
 std::vector<pid_t> TaskStore::AllWorkers() {

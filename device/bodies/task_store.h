@@ -26,6 +26,13 @@ struct TaskRow {
   std::map<std::string, Json::Value> properties;
 };
 
+// A worker process. By its start time, one that has taken over its process id is not mistaken for
+// it.
+struct WorkerRow {
+  std::uint64_t start_time = 0;  // the kernel's ticks since boot
+  std::int64_t stopped = 0;      // when "stop" asked it to end, in seconds since 1970; 0: never
+};
+
 struct NotificationRow {
   std::int64_t number = 0;  // from 1 on, in the order of sending
   std::int64_t time = 0;    // seconds since 1970
@@ -57,10 +64,10 @@ class TaskStore {
                   bool finished);
   void RemoveTask(const std::string& id);
 
-  // Worker processes, each with the time at which it started, in the kernel's ticks since boot, so
-  // that a process id that another process has taken over is not mistaken for it.
   void AddWorker(pid_t pid, std::uint64_t start_time);
-  std::optional<std::uint64_t> FindWorker(pid_t pid);
+  std::optional<WorkerRow> FindWorker(pid_t pid);
+  // Notes that the worker is being stopped from now on.
+  void NoteStop(pid_t pid);
   std::vector<pid_t> AllWorkers();
   void RemoveWorker(pid_t pid);
 

@@ -30,7 +30,8 @@ std::string StateOf(const std::string& user, const TaskRow& row, const Json::Val
   if (row.finished) {
     return "finished";
   }
-  return !data["pid"].isInt() || IsWorkerAlive(user, data["pid"].asInt()) ? kRunning : kDead;
+  const pid_t pid = data["pid"].isInt() ? data["pid"].asInt() : -1;
+  return pid < 0 || IsWorkerAlive(user, pid) || IsBeingStopped(user, pid) ? kRunning : kDead;
 }
 
 Json::Value Destination(const Json::Value& data) {

@@ -11,6 +11,7 @@
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
+#include <ctime>
 #include <fstream>
 #include <memory>
 #include <optional>
@@ -97,9 +98,16 @@ void RegisterWorker(const std::string& user, pid_t pid) {
 }
 
 bool IsWorkerAlive(const std::string& user, pid_t pid) {
-  const std::optional<std::uint64_t> start_time = StoreOf(user).FindWorker(pid);
+  const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
   const std::optional<ProcessStat> stat = ReadStat(pid);
-  return start_time && stat && stat->start_time == *start_time && !HasEnded(*stat);
+  return worker && stat && stat->start_time == worker->start_time && !HasEnded(*stat);
+}
+
+bool IsBeingStopped(const std::string& user, pid_t pid) {
+  // From the first signal to the task's removal; a request that died meanwhile removes nothing.
+  constexpr std::time_t kLongest = 30;
+  const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
+  return worker && worker->stopped != 0 && std::time(nullptr) - worker->stopped < kLongest;
 }
 
 bool EndWorker(const std::string& user, pid_t pid) {
@@ -118,6 +126,7 @@ bool EndWorker(const std::string& user, pid_t pid) {
   if (error == ESRCH || !IsWorkerAlive(user, pid)) {
     return true;  // it has ended already, and an archiver that nobody reads from ends by itself
   }
+  StoreOf(user).NoteStop(pid);
   const Clock::time_point deadline = Clock::now() + kGrace;
   const bool is_told = has_descriptor
                            ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0

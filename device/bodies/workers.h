@@ -16,6 +16,9 @@ void RegisterWorker(const std::string& user, pid_t pid);
 // True if the process is a worker of the user's and has not ended; a zombie has.
 bool IsWorkerAlive(const std::string& user, pid_t pid);
 
+// True if "stop" is ending the worker: its task is going to be removed.
+bool IsBeingStopped(const std::string& user, pid_t pid);
+
 // Ends a worker of the user's and all that runs in its process group: asks first, and insists after
 // a grace of 5 s. False when it is none, or could not be ended.
 bool EndWorker(const std::string& user, pid_t pid);

@@ -64,7 +64,7 @@ async function open(page, ...names) {
 
 const row = (page, name) => page.getByRole('row')
   .filter({ has: page.getByText(name, { exact: true }) });
-const task = (page, dest) => page.getByRole('list', { name: 'Tasks' }).getByRole('listitem')
+const task = (page, dest) => page.getByRole('list', { name: 'Tasks' }).locator('> li')
   .filter({ has: page.getByText(dest, { exact: true }) });
 
 async function compress(page, fields) {
