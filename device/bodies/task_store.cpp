@@ -10,121 +10,45 @@
 
 namespace Device {
 
+using Statement = Database::Statement;
+
 namespace {
 
-constexpr int kBusyTimeoutMs = 30000;  // longer than any transaction of another process
+constexpr int kSchemaVersion = 1;  // one more with each change of the schema
 
 constexpr char kSchema[] = R"(
-PRAGMA journal_mode = WAL;
-PRAGMA synchronous = NORMAL;
-CREATE TABLE IF NOT EXISTS tasks (
+CREATE TABLE tasks (
   id TEXT PRIMARY KEY, finished INTEGER NOT NULL, updated INTEGER NOT NULL,
   version INTEGER NOT NULL) WITHOUT ROWID;
 -- Of each property a row without a member: its value, or "{}" for an object. Of each member of an
 -- object a row, whose value is null when it is gone. So a change of one member costs that member.
-CREATE TABLE IF NOT EXISTS members (
+CREATE TABLE members (
   task TEXT NOT NULL, name TEXT NOT NULL, member TEXT NOT NULL, value TEXT,
   version INTEGER NOT NULL, PRIMARY KEY (task, name, member));
-CREATE TABLE IF NOT EXISTS workers (
+CREATE TABLE workers (
   pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL, stopped INTEGER NOT NULL);
-CREATE TABLE IF NOT EXISTS notifications (
+CREATE TABLE notifications (
   time INTEGER NOT NULL, app TEXT NOT NULL, task TEXT NOT NULL, title TEXT NOT NULL,
   message TEXT NOT NULL, arguments TEXT NOT NULL);
-CREATE TABLE IF NOT EXISTS file_index (path TEXT PRIMARY KEY, time INTEGER NOT NULL) WITHOUT ROWID;
+CREATE TABLE file_index (path TEXT PRIMARY KEY, time INTEGER NOT NULL) WITHOUT ROWID;
 )";
 
-constexpr char kForReading[] = "BEGIN";
-constexpr char kForWriting[] = "BEGIN IMMEDIATE";
+constexpr bool kForReading = false;
+constexpr bool kForWriting = true;
 constexpr char kWhole[] = "";      // in place of a member's name
 constexpr char kMemberMark = '.';  // before it
 
 }  // namespace
 
-// One prepared statement, run to its end or reset when it goes out of scope.
-class TaskStore::Statement {
- public:
-  Statement(sqlite3* database, const char* sql)
-      : database_(database), statement_(nullptr, nullptr) {
-    sqlite3_stmt* statement = nullptr;
-    Check(sqlite3_prepare_v2(database, sql, -1, &statement, nullptr));
-    statement_ = {statement, sqlite3_finalize};
-  }
-
-  Statement& Bind(const std::string& text) {
-    Check(sqlite3_bind_text(statement_.get(), ++bound_, text.data(), static_cast<int>(text.size()),
-                            SQLITE_TRANSIENT));
-    return *this;
-  }
-  Statement& Bind(std::int64_t number) {
-    Check(sqlite3_bind_int64(statement_.get(), ++bound_, number));
-    return *this;
-  }
-  Statement& BindNull() {
-    Check(sqlite3_bind_null(statement_.get(), ++bound_));
-    return *this;
-  }
-  // True when there is a row.
-  bool Step() {
-    const int result = sqlite3_step(statement_.get());
-    if (result != SQLITE_ROW && result != SQLITE_DONE) {
-      Check(result);
-    }
-    return result == SQLITE_ROW;
-  }
-  std::string Text(int column) const {
-    const auto* const text =
-        reinterpret_cast<const char*>(sqlite3_column_text(statement_.get(), column));
-    return {text, static_cast<std::size_t>(sqlite3_column_bytes(statement_.get(), column))};
-  }
-  bool IsNull(int column) const {
-    return sqlite3_column_type(statement_.get(), column) == SQLITE_NULL;
-  }
-  std::int64_t Number(int column) const { return sqlite3_column_int64(statement_.get(), column); }
-
- private:
-  void Check(int result) const {
-    if (result != SQLITE_OK) {
-      throw std::runtime_error(std::string("task store: ") + sqlite3_errmsg(database_));
-    }
-  }
-
-  sqlite3* database_;
-  std::unique_ptr<sqlite3_stmt, int (*)(sqlite3_stmt*)> statement_;
-  int bound_ = 0;
-};
-
-TaskStore::TaskStore(const std::string& user) : database_(nullptr, sqlite3_close) {
-  const std::string path = TheDevice().StateFolder(user) + "/store.db";
-  sqlite3* database = nullptr;
-  const int result =
-      sqlite3_open_v2(path.c_str(), &database, SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr);
-  database_.reset(database);
-  if (result != SQLITE_OK) {
-    throw std::runtime_error("task store '" + path + "': " + sqlite3_errmsg(database));
-  }
-  sqlite3_busy_timeout(database, kBusyTimeoutMs);
-  if (sqlite3_exec(database, kSchema, nullptr, nullptr, nullptr) != SQLITE_OK) {
-    throw std::runtime_error("task store '" + path + "': " + sqlite3_errmsg(database));
-  }
-}
-
-void TaskStore::InTransaction(const char* begin, const std::function<void()>& body) {
-  Statement(database_.get(), begin).Step();
-  try {
-    body();
-    Statement(database_.get(), "COMMIT").Step();
-  } catch (...) {
-    sqlite3_exec(database_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
-    throw;
-  }
-}
+TaskStore::TaskStore(const std::string& user)
+    : database_(TheDevice().StateFolder(user) + "/store.db", kSchema, kSchemaVersion) {}
 
 void TaskStore::AddTask(TaskRow& row) {
   const std::map<std::string, Json::Value> properties = std::exchange(row.properties, {});
-  InTransaction(kForWriting, [&] {
+  database_.InTransaction(kForWriting, [&] {
     row.updated = std::time(nullptr);
     row.version = 1;
-    Statement(database_.get(), "INSERT INTO tasks VALUES (?, 0, ?, ?)")
+    Statement(database_, "INSERT INTO tasks VALUES (?, 0, ?, ?)")
         .Bind(row.id)
         .Bind(row.updated)
         .Bind(row.version)
@@ -137,7 +61,7 @@ void TaskStore::AddTask(TaskRow& row) {
 
 void TaskStore::WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
                             const Json::Value* value) {
-  Statement insert(database_.get(), "INSERT OR REPLACE INTO members VALUES (?, ?, ?, ?, ?)");
+  Statement insert(database_, "INSERT OR REPLACE INTO members VALUES (?, ?, ?, ?, ?)");
   insert.Bind(row.id).Bind(name).Bind(member);
   if (value == nullptr) {
     insert.BindNull();
@@ -178,11 +102,11 @@ void TaskStore::WriteProperty(TaskRow& row, const std::string& name, const Json:
 }
 
 bool TaskStore::ReadChanges(TaskRow& row) {
-  Statement task(database_.get(), "SELECT finished, updated, version FROM tasks WHERE id = ?");
+  Statement task(database_, "SELECT finished, updated, version FROM tasks WHERE id = ?");
   if (!task.Bind(row.id).Step()) {
     return false;
   }
-  Statement changes(database_.get(),
+  Statement changes(database_,
                     "SELECT name, member, value FROM members WHERE task = ? AND version > ? "
                     "ORDER BY name, member");
   changes.Bind(row.id).Bind(row.version);
@@ -191,11 +115,15 @@ bool TaskStore::ReadChanges(TaskRow& row) {
     const std::string member = changes.Text(1);
     if (member == kWhole) {
       const Json::Value value = ParseJson(changes.Text(2));
-      property = value.isObject() && property.isObject() ? property : value;
-    } else if (changes.IsNull(2)) {
-      property.removeMember(member.substr(sizeof kMemberMark));
+      if (!value.isObject() || !property.isObject()) {
+        property = value;
+      }
+    } else if (!property.isObject()) {
+      continue;  // members that went with the object
+    } else if (const std::string key = member.substr(sizeof kMemberMark); changes.IsNull(2)) {
+      property.removeMember(key);
     } else {
-      property[member.substr(sizeof kMemberMark)] = ParseJson(changes.Text(2));
+      property[key] = ParseJson(changes.Text(2));
     }
   }
   row.finished = task.Number(0) != 0;
@@ -206,7 +134,7 @@ bool TaskStore::ReadChanges(TaskRow& row) {
 
 bool TaskStore::RefreshTask(TaskRow& row) {
   bool is_found = false;
-  InTransaction(kForReading, [&] { is_found = ReadChanges(row); });
+  database_.InTransaction(kForReading, [&] { is_found = ReadChanges(row); });
   return is_found;
 }
 
@@ -217,9 +145,9 @@ std::optional<TaskRow> TaskStore::FindTask(const std::string& id) {
 }
 
 void TaskStore::RefreshTasks(std::map<std::string, TaskRow>& rows) {
-  InTransaction(kForReading, [&] {
+  database_.InTransaction(kForReading, [&] {
     std::map<std::string, TaskRow> known = std::exchange(rows, {});
-    Statement select(database_.get(), "SELECT id FROM tasks");
+    Statement select(database_, "SELECT id FROM tasks");
     while (select.Step()) {
       const std::string id = select.Text(0);
       TaskRow& row = rows[id];
@@ -247,7 +175,7 @@ bool TaskStore::UpdateTask(TaskRow& row,
                            const std::map<std::string, const Json::Value*>& properties,
                            bool finished) {
   bool is_found = false;
-  InTransaction(kForWriting, [&] {
+  database_.InTransaction(kForWriting, [&] {
     is_found = ReadChanges(row);
     if (!is_found) {
       return;
@@ -255,8 +183,7 @@ bool TaskStore::UpdateTask(TaskRow& row,
     ++row.version;
     row.finished = row.finished || finished;
     row.updated = std::time(nullptr);
-    Statement(database_.get(),
-              "UPDATE tasks SET finished = ?, updated = ?, version = ? WHERE id = ?")
+    Statement(database_, "UPDATE tasks SET finished = ?, updated = ?, version = ? WHERE id = ?")
         .Bind(row.finished ? 1 : 0)
         .Bind(row.updated)
         .Bind(row.version)
@@ -270,21 +197,21 @@ bool TaskStore::UpdateTask(TaskRow& row,
 }
 
 void TaskStore::RemoveTask(const std::string& id) {
-  InTransaction(kForWriting, [&] {
-    Statement(database_.get(), "DELETE FROM members WHERE task = ?").Bind(id).Step();
-    Statement(database_.get(), "DELETE FROM tasks WHERE id = ?").Bind(id).Step();
+  database_.InTransaction(kForWriting, [&] {
+    Statement(database_, "DELETE FROM members WHERE task = ?").Bind(id).Step();
+    Statement(database_, "DELETE FROM tasks WHERE id = ?").Bind(id).Step();
   });
 }
 
 void TaskStore::AddWorker(pid_t pid, std::uint64_t start_time) {
-  Statement(database_.get(), "INSERT OR REPLACE INTO workers VALUES (?, ?, 0)")
+  Statement(database_, "INSERT OR REPLACE INTO workers VALUES (?, ?, 0)")
       .Bind(std::int64_t{pid})
       .Bind(static_cast<std::int64_t>(start_time))
       .Step();
 }
 
 std::optional<WorkerRow> TaskStore::FindWorker(pid_t pid) {
-  Statement select(database_.get(), "SELECT start_time, stopped FROM workers WHERE pid = ?");
+  Statement select(database_, "SELECT start_time, stopped FROM workers WHERE pid = ?");
   if (!select.Bind(std::int64_t{pid}).Step()) {
     return std::nullopt;
   }
@@ -292,7 +219,7 @@ std::optional<WorkerRow> TaskStore::FindWorker(pid_t pid) {
 }
 
 void TaskStore::NoteStop(pid_t pid) {
-  Statement(database_.get(), "UPDATE workers SET stopped = ? WHERE pid = ?")
+  Statement(database_, "UPDATE workers SET stopped = ? WHERE pid = ?")
       .Bind(std::time(nullptr))
       .Bind(std::int64_t{pid})
       .Step();
@@ -300,7 +227,7 @@ void TaskStore::NoteStop(pid_t pid) {
 
 std::vector<pid_t> TaskStore::AllWorkers() {
   std::vector<pid_t> workers;
-  Statement select(database_.get(), "SELECT pid FROM workers");
+  Statement select(database_, "SELECT pid FROM workers");
   while (select.Step()) {
     workers.push_back(static_cast<pid_t>(select.Number(0)));
   }
@@ -308,7 +235,7 @@ std::vector<pid_t> TaskStore::AllWorkers() {
 }
 
 void TaskStore::RemoveWorker(pid_t pid) {
-  Statement(database_.get(), "DELETE FROM workers WHERE pid = ?").Bind(std::int64_t{pid}).Step();
+  Statement(database_, "DELETE FROM workers WHERE pid = ?").Bind(std::int64_t{pid}).Step();
 }
 
 void TaskStore::AddNotification(const NotificationRow& row) {
@@ -316,7 +243,7 @@ void TaskStore::AddNotification(const NotificationRow& row) {
   for (const std::string& argument : row.arguments) {
     arguments.append(argument);
   }
-  Statement(database_.get(), "INSERT INTO notifications VALUES (?, ?, ?, ?, ?, ?)")
+  Statement(database_, "INSERT INTO notifications VALUES (?, ?, ?, ?, ?, ?)")
       .Bind(row.time)
       .Bind(row.app)
       .Bind(row.task)
@@ -328,7 +255,7 @@ void TaskStore::AddNotification(const NotificationRow& row) {
 
 std::vector<NotificationRow> TaskStore::NotificationsAfter(std::int64_t number) {
   std::vector<NotificationRow> rows;
-  Statement select(database_.get(),
+  Statement select(database_,
                    "SELECT rowid, time, app, task, title, message, arguments FROM notifications "
                    "WHERE rowid > ? ORDER BY rowid");
   select.Bind(number);
@@ -349,17 +276,17 @@ std::vector<NotificationRow> TaskStore::NotificationsAfter(std::int64_t number) 
 }
 
 std::int64_t TaskStore::LastNotification() {
-  Statement select(database_.get(), "SELECT ifnull(max(rowid), 0) FROM notifications");
+  Statement select(database_, "SELECT ifnull(max(rowid), 0) FROM notifications");
   return select.Step() ? select.Number(0) : 0;
 }
 
 std::int64_t TaskStore::Version() {
-  Statement select(database_.get(), "PRAGMA data_version");
+  Statement select(database_, "PRAGMA data_version");
   return select.Step() ? select.Number(0) : 0;
 }
 
 void TaskStore::AddToIndex(const std::string& path) {
-  Statement(database_.get(), "INSERT OR REPLACE INTO file_index VALUES (?, ?)")
+  Statement(database_, "INSERT OR REPLACE INTO file_index VALUES (?, ?)")
       .Bind(path)
       .Bind(std::time(nullptr))
       .Step();

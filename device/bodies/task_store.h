@@ -4,16 +4,15 @@
 #define DEVICE_BODIES_TASK_STORE_H_
 
 #include <json/json.h>
-#include <sqlite3.h>
 #include <sys/types.h>
 
 #include <cstdint>
-#include <functional>
 #include <map>
-#include <memory>
 #include <optional>
 #include <string>
 #include <vector>
+
+#include "device/bodies/database.h"
 
 namespace Device {
 
@@ -82,16 +81,13 @@ class TaskStore {
   void AddToIndex(const std::string& path);
 
  private:
-  class Statement;
-
-  void InTransaction(const char* begin, const std::function<void()>& body);
   // Within a transaction.
   bool ReadChanges(TaskRow& row);
   void WriteProperty(TaskRow& row, const std::string& name, const Json::Value& value);
   void WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
                    const Json::Value* value);
 
-  std::unique_ptr<sqlite3, int (*)(sqlite3*)> database_;
+  Database database_;
 };
 
 // This process's connection to a user's store.

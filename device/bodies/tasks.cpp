@@ -50,6 +50,17 @@ void LogFailure(const char* operation, const std::exception& error) {
   syslog(LOG_ERR, "%s: %s", operation, error.what());
 }
 
+// Says why the store cannot serve; the module may keep the exception to itself.
+template <typename Body>
+auto LogAndThrow(const char* operation, Body body) {
+  try {
+    return body();
+  } catch (const std::exception& error) {
+    LogFailure(operation, error);
+    throw;
+  }
+}
+
 }  // namespace
 
 Json::Value Task::State::Get(const std::string& name) const {
@@ -127,7 +138,7 @@ Task::Task(const char* user, const char* task_id) : state(nullptr) {
     task_state->row.id = task_id;
     // When nobody watches the task, the desktop is to be told of its end.
     task_state->row.properties[kPropNotify] = !Device::TheDevice().is_followed;
-    Device::StoreOf(user).AddTask(task_state->row);
+    LogAndThrow("make task", [&] { Device::StoreOf(user).AddTask(task_state->row); });
     state = task_state.release();
   });
 }
@@ -216,17 +227,20 @@ TaskMgr::~TaskMgr() { delete state_; }
 
 std::string TaskMgr::getUniqueTaskId(const char* prefix) {
   return Operation("Vesk::TaskMgr::getUniqueTaskId", prefix).Run([&] {
-    std::string id;
-    do {
-      id = prefix + Device::RandomId(kTaskIdBytes);
-    } while (Device::StoreOf(state_->user).FindTask(id));
-    return id;
+    return LogAndThrow("make task id", [&] {
+      std::string id;
+      do {
+        id = prefix + Device::RandomId(kTaskIdBytes);
+      } while (Device::StoreOf(state_->user).FindTask(id));
+      return id;
+    });
   });
 }
 
 Task* TaskMgr::getTaskWithThrow(const char* task_id) {
   return Operation("Vesk::TaskMgr::getTaskWithThrow", task_id).Run([&] {
-    std::optional<Device::TaskRow> row = Device::StoreOf(state_->user).FindTask(task_id);
+    std::optional<Device::TaskRow> row =
+        LogAndThrow("find task", [&] { return Device::StoreOf(state_->user).FindTask(task_id); });
     if (!row) {
       throw std::runtime_error("no task '" + std::string(task_id) + "'");
     }

@@ -1,0 +1,90 @@
+// The store of tasks: read and written piece by piece, damaged, and without room.
+#include <sys/stat.h>
+
+#include <filesystem>
+#include <map>
+
+#include "device/bodies/json_text.h"
+#include "device/bodies/task_store.h"
+#include "tests/device_fixture.h"
+
+namespace {
+
+namespace fs = std::filesystem;
+
+class StoreTest : public DeviceTest {
+ protected:
+  StoreTest() { Add("vol1/photo/a.txt", "a"); }
+  // What "start" and the "status" that reports the end answer.
+  int RunJobs() {
+    const Device::Outcome started = Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip"));
+    EXPECT_TRUE(WaitUntil([&] {
+      const Device::Outcome status = Ask("status", started.data["taskid"].asString());
+      return status.code != 0 || status.data["finished"].asBool();
+    }));
+    return started.code;
+  }
+  const std::string file_ = At("users/alice/store.db");
+};
+
+TEST_F(StoreTest, ADamagedStoreIsSetAsideAndTheDeviceGoesOn) {
+  ASSERT_EQ(RunJobs(), 0);
+  const std::string whole = ReadFile(file_);
+  std::string torn = whole;
+  torn.replace(torn.size() / 4, torn.size() / 2, torn.size() / 2, '?');
+  for (const std::string& content : {std::string("garbage"), torn, whole.substr(0, 5000)}) {
+    for (const char* part : {"-wal", "-shm"}) {
+      fs::remove(file_ + part);
+    }
+    fs::resize_file(file_, 0);
+    WriteFile(file_, content);
+    Watch();
+    RunJobs();  // may meet the damage on its way
+    EXPECT_EQ(RunJobs(), 0);
+    Strings said;
+    for (const std::string& line : Log()) {
+      if (line.find(" is set aside as ") != std::string::npos) {
+        said.push_back(line);
+      }
+    }
+    EXPECT_EQ(said.size(), 1U) << content.size();
+  }
+}
+
+TEST_F(StoreTest, ARowSeesWhatAnotherHasChangedMemberByMember) {
+  Device::TaskStore store("alice");
+  Device::TaskRow mine;
+  mine.id = "Zantro_test";
+  mine.properties["data"] = Device::ParseJson(R"({"kept":[1,"x"],"gone":1,"text":"a"})");
+  store.AddTask(mine);
+  Device::TaskRow other = *store.FindTask(mine.id);
+  const char* const steps[] = {R"({"kept":[1,"x"],"text":"b","new":{"":null}})",
+                               "7",
+                               "{}",
+                               R"({"text":"\udcff"})",
+                               "null",
+                               R"({"kept":2.5})"};
+  for (const char* step : steps) {
+    const Json::Value value = Device::ParseJson(step);
+    ASSERT_TRUE(store.UpdateTask(mine, {{"data", &value}}, false));
+    EXPECT_EQ(mine.properties["data"], value);
+    ASSERT_TRUE(store.RefreshTask(other));
+    EXPECT_EQ(other.properties["data"], value) << step;
+    EXPECT_EQ(store.FindTask(mine.id)->properties["data"], value) << step;
+  }
+  // One that knows an old state only overwrites what it is told to, wholly.
+  Device::TaskRow late;
+  late.id = mine.id;
+  const Json::Value value = Device::ParseJson(R"({"late":true})");
+  ASSERT_TRUE(store.UpdateTask(late, {{"data", &value}}, true));
+  ASSERT_TRUE(store.RefreshTask(other));
+  EXPECT_EQ(other.properties["data"], value);
+  EXPECT_TRUE(other.finished);
+  store.RemoveTask(mine.id);
+  EXPECT_FALSE(store.RefreshTask(other));
+  std::map<std::string, Device::TaskRow> rows = {{mine.id, mine}};
+  store.RefreshTasks(rows);
+  EXPECT_TRUE(rows.empty());
+}
+
+}  // namespace
