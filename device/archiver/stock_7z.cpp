@@ -135,6 +135,7 @@ void PassOn(const std::vector<Event>& events, Report& report) {
         break;
     }
   }
+  report.Flush();
 }
 
 void Drain(Device::FileDescriptor& output, Device::FileDescriptor& errors, ErrorText* text,

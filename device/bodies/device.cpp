@@ -60,6 +60,7 @@ std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
     if (!fs::is_directory(device->VolumePath(volume))) {
       throw std::runtime_error("volume '" + volume + "': no such folder");
     }
+    device->real_volumes.push_back(fs::canonical(device->VolumePath(volume)).string());
   }
   device->archiver = OpenBesideExecutable(kArchiverName, O_PATH);
   device->module = OpenBesideExecutable(kModuleName, O_RDONLY);

@@ -9,6 +9,7 @@
 
 #include <map>
 #include <string>
+#include <vector>
 
 #include "device/bodies/config.h"
 #include "device/bodies/file_descriptor.h"
@@ -26,9 +27,10 @@ inline constexpr char kHomeShare[] = "home";
 struct OpenDevice {
   std::string root;  // absolute, links resolved
   Config config;
-  bool switches_identity = false;  // false: not root, all users are the caller
-  FileDescriptor archiver;         // the program that runs in place of /usr/bin/7z
-  FileDescriptor module;           // the shared library that serves the requests
+  std::vector<std::string> real_volumes;  // their folders, links resolved
+  bool switches_identity = false;         // false: not root, all users are the caller
+  FileDescriptor archiver;                // the program that runs in place of /usr/bin/7z
+  FileDescriptor module;                  // the shared library that serves the requests
 
   std::map<std::string, Session> sessions;  // by session id
   std::string current_user;  // whose identity this process has; empty: the device's own

@@ -1,5 +1,6 @@
 #include "device/bodies/paths.h"
 
+#include <algorithm>
 #include <climits>
 #include <cstdlib>
 #include <cstring>
@@ -72,14 +73,9 @@ std::string FollowLinks(std::string path) {
 }
 
 bool IsOnVolumes(const std::string& path) {
-  const OpenDevice& device = TheDevice();
-  for (const std::string& volume : device.config.volumes) {
-    const std::string real_volume = FollowLinks(device.VolumePath(volume));
-    if (!real_volume.empty() && IsWithin(path, real_volume)) {
-      return true;
-    }
-  }
-  return false;
+  const std::vector<std::string>& volumes = TheDevice().real_volumes;
+  return std::any_of(volumes.begin(), volumes.end(),
+                     [&](const std::string& volume) { return IsWithin(path, volume); });
 }
 
 int CheckPath(const char* path) {
