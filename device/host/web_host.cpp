@@ -167,28 +167,36 @@ bool WebHost::TakeMessage() {
   if (!message) {
     return false;
   }
-  switch (message->kind) {
+  try {
+    Serve(*message);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "message of the front end: %s", error.what());
+  }
+  return true;
+}
+
+void WebHost::Serve(ControlMessage& message) {
+  switch (message.kind) {
     case ControlKind::kListening:
       is_listening_ = true;
-      if (listen_ != message->text || !is_said_) {
-        listen_ = message->text;  // where any free port was asked for, this one from now on
+      if (listen_ != message.text || !is_said_) {
+        listen_ = message.text;  // where any free port was asked for, this one from now on
         std::cout << "serving '" << TheDevice().root << "' on http://" << listen_ << '/'
                   << std::endl;
         is_said_ = true;
       }
       break;
     case ControlKind::kRequest:
-      TakeRequest(std::move(message->exchange));
+      TakeRequest(std::move(message.exchange));
       break;
     case ControlKind::kSignIn:
-      TakeSignIn(message->text, std::move(message->exchange));
+      TakeSignIn(message.text, std::move(message.exchange));
       break;
     case ControlKind::kSignOut:
-      SignOut(message->text);
-      Answer(message->exchange.Get(), kHttpNoContent, Json::Value());
+      SignOut(message.text);
+      Answer(message.exchange.Get(), kHttpNoContent, Json::Value());
       break;
   }
-  return true;
 }
 
 void WebHost::TakeRequest(FileDescriptor exchange) {

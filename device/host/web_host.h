@@ -54,6 +54,7 @@ class WebHost {
 
   // False when the front end is gone.
   bool TakeMessage();
+  void Serve(ControlMessage& message);
   void TakeRequest(FileDescriptor exchange);
   void TakeSignIn(const std::string& text, FileDescriptor exchange);
   void FinishSignIn(const SignInCheck& check, bool is_password);

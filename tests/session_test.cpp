@@ -1,0 +1,72 @@
+// Sessions: their end, and how wrong passwords are slowed down.
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include "device/bodies/errors.h"
+#include "device/host/sessions.h"
+#include "platform/lumo/file_manager.h"
+#include "tests/device_fixture.h"
+
+namespace {
+
+using SessionTest = DeviceTest;
+
+TEST_F(SessionTest, ItsEndReachesProcessesThatAreOnTheirWay) {
+  for (const bool is_ended : {true, false}) {
+    const std::string id = Device::SignIn("alice");
+    int ends[2];
+    ASSERT_EQ(pipe(ends), 0);
+    const pid_t pid = fork();
+    if (pid == 0) {
+      char go = 0;
+      const bool may = read(ends[0], &go, 1) == 1 && LumoLibUGIDSet(id.c_str(), "alice") == 0;
+      _exit(may ? 0 : LumoLibGetErr() - Device::kErrSystem);
+    }
+    if (is_ended) {
+      Device::SignOut(id);
+    }
+    ASSERT_EQ(write(ends[1], "", 1), 1);
+    int status = 0;
+    ASSERT_EQ(waitpid(pid, &status, 0), pid);
+    EXPECT_EQ(WEXITSTATUS(status), is_ended ? Device::kErrSession - Device::kErrSystem : 0);
+    close(ends[0]);
+    close(ends[1]);
+  }
+}
+
+TEST_F(SessionTest, AUsersOldestEndsWhenThereAreTooMany) {
+  const std::string bobs = Device::SignIn("bob");
+  const std::string first = Device::SignIn("alice");
+  const std::string second = Device::SignIn("alice");
+  for (int more = 0; more < 63; ++more) {
+    Device::SignIn("alice");
+  }
+  EXPECT_EQ(Device::UserOfSession(first), "");
+  EXPECT_EQ(Device::UserOfSession(second), "alice");
+  EXPECT_EQ(Device::UserOfSession(bobs), "bob");
+}
+
+TEST_F(SessionTest, EachWrongPasswordAfterTheTenthDoublesTheWait) {
+  using std::chrono::seconds;
+  Device::SignInGate gate;
+  Device::SignInGate::Clock::time_point now;
+  for (int tries = 0; tries < 10; ++tries) {
+    EXPECT_EQ(gate.Try("alice", now), seconds(0)) << tries;
+  }
+  for (const int wait : {1, 2, 4, 8, 16, 32, 60, 60}) {
+    EXPECT_EQ(gate.Try("alice", now), seconds(wait));
+    EXPECT_EQ(gate.Try("bob", now), seconds(0));
+    gate.Succeeded("bob");
+    now += seconds(wait);
+    EXPECT_EQ(gate.Try("alice", now), seconds(0));
+  }
+  gate.Succeeded("alice");
+  EXPECT_EQ(gate.Try("alice", now), seconds(0));
+  EXPECT_EQ(gate.Try("alice", now), seconds(0));
+  for (int name = 0; name < 10; ++name) {
+    EXPECT_EQ(gate.Try("nobody" + std::to_string(name), now), seconds(0));
+  }
+  EXPECT_GT(gate.Try("yet another", now), seconds(0));
+}
+
+}  // namespace
