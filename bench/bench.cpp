@@ -1,0 +1,194 @@
+#include "bench/bench.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <cstdio>
+#include <fstream>
+#include <iostream>
+#include <stdexcept>
+
+#include "device/bodies/device.h"
+#include "device/bodies/json_text.h"
+#include "device/host/sessions.h"
+
+namespace Bench {
+
+namespace {
+
+constexpr char kConfig[] = R"({"volumes": ["vol1"],
+  "users": [{"name": "alice", "uid": 65001, "home": "vol1"}],
+  "shares": [{"name": "photo", "volume": "vol1", "access": {"alice": "rw"}},
+             {"name": "music", "volume": "vol1", "access": {"alice": "rw"}}]})";
+constexpr uid_t kUid = 65001;
+
+double Median(std::vector<double> values) {
+  std::sort(values.begin(), values.end());
+  return values[values.size() / 2];
+}
+
+void GiveToUser(const fs::path& path) {
+  Require(geteuid() != 0 || chown(path.c_str(), kUid, Device::kUsersGroup) == 0, "chown");
+}
+
+std::string Format(const char* format, double value) {
+  char text[32];
+  std::snprintf(text, sizeof text, format, value);
+  return text;
+}
+
+}  // namespace
+
+double Seconds(const std::function<void()>& body) {
+  const auto begin = std::chrono::steady_clock::now();
+  body();
+  return std::chrono::duration<double>(std::chrono::steady_clock::now() - begin).count();
+}
+
+Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
+                int pairs) {
+  ours();
+  theirs();
+  std::vector<double> all_ours;
+  std::vector<double> all_theirs;
+  for (int pair = 0; pair < pairs; ++pair) {
+    all_ours.push_back(ours());
+    all_theirs.push_back(theirs());
+  }
+  return {Median(all_ours), Median(all_theirs)};
+}
+
+void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
+              double ratio, const std::string& limit) {
+  std::cout << "| " << what << " | " << ours << " | " << theirs << " | " << Format("%.2f", ratio)
+            << " | " << limit << " |" << std::endl;
+}
+
+void PrintRow(const std::string& what, const Medians& medians, const std::string& limit) {
+  constexpr double kMilli = 1000;
+  PrintRow(what, Format("%.4g ms", kMilli * medians.ours),
+           Format("%.4g ms", kMilli * medians.theirs), medians.ours / medians.theirs, limit);
+}
+
+void Require(bool holds, const std::string& what) {
+  if (!holds) {
+    throw std::runtime_error(what);
+  }
+}
+
+Workbench::Workbench(const fs::path& folder) : folder_(fs::absolute(folder)) {
+  fs::remove_all(folder_);
+  Device::Make(folder_ / "device", kConfig);
+  Device::Open(folder_ / "device");
+  launcher_.emplace();
+  session_ = Device::SignIn("alice");
+}
+
+Strings Workbench::AddFiles(const fs::path& folder, std::size_t count, std::size_t size,
+                            bool is_sparse) {
+  const bool is_new = fs::create_directories(folder);
+  Strings names;
+  std::vector<std::uint64_t> noise(is_sparse ? 0 : size / sizeof(std::uint64_t) + 1);
+  for (std::size_t index = 0; index < count; ++index) {
+    names.push_back("file-number-" + std::to_string(index) + ".dat");
+    const fs::path file = folder / names.back();
+    if (!is_new && fs::exists(file)) {
+      continue;
+    }
+    std::generate(noise.begin(), noise.end(), std::ref(random_));
+    std::ofstream(file, std::ios::binary)
+        .write(reinterpret_cast<const char*>(noise.data()),
+               static_cast<std::streamsize>(is_sparse ? 0 : size));
+    fs::resize_file(file, size);
+    GiveToUser(file);
+  }
+  GiveToUser(folder);
+  return names;
+}
+
+std::string Workbench::Start(const Strings& sources, const std::string& format,
+                             const std::string& level) {
+  fs::remove(Share("photo") / "out");
+  Json::Value list(Json::arrayValue);
+  for (const std::string& source : sources) {
+    list.append(source);
+  }
+  Device::Request request;
+  request.params["path"] = Device::ToText(list);
+  request.params["dest_file_path"] = R"(["/photo/out"])";
+  request.params["format"] = format;
+  request.params["level"] = level;
+  request.api = "KAVO.Zantro.Compress";
+  request.method = "start";
+  request.version = 3;
+  request.user = "alice";
+  request.session_id = session_;
+  request.is_followed = true;
+  const Device::Outcome outcome = launcher_->Call(request);
+  Require(outcome.code == 0, "start: " + std::to_string(outcome.code));
+  return outcome.data["taskid"].asString();
+}
+
+Device::Outcome Workbench::Ask(const std::string& method, const std::string& task_id) {
+  Device::Request request;
+  request.params["taskid"] = task_id;
+  request.api = "KAVO.Zantro.Compress";
+  request.method = method;
+  request.version = 3;
+  request.user = "alice";
+  request.session_id = session_;
+  return launcher_->Call(request);
+}
+
+void Workbench::Finish(const std::string& task_id) {
+  constexpr int kLongestPauseMs = 20;
+  constexpr int kLookEach = 20;  // of the time that has gone
+  const auto begin = std::chrono::steady_clock::now();
+  Device::Outcome outcome;
+  while (!outcome.data["finished"].asBool()) {
+    const auto gone = std::chrono::steady_clock::now() - begin;
+    const auto pause = std::chrono::duration_cast<std::chrono::milliseconds>(gone) / kLookEach;
+    poll(nullptr, 0, std::clamp(static_cast<int>(pause.count()), 1, kLongestPauseMs));
+    outcome = Ask("status", task_id);
+    Require(outcome.code == 0 && !outcome.data.isMember("errors"), Device::ToText(outcome.data));
+  }
+  Device::Launcher::Reap();
+}
+
+double Workbench::Job(const Strings& sources, const std::string& format, const std::string& level) {
+  return Seconds([&] { Finish(Start(sources, format, level)); });
+}
+
+double Workbench::Bare(const fs::path& folder, const Strings& names, Strings switches) {
+  const fs::path list = folder_ / "list";
+  const fs::path archive = folder_ / "bare";
+  std::ofstream text(list);
+  for (const std::string& name : names) {
+    text << name << '\n';
+  }
+  text.close();
+  fs::remove(archive);
+  switches.insert(switches.begin(), {"/usr/bin/7z", "a", "-spd", "-bso0", "-bsp0"});
+  switches.insert(switches.end(), {archive.string(), "@" + list.string()});
+  std::vector<char*> arguments;
+  for (std::string& each : switches) {
+    arguments.push_back(each.data());
+  }
+  arguments.push_back(nullptr);
+  return Seconds([&] {
+    const pid_t pid = fork();
+    if (pid == 0) {
+      Require(chdir(folder.c_str()) == 0, "chdir");
+      execv(arguments[0], arguments.data());
+      _exit(1);
+    }
+    int status = 0;
+    Require(waitpid(pid, &status, 0) == pid && status == 0, "7z failed");
+  });
+}
+
+}  // namespace Bench

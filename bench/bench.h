@@ -1,0 +1,66 @@
+// What the rows of the benchmark share: two sides run by turns, and a device with files to pack.
+#ifndef BENCH_BENCH_H_
+#define BENCH_BENCH_H_
+
+#include <filesystem>
+#include <functional>
+#include <optional>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "device/host/launcher.h"
+
+namespace Bench {
+
+namespace fs = std::filesystem;
+using Strings = std::vector<std::string>;
+
+struct Medians {
+  double ours = 0;  // seconds
+  double theirs = 0;
+};
+
+// Runs both sides by turns, A B A B, after a first run of each that does not count. Each side
+// returns the seconds it took.
+Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
+                int pairs);
+double Seconds(const std::function<void()>& body);
+
+// Prints a row of the table.
+void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
+              double ratio, const std::string& limit);
+void PrintRow(const std::string& what, const Medians& medians, const std::string& limit);
+
+// Throws std::runtime_error that says what does not hold.
+void Require(bool holds, const std::string& what);
+
+// A device with the shared folders photo and music, and a user, alice. One in a process.
+class Workbench {
+ public:
+  explicit Workbench(const fs::path& folder);
+
+  fs::path Share(const std::string& name) const { return folder_ / "device/vol1" / name; }
+  // Names of files that are made in the folder, unless they are there: of random bytes, or sparse.
+  Strings AddFiles(const fs::path& folder, std::size_t count, std::size_t size,
+                   bool is_sparse = false);
+
+  // Makes /photo/out of the sources; the task's id.
+  std::string Start(const Strings& sources, const std::string& format, const std::string& level);
+  Device::Outcome Ask(const std::string& method, const std::string& task_id);
+  // Until "status" says finished. Throws when the job failed.
+  void Finish(const std::string& task_id);
+  double Job(const Strings& sources, const std::string& format, const std::string& level);
+  // The stock 7z with a list of names, in that folder.
+  double Bare(const fs::path& folder, const Strings& names, Strings switches);
+
+ private:
+  const fs::path folder_;
+  std::mt19937_64 random_;
+  std::optional<Device::Launcher> launcher_;
+  std::string session_;
+};
+
+}  // namespace Bench
+
+#endif  // BENCH_BENCH_H_

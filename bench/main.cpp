@@ -1,0 +1,247 @@
+// kavo-bench FOLDER [ROW]...: what the module costs beside the least that does the same. Prints the
+// table's rows, all or those named, and leaves in FOLDER/growth the cost against the number of
+// sources, for the plot.
+#include <sqlite3.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cmath>
+#include <cstring>
+#include <fstream>
+#include <iostream>
+#include <map>
+#include <set>
+#include <sstream>
+
+#include "bench/bench.h"
+#include "device/bodies/device.h"
+#include "platform/klib/system.h"
+
+namespace Bench {
+namespace {
+
+constexpr int kPairs = 7;
+constexpr std::size_t kMiB = std::size_t{1} << 20U;
+const Strings kZip = {"-tzip", "-mx6"};
+const Strings kStore = {"-tzip", "-mx0"};
+const Strings kSevenZip = {"-t7z", "-mx6"};
+
+void TinyFile(Workbench& bench) {
+  bench.AddFiles(bench.Share("photo/tiny"), 1, 1024);
+  PrintRow("one file of 1 KiB, until \"status\" says finished",
+           Compare([&] { return bench.Job({"/photo/tiny"}, "zip", "normal"); },
+                   [&] { return bench.Bare(bench.Share("photo"), {"tiny"}, kZip); }, 3 * kPairs),
+           "2.5");
+}
+
+void Album(Workbench& bench) {
+  bench.AddFiles(bench.Share("photo/album"), 200, 3 * kMiB);
+  PrintRow("200 incompressible files of 3 MiB, zip",
+           Compare([&] { return bench.Job({"/photo/album"}, "zip", "normal"); },
+                   [&] { return bench.Bare(bench.Share("photo"), {"album"}, kZip); }, kPairs),
+           "1.02");
+}
+
+void Tree(Workbench& bench) {
+  bench.AddFiles(bench.Share("photo/tree"), 20000, 200);
+  for (const auto& [format, switches] : {std::pair("zip", kZip), std::pair("7z", kSevenZip)}) {
+    PrintRow(
+        std::string("20,000 small files, ") + format,
+        Compare([&, name = format] { return bench.Job({"/photo/tree"}, name, "normal"); },
+                [&, with = switches] { return bench.Bare(bench.Share("photo"), {"tree"}, with); },
+                kPairs),
+        "1.03");
+  }
+}
+
+void LargeFile(Workbench& bench) {
+  bench.AddFiles(bench.Share("photo/large"), 1, 2048 * kMiB, true);
+  PrintRow("one file of 2 GiB, \"store\"",
+           Compare([&] { return bench.Job({"/photo/large"}, "zip", "store"); },
+                   [&] { return bench.Bare(bench.Share("photo"), {"large"}, kStore); }, kPairs),
+           "1.02");
+}
+
+void TwoShares(Workbench& bench) {
+  const fs::path stage = bench.Share("stage");
+  fs::create_directories(stage);
+  for (const char* share : {"photo", "music"}) {
+    bench.AddFiles(bench.Share(share) / "half", 10000, 200);
+    fs::create_directory_symlink(bench.Share(share), stage / share);
+  }
+  Strings with = kZip;
+  with.push_back("-l");
+  PrintRow("two shared folders, 10,000 small files each",
+           Compare(
+               [&] {
+                 return bench.Job({"/photo/half", "/music/half"}, "zip", "normal");
+               },
+               [&] {
+                 return bench.Bare(stage, {"photo/half", "music/half"}, with);
+               },
+               kPairs),
+           "1.05");
+}
+
+// With the exponent of the cost's growth between the first and the last size.
+void ManySources(Workbench& bench, const fs::path& folder) {
+  std::ofstream growth(folder / "growth");
+  std::map<std::size_t, Medians> all;
+  for (const std::size_t count : {1000U, 10000U, 100000U}) {
+    const fs::path place = bench.Share("photo/many");
+    const Strings names = bench.AddFiles(place, count, 100);
+    Strings sources;
+    for (const std::string& name : names) {
+      sources.push_back("/photo/many/" + name);
+    }
+    all[count] = Compare([&] { return bench.Job(sources, "zip", "store"); },
+                         [&] { return bench.Bare(place, names, kStore); }, kPairs);
+    growth << count << ' ' << all[count].ours << ' ' << all[count].theirs << std::endl;
+    PrintRow(std::to_string(count) + " sources named one by one", all[count],
+             count == 100000U ? "1.10" : "");
+  }
+  const auto exponent = [&](double Medians::*side) {
+    return std::log(all[100000].*side / all[1000].*side) / std::log(100.0);
+  };
+  std::ostringstream ours;
+  std::ostringstream theirs;
+  ours << "n^" << exponent(&Medians::ours);
+  theirs << "n^" << exponent(&Medians::theirs);
+  PrintRow("growth from 1,000 to 100,000 sources", ours.str(), theirs.str(),
+           exponent(&Medians::ours), "1.1");
+}
+
+// A process that does one thing with a database, and its end awaited.
+double ForkAndRun(const fs::path& database, const char* sql) {
+  return Seconds([&] {
+    const pid_t pid = fork();
+    if (pid == 0) {
+      sqlite3* connection = nullptr;
+      const bool is_done = sqlite3_open(database.c_str(), &connection) == SQLITE_OK &&
+                           sqlite3_exec(connection, sql, nullptr, nullptr, nullptr) == SQLITE_OK;
+      sqlite3_close(connection);
+      _exit(is_done ? 0 : 1);
+    }
+    int status = 0;
+    Require(waitpid(pid, &status, 0) == pid && status == 0, "database");
+  });
+}
+
+void Answers(Workbench& bench, const fs::path& folder) {
+  constexpr int kTries = 101;
+  const fs::path database = folder / "least.db";
+  ForkAndRun(database,
+             "PRAGMA journal_mode = WAL; CREATE TABLE rows (id INTEGER PRIMARY KEY, "
+             "value TEXT); INSERT INTO rows VALUES (1, 'value');");
+  bench.AddFiles(bench.Share("photo/endless"), 1, std::size_t{1} << 40U, true);
+  PrintRow("the answer of \"start\"",
+           Compare(
+               [&] {
+                 std::string id;
+                 const double seconds =
+                     Seconds([&] { id = bench.Start({"/photo/endless"}, "7z", "best"); });
+                 bench.Ask("stop", id);
+                 return seconds;
+               },
+               [&] {
+                 return ForkAndRun(database,
+                                   "PRAGMA synchronous = NORMAL; "
+                                   "INSERT INTO rows (value) VALUES ('value');");
+               },
+               kTries),
+           "3");
+  const std::string id = bench.Start({"/photo/endless"}, "7z", "best");
+  PrintRow(
+      "\"status\"",
+      Compare([&] { return Seconds([&] { bench.Ask("status", id); }); },
+              [&] { return ForkAndRun(database, "SELECT value FROM rows WHERE id = 1;"); }, kTries),
+      "2");
+  bench.Ask("stop", id);
+}
+
+// Memory of the process that no other shares, in bytes.
+double PrivateBytes(pid_t pid) {
+  std::ifstream file("/proc/" + std::to_string(pid) + "/smaps_rollup");
+  double kilobytes = 0;
+  for (std::string line; std::getline(file, line);) {
+    if (line.rfind("Private_", 0) == 0) {
+      kilobytes += std::stod(line.substr(line.find(':') + 1));
+    }
+  }
+  return 1024 * kilobytes;
+}
+
+void WorkerMemory(Workbench& bench) {
+  bench.AddFiles(bench.Share("photo/endless"), 1, std::size_t{1} << 40U, true);
+  const std::size_t count = 100000;
+  Strings many = {"/photo/endless"};
+  double bytes_of_paths = 0;
+  for (const std::string& name : bench.AddFiles(bench.Share("photo/many"), count, 100)) {
+    many.push_back("/photo/many/" + name);
+    bytes_of_paths += static_cast<double>(many.back().size());
+  }
+  for (const Strings& sources : {Strings{"/photo/endless"}, many}) {
+    const std::string id = bench.Start(sources, "zip", "best");
+    pid_t worker = -1;
+    for (const auto& entry : fs::directory_iterator("/proc")) {
+      std::ifstream stat(entry.path() / "stat");
+      std::string pid;
+      std::string name;
+      std::string state;
+      pid_t parent = 0;
+      pid_t group = 0;
+      if (stat >> pid >> name >> state >> parent >> group && std::to_string(group) == pid &&
+          parent == getpid()) {
+        worker = group;
+      }
+    }
+    Require(worker > 0, "no worker");
+    while (bench.Ask("status", id).data["progress"].asDouble() == 0 &&
+           bench.Ask("status", id).code == 0 && PrivateBytes(worker) == 0) {
+    }
+    usleep(sources.size() == 1 ? 300000 : 6000000);
+    const bool is_many = sources.size() > 1;
+    const double limit = is_many ? 8 * bytes_of_paths : 3.0 * kMiB;
+    std::ostringstream ours;
+    std::ostringstream theirs;
+    ours << std::lround(PrivateBytes(worker) / 1024) << " KiB";
+    theirs << std::lround(limit / 1024) << " KiB allowed";
+    PrintRow(is_many ? "memory of a worker with 100,000 sources" : "memory of a worker", ours.str(),
+             theirs.str(), PrivateBytes(worker) / limit, "1");
+    bench.Ask("stop", id);
+  }
+}
+
+int Run(const fs::path& folder, const std::set<std::string>& wanted) {
+  Workbench bench(folder);
+  const std::map<std::string, std::function<void()>> rows = {
+      {"1-tiny", [&] { TinyFile(bench); }},
+      {"2-album", [&] { Album(bench); }},
+      {"3-tree", [&] { Tree(bench); }},
+      {"4-large", [&] { LargeFile(bench); }},
+      {"5-shares", [&] { TwoShares(bench); }},
+      {"6-many", [&] { ManySources(bench, folder); }},
+      {"7-answers", [&] { Answers(bench, folder); }},
+      {"9-memory", [&] { WorkerMemory(bench); }}};
+  for (const auto& [name, run] : rows) {
+    if (wanted.empty() || wanted.count(name) != 0) {
+      run();
+    }
+  }
+  return 0;
+}
+
+}  // namespace
+}  // namespace Bench
+
+int main(int argc, char** argv) {
+  openlog("kavo-bench", LOG_PERROR, LOG_USER);
+  try {
+    Bench::Require(argc > 1, "usage: kavo-bench FOLDER [ROW]...");
+    return Bench::Run(argv[1], {argv + 2, argv + argc});
+  } catch (const std::exception& error) {
+    std::cerr << "kavo-bench: " << error.what() << '\n';
+    return 1;
+  }
+}
