@@ -35,10 +35,7 @@ TEST_F(RunTest, ModeLevelFormatAndPasswordBecomeArguments) {
   };
   ScriptArchiver("");
   for (const auto& row : rows) {
-    Json::Value params = Device::ParseJson(row.params);
-    params["path"] = "/photo/a.txt";
-    params["dest_file_path"] = "/photo/z.zip";
-    RunJob(params);
+    RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip", row.params));
     std::string text;
     const Json::Value arguments = Calls("KLIBCPopenv").back().args[2];
     for (const Json::Value& argument : arguments) {
