@@ -15,8 +15,8 @@ void WatchModule(void* module);
 void SetLibcFiles(const std::string& folder);
 
 // One of mkstemp, mkdtemp, chdir, stat, symlink or write (short by one byte) fails when its first
-// argument, or the file's path, holds `part`. With a signal the process gets that, and the call
-// goes on. An empty name: none.
+// argument, or the file's path, holds `part`. With a signal the process gets that, also
+// at an _exit, and the call goes on. An empty name: none.
 struct LibcFault {
   std::string call;
   std::string part;

@@ -78,6 +78,14 @@ TEST_F(TaskTest, AStopWhileTheListIsStagedLeavesNoList) {
   }
 }
 
+TEST_F(TaskTest, AStopAtTheVeryEndRemovesNoFile) {
+  ScriptArchiver("");
+  Add("vol1/photo/a.txt", "a");
+  SetLibcFault({"_exit", "", 0, SIGTERM});
+  RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"));
+  EXPECT_EQ(Behind(Sequence(Worker()), "_exit"), Words("kill exit"));
+}
+
 TEST_F(TaskTest, AFinishedTaskIsReportedOnce) {
   Add("vol1/photo/a.txt", "a");
   EXPECT_EQ(RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"))["progress"], 1.0);

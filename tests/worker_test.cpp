@@ -50,6 +50,9 @@ TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
       NamesOf(ExpectedSequence(is_staged ? "job_of_two_shares" : "job_of_one_share"));
   const Strings end = Behind(NamesOf(ExpectedSequence("failed_job")), "syslog");
   EXPECT_EQ(Sequence(Worker()), UpTo(job, row.Get("last")) + Words(row.Get("after")) + end);
+  for (const TracedCall& removal : Calls("KLIBCExecl")) {
+    EXPECT_EQ(Plain(Device::ToText(removal.args)), R"(["/bin/rm",187,["-rf","/tmp/lumozip*"]])");
+  }
   for (const std::string& path : StagedPaths()) {
     EXPECT_EQ(row.name, "ParentLongerThanSource") << path;
   }
