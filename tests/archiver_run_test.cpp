@@ -116,10 +116,8 @@ TEST_F(ArchiverTest, KeepsEveryNameWhateverItHolds) {
   Strings sources = names;
   sources.insert(sources.end(), {"d/sub", "d", "*", "pipe"});
   for (const char* page : {static_cast<const char*>(nullptr), ""}) {
-    Options options;
-    options.code_page = page;
     const std::string archive = page == nullptr ? "a*b" : "zip!";
-    const Strings lines = Good(archive, sources, options);
+    const Strings lines = Good(archive, sources, {"a", "", "", page});
     EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
                             [](const auto& line) { return line.rfind("Compressing ", 0) == 0; }),
               static_cast<long>(2 * names.size() + (page == nullptr ? 1 : 3)));  // with the pipes
@@ -146,15 +144,11 @@ TEST_F(ArchiverTest, UpdatesAsTheActionsSay) {
       WriteFile(share / "d/same", "1");
       fs::last_write_time(share / "d/same",
                           fs::file_time_type::clock::now() - std::chrono::hours(1));
-      Options options;
-      options.code_page = page;
-      Good(name, {"d"}, options);
+      Good(name, {"d"}, {"a", "", "", page});
       fs::remove(share / "d/gone");
       WriteFile(share / "d/same", "2");
       WriteFile(share / "d/new", "2");
-      options.command = row.command;
-      options.actions = row.actions;
-      Good(name, {"d"}, options);
+      Good(name, {"d"}, {row.command, row.actions, "", page});
       EXPECT_EQ(Unpacked(out / name), row.expected) << row.command << row.actions;
       EXPECT_EQ(InOut(), Strings{name});
     }
@@ -164,12 +158,9 @@ TEST_F(ArchiverTest, UpdatesAsTheActionsSay) {
 TEST_F(ArchiverTest, StoresZipNamesInTheCodePageAndFindsThemAgain) {
   WriteFile(share / "d/가", "cannot go to the code page");
   WriteFile(share / "d/plain", "1");
-  Options options;
-  options.code_page = "CP932";
-  options.password = "pass word";
   for (const char* content : {"first", "second"}) {
     WriteFile(share / "d/日本ソ", content);
-    Good("a.zip", {"d"}, options);
+    Good("a.zip", {"d"}, {"a", "", "pass word", "CP932"});
     zip_t* const zip = zip_open((out / "a.zip").c_str(), ZIP_RDONLY, nullptr);
     ASSERT_NE(zip, nullptr);
     std::set<std::string> names;  // as bytes, and whether they are marked as UTF-8
@@ -195,9 +186,7 @@ TEST_F(ArchiverTest, EncryptsWithThePasswordWhateverItHolds) {
         const Strings old = {"/usr/bin/7z", "a", "-mhe", "-sae", "-p" + password, out / "z", "a"};
         ASSERT_EQ(RunProgram(old, share).status, 0);
       }
-      Options options;
-      options.password = password;
-      Good("z", {"a"}, options);
+      Good("z", {"a"}, {"a", "", password, nullptr});
       EXPECT_EQ(RunProgram({"/usr/bin/7z", "t", "-p" + password, out / "z"}).status, 0) << password;
       EXPECT_NE(RunProgram({"/usr/bin/7z", "t", "-pother", out / "z"}).status, 0) << password;
     }
@@ -230,11 +219,9 @@ TEST_F(ArchiverTest, RefusesTargetsThatAreNoArchiveOfTheType) {
   const std::string seven = ReadFile(out / "seven");
   fs::create_symlink("seven", out / "link");
   fs::create_directory(out / "folder");
-  Options zip;
-  zip.code_page = "CP932";
   const Strings before = InOut();
   for (const std::string& name : before) {
-    Bad(name, {"a"}, "", zip);
+    Bad(name, {"a"}, "", {"a", "", "", "CP932"});
   }
   Bad("link", {"a"}, "link");
   Bad(std::string(256, 'n'), {"a"}, "File name too long");

@@ -1,17 +1,13 @@
 // The commands of kavo-device, as programs.
-#include <fcntl.h>
 #include <gmock/gmock.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
 #include <filesystem>
-#include <fstream>
 
 #include "device/bodies/config.h"
 #include "device/bodies/json_text.h"
 #include "tests/device_fixture.h"
-#include "tests/table.h"
 
 namespace {
 

@@ -8,16 +8,13 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <iterator>
 #include <memory>
 #include <regex>
-#include <sstream>
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
@@ -93,13 +90,13 @@ DeviceTest::DeviceTest() {
   umask(022);
   Device::Make(device_, kConfig);
   Device::Open(device_);
-  SetLogFile(temp_.Path() + "/log");
+  SetLibcFiles(temp_.Path());
   chmod(temp_.Path().c_str(), 01777);  // the users' processes add files of their own
   Watch();
   launcher_.emplace();
   const std::unique_ptr<void, int (*)(void*)> module(dlopen(ModulePath().c_str(), RTLD_NOW),
                                                      dlclose);
-  WatchModule(dlsym(module.get(), "gTable"));
+  WatchModule(module.get());
 }
 
 DeviceTest::~DeviceTest() {
@@ -129,8 +126,9 @@ void DeviceTest::AddFaults(const Strings& rules) {
   std::for_each(rules.begin(), rules.end(), Device::AddFault);
 }
 
-Json::Value DeviceTest::JobParams(const Strings& sources, const std::string& dest) {
-  Json::Value params;
+Json::Value DeviceTest::JobParams(const Strings& sources, const std::string& dest,
+                                  const std::string& options) {
+  Json::Value params = Device::ParseJson(options);
   params["path"] = Device::ToText(Device::ToJson(sources));
   params["dest_file_path"] = Device::ToText(Device::ToJson(Strings{dest}));
   return params;
@@ -284,7 +282,6 @@ void DeviceTest::Watch() {
     std::ofstream(temp_.Path() + name, std::ios::trunc).flush();
   }
   Device::OpenTrace(temp_.Path() + "/trace");
-  SetLibcTrace(temp_.Path() + "/trace");
 }
 
 void DeviceTest::ScriptArchiver(const std::string& text) {

@@ -47,7 +47,9 @@ class DeviceTest : public testing::Test {
   std::string At(const std::string& path) const { return device_ + "/" + path; }
 
   static void AddFaults(const Strings& rules);
-  static Json::Value JobParams(const Strings& sources, const std::string& dest);
+  // Of "start", with options as JSON.
+  static Json::Value JobParams(const Strings& sources, const std::string& dest,
+                               const std::string& options = "{}");
   static Device::Request MakeRequest(const std::string& method, const Json::Value& params,
                                      const std::string& user = "alice");
   Device::Outcome Call(const std::string& method, const Json::Value& params,

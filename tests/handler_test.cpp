@@ -14,6 +14,7 @@
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
 #include "device/host/request_state.h"
+#include "tests/programs.h"
 
 namespace {
 
@@ -78,8 +79,11 @@ TEST(CompressHandler, ComparesMethodNamesExactly) {
 }
 
 TEST(BaseHandler, LeavesErrorNumbersToThePlatform) {
-  EXPECT_EQ(Handler::ParseErrnoToError(ENOSPC, nullptr, nullptr), 416);
-  EXPECT_EQ(Handler::ParseErrnoToError(0, "from", "to"), 0);
+  const TempFolder temp;
+  Device::OpenTrace(temp.Path() + "/trace");
+  EXPECT_EQ(Handler::ParseErrnoToError(ENOSPC, "from", "to"), 416);
+  EXPECT_NE(ReadFile(temp.Path() + "/trace").find(R"([28,"from","to"])"), std::string::npos);
+  Device::StopWatching();
 }
 
 TEST(Escape, QuotesForAShellOrAnswersNothing) {

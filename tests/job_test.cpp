@@ -20,11 +20,6 @@ class JobTest : public DeviceTest {
     EXPECT_FALSE(answer.isMember("errors")) << answer;
     EXPECT_TRUE(Log().empty()) << Log().front();
   }
-
-  static Json::Value With(Json::Value params, const std::string& name, const std::string& value) {
-    params[name] = value;
-    return params;
-  }
 };
 
 TEST_F(JobTest, SourcesOfOneShareAreNamedFromTheirCommonParent) {
@@ -43,8 +38,8 @@ TEST_F(JobTest, SourcesOfOneShareAreNamedFromTheirCommonParent) {
                          "trip/day1/a.jpg=" + std::string(100000, 'a'),
                          "trip/link -> b.jpg"};
   for (const std::string format : {"zip", "7z"}) {
-    Succeed(
-        With(JobParams({"/photo/trip", "/photo/home"}, "/photo/z." + format), "format", format));
+    Succeed(JobParams({"/photo/trip", "/photo/home"}, "/photo/z." + format,
+                      R"({"format":")" + format + "\"}"));
     EXPECT_EQ(Unpacked(At("vol1/photo/z." + format)), expected);
   }
   EXPECT_TRUE(StagedPaths().empty());
@@ -75,7 +70,7 @@ TEST_F(JobTest, SourcesOfSeveralSharesAreNamedFromTheirShareWithLinksKept) {
                    "photo/trip/out\xFF -> ../../../outside"};
   for (const std::string format : {"7z", "zip"}) {
     Watch();
-    Succeed(With(JobParams(sources, "/photo/z." + format), "format", format));
+    Succeed(JobParams(sources, "/photo/z." + format, R"({"format":")" + format + "\"}"));
     EXPECT_EQ(Unpacked(At("vol1/photo/z." + format)), expected);
     // The list file is gone; the folder of links is left behind, as every caller knows.
     ASSERT_EQ(StagedPaths().size(), ++jobs);
@@ -89,7 +84,7 @@ TEST_F(JobTest, LevelsReachTheArchive) {
   const std::string text(300000, 'x');
   Add("vol1/photo/a.txt", text);
   for (const std::string level : {"store", "best"}) {
-    Succeed(With(JobParams({"/photo/a.txt"}, "/photo/" + level), "level", level));
+    Succeed(JobParams({"/photo/a.txt"}, "/photo/" + level, R"({"level":")" + level + "\"}"));
     EXPECT_EQ(Unpacked(At("vol1/photo/" + level)), Tree{"a.txt=" + text});
   }
   EXPECT_GT(fs::file_size(At("vol1/photo/store")), text.size());
@@ -146,8 +141,7 @@ TEST_F(JobTest, TenThousandSources) {
     sources.push_back("/photo/" + name);
   }
   Device::StopWatching();
-  EXPECT_FALSE(
-      RunJob(With(JobParams(sources, "/photo/z.zip"), "level", "store")).isMember("errors"));
+  RunJob(JobParams(sources, "/photo/z.zip", R"({"level":"store"})"));
   const Tree tree = Unpacked(At("vol1/photo/z.zip"));
   EXPECT_EQ(tree.size(), 10000U);
   EXPECT_EQ(tree.count("f9999=f9999"), 1U);

@@ -112,23 +112,18 @@ void Reopen(int& file, const std::string& path) {
 
 }  // namespace
 
-void WatchModule(const void* address) {
-  module_base = BaseOf(address);
-  Dl_info info{};
-  dladdr(address, &info);
-  void* const module = dlopen(info.dli_fname, RTLD_NOW | RTLD_NOLOAD);
+void WatchModule(void* module) {
+  module_base = BaseOf(dlsym(module, "gTable"));
   dump_coverage = reinterpret_cast<void (*)()>(dlsym(module, "KavoDumpCoverage"));
-  dlclose(module);
 }
 
-void SetLibcTrace(const std::string& path) { Reopen(trace_file, path); }
+void SetLibcFiles(const std::string& folder) {
+  Reopen(trace_file, folder + "/trace");
+  Reopen(log_file, folder + "/log");
+  made_path = folder + "/made";
+}
 
 void SetLibcFault(const LibcFault& fault) { armed = fault; }
-
-void SetLogFile(const std::string& path) {
-  made_path = path + ".made";
-  Reopen(log_file, path);
-}
 
 Strings StagedPaths() {
   Strings paths = Lines(ReadFile(made_path));
@@ -231,7 +226,7 @@ void exit(int status) noexcept {
 }
 
 void _exit(int status) {  // NOLINT: the system's name
-  IS_MODULES("_exit", status);
+  IS_MODULES("_exit", status) && Fails("_exit", "");
   dump_coverage != nullptr ? dump_coverage() : void();
   Real<void(int)>("_exit")(status);
   abort();

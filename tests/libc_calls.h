@@ -7,15 +7,16 @@
 
 #include "tests/programs.h"
 
-// From now on the calls of the library that holds this address count as the module's.
-void WatchModule(const void* address);
+// From now on the calls of the library with this handle count as the module's.
+void WatchModule(void* module);
 
-// The module's calls go to this file, one line of JSON for each, like the device's own.
-void SetLibcTrace(const std::string& path);
+// In this folder, "trace" gets a line of JSON for each of the module's calls, like the device's
+// own; "log" the lines for the system's log, those below LOG_ERR with their level.
+void SetLibcFiles(const std::string& folder);
 
 // One of mkstemp, mkdtemp, chdir, stat, symlink or write (short by one byte) fails when its first
-// argument, or the file's path, holds `part`. With a signal the process gets that, and the call
-// goes on. An empty name: none.
+// argument, or the file's path, holds `part`. With a signal the process gets that, also
+// at an _exit, and the call goes on. An empty name: none.
 struct LibcFault {
   std::string call;
   std::string part;
@@ -24,10 +25,7 @@ struct LibcFault {
 };
 void SetLibcFault(const LibcFault& fault);
 
-// Log lines go to this file instead of the system's log, those below LOG_ERR with their level.
-void SetLogFile(const std::string& path);
-
-// The list files and staging folders made since the log file was set that are still there.
+// The list files and staging folders made since the folder was set that are still there.
 Strings StagedPaths();
 
 #endif  // TESTS_LIBC_CALLS_H_

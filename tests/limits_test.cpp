@@ -1,16 +1,13 @@
 // Limits that the kernel sets: full, quota-bound and read-only file systems, mounted for the test
 // alone.
-#include <fcntl.h>
 #include <sched.h>
 #include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <filesystem>
-#include <fstream>
 
 #include "tests/device_fixture.h"
-#include "tests/libc_calls.h"
 
 namespace {
 
@@ -37,10 +34,8 @@ class LimitTest : public DeviceTest {
   }
 
   Strings Fail(const std::string& name) {
-    Json::Value params = JobParams({"/photo/" + name}, "/photo/limited/z.zip");
-    params["level"] = "store";
-    params["codepage"] = "CP932";
-    return FailJob(params);
+    return FailJob(JobParams({"/photo/" + name}, "/photo/limited/z.zip",
+                             R"({"level":"store","codepage":"CP932"})"));
   }
 
   const std::string folder_ = At("vol1/photo/limited");

@@ -58,9 +58,8 @@ INSTANTIATE_TABLE(RequestTest, requests);
 class StartTest : public DeviceTest {};
 
 TEST_F(StartTest, StoresParametersAsTheyWereGiven) {
-  Json::Value params = JobParams({"/photo/a,b", "/photo/c"}, "/photo/z.zip/");
-  params["level"] = 5;
-  params["codepage"] = Json::Value();
+  const Json::Value params =
+      JobParams({"/photo/a,b", "/photo/c"}, "/photo/z.zip/", R"({"level":5,"codepage":null})");
   const Device::Outcome outcome = Call("start", params, "bob", 2);
   const Json::Value data = Calls("LumoLibBkgTaskInfoCreate").front().args[0];
   EXPECT_EQ(data["pid"], Worker());

@@ -35,10 +35,7 @@ TEST_F(RunTest, ModeLevelFormatAndPasswordBecomeArguments) {
   };
   ScriptArchiver("");
   for (const auto& row : rows) {
-    Json::Value params = Device::ParseJson(row.params);
-    params["path"] = "/photo/a.txt";
-    params["dest_file_path"] = "/photo/z.zip";
-    RunJob(params);
+    RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip", row.params));
     std::string text;
     const Json::Value arguments = Calls("KLIBCPopenv").back().args[2];
     for (const Json::Value& argument : arguments) {
@@ -53,15 +50,15 @@ TEST_F(RunTest, ModeLevelFormatAndPasswordBecomeArguments) {
 
 TEST_F(RunTest, ProgressLinesReachTheTask) {
   const Json::Value answer =
-      Run("Progress: 7\nTotal: 5000000000\nCompressing Error: No space left on device\n"
-          "Progress: 42 Error:\nnoise\n Progress: 8\nCompressing b\nProgress: 43\nProgress: 99");
+      Run("Progress: 08\nTotal: 05000000000\nCompressing Error: No space left on device\n"
+          "Progress: 42 Error:\nnoise\n Progress: 8\nCompressing \nProgress: 43\nProgress: 99");
   Strings saved;
   for (const TracedCall& call : Calls("SaveTaskData")) {
     saved.push_back(Device::ToText(call.args[1]["file"]) + call.args[1]["total_size"].asString() +
                     " " + std::to_string(call.args[2].asFloat()));
   }
   EXPECT_EQ(saved,
-            (Strings{"\"\"0 0.070000", "\"\"5000000000 0.000000", "\"\\n\"5000000000 0.420000",
+            (Strings{"\"\"0 0.080000", "\"\"5000000000 0.000000", "\"\\n\"5000000000 0.420000",
                      "\"\\n\"5000000000 0.430000", "\"\\n\"5000000000 0.990000"}));
   // The last fraction stands, also when it is not 1.
   EXPECT_FLOAT_EQ(answer["progress"].asFloat(), 0.99F);
@@ -77,11 +74,12 @@ TEST_F(RunTest, WhatFailsBesideTheArchiverIsLoggedAndNoMore) {
       {"KAVOFSAclChmod=-1", "failed to ACL chmod 'DEV/vol1/photo/z.zip' to 777, errno: *", 1},
       {"LumoLibChown2Admin=-1", "LumoLibChown2Admin fail", 1},
       {"LumoLibChown2Admin=1", "LumoLibChown2Admin fail", 1},
-      {"KLIBGroupIsAdminGroupMem=-1", "KLIBGroupIsAdminGroupMem(alice) failed. [0x0000 :0]", 0},
+      {"KLIBGroupIsAdminGroupMem=-1", "KLIBGroupIsAdminGroupMem(alice) failed. [0xBEEF lib.c:7]",
+       0},
   };
   for (const auto& row : rows) {
     Watch();
-    Device::AddFault(row.fault);
+    AddFaults({row.fault, "KLIBCErrGet=48879", "KLIBCErrorGetFile=lib.c", "KLIBCErrorGetLine=7"});
     EXPECT_FALSE(Run("Total: Error: 3\n").isMember("errors"));
     EXPECT_EQ(Log(), Strings{row.line});
     EXPECT_EQ(Calls("LumoLibChown2Admin").size(), row.owner_calls);

@@ -1,20 +1,15 @@
 // Following a job and ending it, from requests of their own.
-#include <dirent.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <csignal>
 #include <filesystem>
-#include <fstream>
 
-#include "device/bodies/json_text.h"
-#include "device/bodies/operations.h"
 #include "device/bodies/task_store.h"
 #include "tests/device_fixture.h"
 #include "tests/emulation.h"
 #include "tests/libc_calls.h"
-#include "tests/table.h"
 
 namespace {
 
@@ -27,10 +22,8 @@ class TaskTest : public DeviceTest {
   // A job that goes on until it is stopped: hours of zeros that take no room.
   std::string StartEndlessJob() {
     fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
-    Json::Value params = JobParams({"/photo/zeros"}, "/photo/z.7z");
-    params["format"] = "7z";
-    params["level"] = "best";
-    const Outcome started = Call("start", params);
+    const Outcome started = Call(
+        "start", JobParams({"/photo/zeros"}, "/photo/z.7z", R"({"format":"7z","level":"best"})"));
     EXPECT_EQ(started.code, 0);
     return started.data["taskid"].asString();
   }
@@ -83,6 +76,14 @@ TEST_F(TaskTest, AStopWhileTheListIsStagedLeavesNoList) {
     EXPECT_TRUE(StagedPaths().empty()) << row.call;
     EXPECT_TRUE(Calls("KLIBCPopenv").empty());
   }
+}
+
+TEST_F(TaskTest, AStopAtTheVeryEndRemovesNoFile) {
+  ScriptArchiver("");
+  Add("vol1/photo/a.txt", "a");
+  SetLibcFault({"_exit", "", 0, SIGTERM});
+  RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"));
+  EXPECT_EQ(Behind(Sequence(Worker()), "_exit"), Words("kill exit"));
 }
 
 TEST_F(TaskTest, AFinishedTaskIsReportedOnce) {

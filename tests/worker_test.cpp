@@ -10,7 +10,6 @@
 #include "device/bodies/operations.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
-#include "tests/table.h"
 
 namespace {
 
@@ -32,13 +31,10 @@ TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
   LibcFault fault;
   libc >> fault.call >> fault.part >> fault.error_number;
   SetLibcFault(fault);
-  Json::Value params = JobParams(row.All("source", {"/photo/trip/a.txt", "/photo/trip/day"}),
-                                 row.Get("dest", "/photo/out.zip"));
-  const Json::Value options =
-      Device::ParseJson(row.Get("params", R"({"mode":"x","level":"x","password":"x"})"));
-  for (const std::string& name : options.getMemberNames()) {
-    params[name] = options[name];
-  }
+  const Json::Value params =
+      JobParams(row.All("source", {"/photo/trip/a.txt", "/photo/trip/day"}),
+                row.Get("dest", "/photo/out.zip"),
+                row.Get("params", R"({"mode":"x","level":"x","password":"x"})"));
   Strings items = FailJob(params, row.Get("user", "alice"));
   std::transform(items.begin(), items.end(), items.begin(),
                  [&](const std::string& item) { return Plain(item); });
@@ -54,6 +50,9 @@ TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
       NamesOf(ExpectedSequence(is_staged ? "job_of_two_shares" : "job_of_one_share"));
   const Strings end = Behind(NamesOf(ExpectedSequence("failed_job")), "syslog");
   EXPECT_EQ(Sequence(Worker()), UpTo(job, row.Get("last")) + Words(row.Get("after")) + end);
+  for (const TracedCall& removal : Calls("KLIBCExecl")) {
+    EXPECT_EQ(Plain(Device::ToText(removal.args)), R"(["/bin/rm",187,["-rf","/tmp/lumozip*"]])");
+  }
   for (const std::string& path : StagedPaths()) {
     EXPECT_EQ(row.name, "ParentLongerThanSource") << path;
   }
