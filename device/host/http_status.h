@@ -12,6 +12,7 @@ enum HttpStatus : int {
   kHttpForbidden = 403,
   kHttpNotFound = 404,
   kHttpTooLarge = 413,
+  kHttpNotDecoded = 415,
   kHttpTooMany = 429,
   kHttpInternal = 500,
   kHttpUnavailable = 503

@@ -20,12 +20,12 @@ using httplib::Response;
 
 constexpr std::size_t kMostBodyBytes = std::size_t{8} << 20U;
 constexpr int kBacklog = 1024;
-constexpr int kReadTimeout = 10;      // seconds without a byte from a client
-constexpr int kKeepAlive = 30;        // seconds between requests
-constexpr int kKeepAliveMost = 1000;  // requests on one connection
+constexpr int kReadTimeout = 10;  // seconds without a byte from a client
 constexpr int kHeartbeatMs = 5000;
 constexpr std::chrono::seconds kEndGrace(5);
 constexpr char kJson[] = "application/json";
+constexpr char kSession[] = "/session";
+constexpr char kWebApi[] = "/webapi";
 constexpr char kCookie[] = "session";
 constexpr char kCookieAttributes[] = "; Path=/; HttpOnly; SameSite=Strict";
 constexpr char kPolicy[] =
@@ -92,9 +92,23 @@ const char* ReasonFor(int status) {
   }
 }
 
+// False where the library would read a body, of any length, to find no route for it.
+bool HasBodyRoute(const Request& request) {
+  const std::string& path = request.path;
+  return request.method == "POST"     ? path == kSession || path == kWebApi
+         : request.method == "DELETE" ? path == kSession
+                                      : request.method == "GET" || request.method == "HEAD";
+}
+
 // The body as it came: the library would cut a long form. False, with the response's status, when
-// it is too long or breaks off.
-bool ReadBody(const httplib::ContentReader& reader, std::string& body, Response& response) {
+// it is none, too long or breaks off.
+bool ReadBody(const Request& request, const httplib::ContentReader& reader, std::string& body,
+              Response& response) {
+  if (request.is_multipart_form_data() ||
+      !(request.has_header("Content-Length") || request.has_header("Transfer-Encoding"))) {
+    response.status = Device::kHttpBadRequest;
+    return false;
+  }
   bool is_too_long = false;
   const bool is_read = reader([&](const char* data, std::size_t size) {
     is_too_long = is_too_long || body.size() + size > kMostBodyBytes;
@@ -119,8 +133,10 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
   server_.new_task_queue = [] { return new ConnectionThreads; };
   server_.set_payload_max_length(kMostBodyBytes);
   server_.set_read_timeout(kReadTimeout);
-  server_.set_keep_alive_timeout(kKeepAlive);
-  server_.set_keep_alive_max_count(kKeepAliveMost);
+  server_.set_keep_alive_timeout(kReadTimeout);
+  // What a refused request leaves unread, or its length read in another way by a proxy, would be
+  // taken for the next one of the connection, which the refusal was to prevent.
+  server_.set_keep_alive_max_count(1);
   server_.set_tcp_nodelay(true);
   server_.set_socket_options([this](int socket) {
     const int yes = 1;
@@ -133,14 +149,24 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
                                {"Cross-Origin-Resource-Policy", "same-origin"},
                                {"Cache-Control", "no-store"}});
   server_.set_pre_routing_handler([this](const Request& request, Response& response) {
+    // Whole answers only: the library would cut errors too, and send a file once for each range.
+    const_cast<Request&>(request).ranges.clear();
     if (is_ending_) {
       Refuse(response, Device::kHttpUnavailable, "the device is ending");
     } else if (IsForeign(request)) {
       Refuse(response, Device::kHttpForbidden, "the request comes from another site's page");
+    } else if (request.has_header("Content-Encoding")) {
+      Refuse(response, Device::kHttpNotDecoded, "the body is in an encoding");
+    } else if (!HasBodyRoute(request)) {
+      Refuse(response, Device::kHttpNotFound, ReasonFor(Device::kHttpNotFound));
     } else {
       return httplib::Server::HandlerResponse::Unhandled;
     }
     return httplib::Server::HandlerResponse::Handled;
+  });
+  server_.set_exception_handler([](const Request& /*request*/, Response& response,
+                                   const std::exception_ptr& /*error*/) {
+    Refuse(response, Device::kHttpInternal, ReasonFor(Device::kHttpInternal));
   });
   server_.set_error_handler([](const Request& /*request*/, Response& response) {
     if (response.body.empty()) {
@@ -164,9 +190,10 @@ void FrontEnd::AddPage(const std::map<std::string, PageFile>& files) {
 }
 
 void FrontEnd::AddRoutes() {
-  Post("/session", &FrontEnd::SignIn);
-  Post("/webapi", &FrontEnd::CallApi);
-  server_.Delete("/session", [this](const Request& request, Response& response) {
+  Post(kSession, &FrontEnd::SignIn);
+  Post(kWebApi, &FrontEnd::CallApi);
+  server_.Delete(kSession, [this](const Request& request, Response& response,
+                                  const httplib::ContentReader& /*body*/) {
     SignOut(request, response);
   });
   for (const char* kind : {"session", "tasks", "codes"}) {
@@ -193,16 +220,16 @@ void FrontEnd::Post(const char* route,
   server_.Post(route, [this, handler](const Request& request, Response& response,
                                       const httplib::ContentReader& reader) {
     ++serving_;
+    const std::shared_ptr<void> counted(&serving_, [this](void*) { --serving_; });
     std::string body;
     try {
-      if (ReadBody(reader, body, response)) {
+      if (ReadBody(request, reader, body, response)) {
         (this->*handler)(request, ParseBody(request.get_header_value("Content-Type"), body),
                          response);
       }
     } catch (const std::runtime_error& error) {
       Refuse(response, Device::kHttpBadRequest, error.what());
     }
-    --serving_;
   });
 }
 

@@ -48,7 +48,11 @@ export class Device {
   async remove() {
     await this.stop();
     for (const { pid } of this.processes()) {
-      process.kill(pid, 'SIGKILL');
+      try {
+        process.kill(pid, 'SIGKILL');
+      } catch {
+        // It has ended meanwhile.
+      }
     }
     rmSync(this.base, { recursive: true, force: true, maxRetries: 50 });
   }

@@ -5,6 +5,7 @@ import { truncateSync, writeFileSync, chownSync, existsSync } from 'node:fs';
 import net from 'node:net';
 import { after, before, test } from 'node:test';
 import { promisify } from 'node:util';
+import { gzipSync } from 'node:zlib';
 
 import { Client, Device, build, isRoot, listing, text, until } from './device.mjs';
 
@@ -73,6 +74,9 @@ test('what is wrong is refused with its status and reason', async () => {
     [400, "'path' is missing", '/files', {}],
     [413, '8 MiB', ...post(long, json)],
     [413, '8 MiB', ...post(new Blob([long]).stream(), json)],
+    [415, 'an encoding', ...post(gzipSync('{}'), { ...json, 'Content-Encoding': 'gzip' })],
+    [404, 'no such route', '/none', { method: 'PUT', body: 'x' }],
+    [400, 'not a request', ...post(new FormData())],
   ];
   for (const [status, words, route, options] of rows) {
     const answer = await alice.ask(route, { duplex: 'half', ...options })
@@ -80,8 +84,26 @@ test('what is wrong is refused with its status and reason', async () => {
     assert.equal(answer.status, status, `${route}: ${answer.text}`);
     assert.ok(answer.body.error.includes(words), `${answer.text} has no "${words}"`);
   }
+  const part = await alice.ask('/none', { headers: { Range: 'bytes=0-1' } });
+  assert.match(part.text, /no such route/);
   const sameSite = await alice.ask('/tasks', { headers: { Origin: device.url } });
   assert.equal(sameSite.status, 200);
+});
+
+test('what a refused request leaves unread is no request', async () => {
+  const { host, port } = new URL(device.url);
+  const body = `DELETE /session HTTP/1.1\r\nHost: ${host}\r\nCookie: ${alice.cookie}\r\n\r\n`;
+  const socket = net.connect(Number(port), '127.0.0.1');
+  socket.on('error', () => {}).write('POST /webapi HTTP/1.1\r\nOrigin: http://evil.example\r\n' +
+    `Host: ${host}\r\nContent-Length: ${body.length}\r\n\r\n`);
+  let answer = '';
+  socket.on('data', (data) => {
+    answer += data;
+    socket.write(body);
+  });
+  await new Promise((resolve) => { socket.on('close', resolve); });
+  assert.match(answer, /^HTTP\/1.1 403 /);
+  assert.equal((await alice.ask('/session')).status, 200);
 });
 
 test('a name goes out and comes back byte by byte', async () => {
