@@ -64,7 +64,8 @@ bool IsPassword(const std::string& user, const std::string& password) {
   const std::string hash = has_password ? known->password : kNobodysHash;
   const auto data = std::make_unique<crypt_data>();
   const char* const result = crypt_r(password.c_str(), hash.c_str(), data.get());
-  return has_password && result != nullptr && hash == result;
+  const bool is_whole = password.find('\0') == std::string::npos;  // crypt_r reads no further
+  return has_password && is_whole && result != nullptr && hash == result;
 }
 
 std::chrono::seconds SignInGate::Try(const std::string& user, Clock::time_point now) {

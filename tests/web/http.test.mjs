@@ -72,6 +72,8 @@ test('what is wrong is refused with its status and reason', async () => {
     [400, 'not an object', ...post('[]', json)],
     [400, 'nested too deep', ...post('['.repeat(100000), json)],
     [400, "'path' is missing", '/files', {}],
+    [401, 'wrong user name', '/session', {
+      method: 'POST', body: new URLSearchParams({ user: 'bob', password: 'bob\0x' }) }],
     [413, '8 MiB', ...post(long, json)],
     [413, '8 MiB', ...post(new Blob([long]).stream(), json)],
     [415, 'an encoding', ...post(gzipSync('{}'), { ...json, 'Content-Encoding': 'gzip' })],
