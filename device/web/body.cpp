@@ -41,9 +41,10 @@ Json::Value ParseForm(const std::string& body) {
   Json::Value form(Json::objectValue);
   for (std::size_t begin = 0; begin < body.size();) {
     const std::size_t end = std::min(body.find('&', begin), body.size());
-    const std::size_t equals = std::min(body.find('=', begin), end);
-    const std::string name = UnquoteField(body.substr(begin, equals - begin), begin);
-    const std::size_t value = std::min(equals + 1, end);
+    const std::string field = body.substr(begin, end - begin);
+    const std::size_t equals = std::min(field.find('='), field.size());
+    const std::string name = UnquoteField(field.substr(0, equals), begin);
+    const std::size_t value = std::min(begin + equals + 1, end);
     if (form.isMember(name)) {
       throw std::runtime_error("body: field '" + name + "' stands there twice");
     }
