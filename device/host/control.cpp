@@ -48,7 +48,7 @@ std::optional<ControlMessage> ReceiveControl(int socket) {
   message.msg_iov = &part;
   message.msg_iovlen = 1;
   message.msg_control = &ancillary;
-  message.msg_controllen = sizeof ancillary;
+  message.msg_controllen = CMSG_LEN(sizeof(int));  // rounded up there would be room for two
   ssize_t got = 0;
   do {
     got = recvmsg(socket, &message, MSG_CMSG_CLOEXEC);

@@ -102,7 +102,7 @@ bool WebHost::Run() {
     }
     if (sources[1].revents != 0 && !TakeMessage()) {
       EndFrontEnd();
-      if (!is_listening_) {
+      if (!has_listened_) {
         return false;
       }
       syslog(LOG_ERR, "the front end has ended; starting it again");
@@ -119,7 +119,6 @@ void WebHost::StartFrontEnd() {
   }
   control_ = FileDescriptor(ends[0]);
   const FileDescriptor front_end_side(ends[1]);
-  is_listening_ = false;
   front_end_ = Fork([&]() -> int { BecomeFrontEnd(files_, front_end_side.Get(), listen_); });
 }
 
@@ -176,14 +175,16 @@ bool WebHost::TakeMessage() {
 }
 
 void WebHost::Serve(ControlMessage& message) {
+  if (message.kind != ControlKind::kRequest) {
+    fcntl(message.exchange.Get(), F_SETFL, O_NONBLOCK);  // the launcher waits for no reader
+  }
   switch (message.kind) {
     case ControlKind::kListening:
-      is_listening_ = true;
-      if (listen_ != message.text || !is_said_) {
+      if (listen_ != message.text || !has_listened_) {
         listen_ = message.text;  // where any free port was asked for, this one from now on
         std::cout << "serving '" << TheDevice().root << "' on http://" << listen_ << '/'
                   << std::endl;
-        is_said_ = true;
+        has_listened_ = true;
       }
       break;
     case ControlKind::kRequest:

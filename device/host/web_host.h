@@ -72,8 +72,7 @@ class WebHost {
   sigset_t saved_mask_{};
   FileDescriptor control_;
   pid_t front_end_ = -1;
-  bool is_listening_ = false;
-  bool is_said_ = false;
+  bool has_listened_ = false;
   Launcher launcher_;
   SignInGate gate_;
   std::map<pid_t, SignInCheck> checks_;

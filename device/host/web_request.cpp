@@ -94,8 +94,11 @@ void Serve(Launcher& launcher, const Json::Value& asked) {
       AnswerFiles(exchange, user, asked["path"].asString());
     } else if (kind == kKindTasks) {
       AnswerTasks(exchange, user);
-    } else if (Answer(exchange, kHttpOk, Json::Value())) {
-      SendTaskEvents(exchange, user, session_id);
+    } else {
+      StoreOf(user);  // throws when it cannot be opened, before a stream is promised
+      if (Answer(exchange, kHttpOk, Json::Value())) {
+        SendTaskEvents(exchange, user, session_id);
+      }
     }
   }
 }

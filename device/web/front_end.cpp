@@ -164,10 +164,10 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
     }
     return httplib::Server::HandlerResponse::Handled;
   });
-  server_.set_exception_handler([](const Request& /*request*/, Response& response,
-                                   const std::exception_ptr& /*error*/) {
-    Refuse(response, Device::kHttpInternal, ReasonFor(Device::kHttpInternal));
-  });
+  server_.set_exception_handler(
+      [](const Request& /*request*/, Response& response, const std::exception_ptr& /*error*/) {
+        Refuse(response, Device::kHttpInternal, ReasonFor(Device::kHttpInternal));
+      });
   server_.set_error_handler([](const Request& /*request*/, Response& response) {
     if (response.body.empty()) {
       Refuse(response, response.status, ReasonFor(response.status));
@@ -192,10 +192,9 @@ void FrontEnd::AddPage(const std::map<std::string, PageFile>& files) {
 void FrontEnd::AddRoutes() {
   Post(kSession, &FrontEnd::SignIn);
   Post(kWebApi, &FrontEnd::CallApi);
-  server_.Delete(kSession, [this](const Request& request, Response& response,
-                                  const httplib::ContentReader& /*body*/) {
-    SignOut(request, response);
-  });
+  server_.Delete(kSession,
+                 [this](const Request& request, Response& response,
+                        const httplib::ContentReader& /*body*/) { SignOut(request, response); });
   for (const char* kind : {"session", "tasks", "codes"}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
       Pass(Asked(request, kind), response);
@@ -289,7 +288,7 @@ void FrontEnd::StreamEvents(const Request& request, Response& response) {
         std::string text = ":\n\n";
         if (exchange->Wait(kHeartbeatMs)) {
           const std::optional<Json::Value> frame = exchange->Next();
-          if (!frame) {
+          if (!frame || !frame->isMember("event")) {  // a refusal says that the store has failed
             sink.done();
             return true;
           }

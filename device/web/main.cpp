@@ -83,6 +83,9 @@ void Serve(const std::string& listen, int page) {
   AllowManyDescriptors();
   Web::FrontEnd front_end(files);
   const int port = front_end.Bind(address.host, address.port);
+  if (port < 0 && errno == 0) {
+    throw std::runtime_error("cannot listen on " + listen + ": no such address");
+  }
   if (port < 0) {
     FailFor("cannot listen on " + listen);
   }
