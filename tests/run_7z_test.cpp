@@ -51,7 +51,7 @@ TEST_F(RunTest, ModeLevelFormatAndPasswordBecomeArguments) {
 TEST_F(RunTest, ProgressLinesReachTheTask) {
   const Json::Value answer =
       Run("Progress: 08\nTotal: 05000000000\nCompressing Error: No space left on device\n"
-          "Progress: 42 Error:\nnoise\n Progress: 8\nCompressing \nProgress: 43\nProgress: 99");
+          "Progress: 42 Error:\nTotal:7\n Progress: 8\nCompressing \nProgress: 43\nProgress: 99");
   Strings saved;
   for (const TracedCall& call : Calls("SaveTaskData")) {
     saved.push_back(Device::ToText(call.args[1]["file"]) + call.args[1]["total_size"].asString() +

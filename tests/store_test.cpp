@@ -1,5 +1,5 @@
 // The store of tasks: read and written piece by piece, damaged, and without room.
-#include <sys/stat.h>
+#include <sqlite3.h>
 
 #include <filesystem>
 #include <map>
@@ -29,6 +29,10 @@ class StoreTest : public DeviceTest {
 
 TEST_F(StoreTest, ADamagedStoreIsSetAsideAndTheDeviceGoesOn) {
   ASSERT_EQ(RunJobs(), 0);
+  sqlite3* database = nullptr;
+  ASSERT_EQ(sqlite3_open(file_.c_str(), &database), SQLITE_OK);
+  sqlite3_exec(database, "PRAGMA wal_checkpoint(TRUNCATE)", nullptr, nullptr, nullptr);
+  ASSERT_EQ(sqlite3_close(database), SQLITE_OK);
   const std::string whole = ReadFile(file_);
   std::string torn = whole;
   torn.replace(torn.size() / 4, torn.size() / 2, torn.size() / 2, '?');
