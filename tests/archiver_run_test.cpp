@@ -334,20 +334,19 @@ TEST(Run7z, TellsCauseAndObjectInOneLine) {
       {"kill -9 $$", "7z was killed by signal 9"},
       {"exit 2", "7z failed with status 2"},
       {"echo 'ERROR: oops' >&2", "7z failed with status 0: oops"},
-      {"printf '\\n\\nSystem ERROR:\\nerrno=28 : No space left\\n' >&2; exit 2",
+      {R"(printf '\n\nSystem ERROR:\nerrno=28 : No space left\n' >&2; exit 2)",
        "7z failed with status 2: No space left"},
-      {"printf '\\nWARNING: errno=13 : Permission den' >&2; exit 1",
+      {R"(printf '\nWARNING: errno=13 : Permission den' >&2; exit 1)",
        "7z failed with status 1: Permission den"},
-      {"printf 'Error:\\ncannot open file\\n/v/x\\nerrno=36 : Too long\\n\\n\\nSystem ERROR:\\n"
-       "errno=36 : Too long\\n' >&2; exit 2",
-       "7z failed with status 2: cannot open file; /v/x; Too long"},
-      {"printf 'WARNING: errno=2 : Gone\\nleft out\\n' >&2; exit 2", "7z failed with status 2"},
-      {"printf 'WARNING: errno=2 : Gone\\nleft out\\nWARNING: errno=2 : Lost\\na\\n' >&2; exit 1",
+      {R"(printf 'Error:\ncannot open file\n/v/x\nerrno=36 : Long\n\n\nSystem ERROR:\n' >&2
+          printf 'errno=36 : Long\n' >&2; exit 2)",
+       "7z failed with status 2: cannot open file; /v/x; Long"},
+      {R"(printf 'WARNING: errno=2 : Gone\nleft out\n' >&2; exit 2)", "7z failed with status 2"},
+      {R"(printf 'WARNING: errno=2 : Gone\nleft out\nWARNING: errno=2 : Lost\na\n' >&2; exit 1)",
        "not everything can be packed: Lost; a"},
       // At a warning 7z is not waited for.
-      {"printf 'WARNING: errno=2 : Gone\\nError: No space left on device\\033[m\\n' >&2; exec "
-       "sleep 60",
-       "not everything can be packed: Gone; No_space_left_on_device?[m"}};
+      {R"(printf 'WARNING: errno=2 : No\nError: File name too long\033[m\n' >&2; exec sleep 60)",
+       "not everything can be packed: No; File_name_too_long?[m"}};
   for (const auto& row : rows) {
     const Archiver::Cancel cancel(STDOUT_FILENO);
     Archiver::Report report(cancel);

@@ -53,7 +53,7 @@ std::string Built(const std::string& name) {
 std::string ModulePath() { return Built("KAVO.Zantro.Compress.so"); }
 
 Strings ExpectedSequence(const std::string& name) {
-  const Strings lines = Lines(ReadFile(std::string(KAVO_TESTS_DIR) + "/sequences/" + name));
+  Strings lines = Lines(ReadFile(std::string(KAVO_TESTS_DIR) + "/sequences/" + name));
   EXPECT_FALSE(lines.empty()) << name;
   return lines;
 }
@@ -185,7 +185,7 @@ Json::Value DeviceTest::Follow(const std::string& task_id, const std::string& us
 Json::Value DeviceTest::RunJob(const Json::Value& params, const std::string& user) {
   const Device::Outcome started = Call("start", params, user);
   EXPECT_EQ(started.code, 0);
-  const Json::Value answer = Follow(started.data["taskid"].asString(), user);
+  Json::Value answer = Follow(started.data["taskid"].asString(), user);
   // The worker has said its last word in the log when it is gone.
   const int worker = Worker();
   EXPECT_TRUE(WaitUntil([&] {
