@@ -7,6 +7,7 @@
 #include <cstdio>
 #include <ctime>
 #include <stdexcept>
+#include <utility>
 
 namespace Device {
 
@@ -21,8 +22,8 @@ ino_t FileOf(const std::string& path) {
 
 }  // namespace
 
-Database::Database(const std::string& path, const char* schema, int version)
-    : path_(path), database_(nullptr, sqlite3_close) {
+Database::Database(std::string path, const char* schema, int version)
+    : path_(std::move(path)), database_(nullptr, sqlite3_close) {
   Open();
   try {
     MakeSchema(schema, version);

@@ -19,7 +19,7 @@ namespace Device {
 class Database {
  public:
   // `version` is the schema's, above 0.
-  Database(const std::string& path, const char* schema, int version);
+  Database(std::string path, const char* schema, int version);
 
   // One prepared statement, run to its end or reset when it goes out of scope.
   class Statement;

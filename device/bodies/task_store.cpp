@@ -162,6 +162,7 @@ std::vector<TaskRow> TaskStore::AllTasks() {
   std::map<std::string, TaskRow> rows;
   RefreshTasks(rows);
   std::vector<TaskRow> all;
+  all.reserve(rows.size());
   for (auto& [id, row] : rows) {
     all.push_back(std::move(row));
   }

@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
 #include <map>
 #include <memory>
 
@@ -17,6 +18,8 @@
 namespace Device {
 
 namespace {
+
+namespace fs = std::filesystem;
 
 const char* KindOf(mode_t mode) {
   return S_ISDIR(mode) ? "folder" : S_ISREG(mode) ? "file" : S_ISLNK(mode) ? "link" : "other";
@@ -84,8 +87,13 @@ Listing ListFolder(const std::string& user, const std::string& path) {
   if (AccessOf(folder, user) == Access::kNone) {
     return {kErrNoPrivilege, {}};
   }
-  if (LumoCheckPath(folder.real_path.c_str(), false, 0, nullptr, false, false, nullptr) != 0) {
-    return {LumoLibGetErr(), {}};
+  std::error_code error;
+  const std::string followed = fs::canonical(folder.real_path, error).string();
+  if (error) {
+    return FailWithErrno(error.value());
+  }
+  if (!IsWithin(followed, fs::canonical(folder.share_real_path, error).string())) {
+    return {kErrOutsideShare, {}};  // a link leads there
   }
   const std::unique_ptr<DIR, int (*)(DIR*)> directory(opendir(folder.real_path.c_str()), closedir);
   if (directory == nullptr) {

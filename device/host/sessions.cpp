@@ -13,7 +13,7 @@ namespace Device {
 namespace {
 
 constexpr std::size_t kSessionIdBytes = 16;
-constexpr std::ptrdiff_t kMostSessions = 64;  // of one user
+constexpr std::ptrdiff_t kMostSessions = 16;  // of one user
 constexpr int kFreeTries = 10;
 constexpr std::chrono::seconds kLongestWait(60);
 // In place of that of a user who is not there; no password has it.

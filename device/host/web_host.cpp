@@ -9,6 +9,7 @@
 
 #include <array>
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 #include <filesystem>
 #include <iostream>
@@ -31,7 +32,7 @@ constexpr char kPageFolder[] = "page";
 constexpr char kLockFile[] = "serve.lock";
 constexpr std::size_t kMostRequests = 384;  // at the same time; further ones wait
 constexpr int kRestartPauseMs = 500;
-constexpr int kFrontEndGraceMs = 6000;
+constexpr std::chrono::seconds kFrontEndGrace(6);
 
 FileDescriptor OpenBeside(const char* name) {
   const std::string path =
@@ -129,8 +130,9 @@ void WebHost::EndFrontEnd() {
     return;
   }
   kill(front_end_, SIGTERM);
-  for (int waited = 0; waitpid(front_end_, nullptr, WNOHANG) == 0; ++waited) {
-    if (waited == kFrontEndGraceMs) {
+  const auto deadline = std::chrono::steady_clock::now() + kFrontEndGrace;
+  while (waitpid(front_end_, nullptr, WNOHANG) == 0) {
+    if (std::chrono::steady_clock::now() > deadline) {
       kill(front_end_, SIGKILL);
     }
     poll(nullptr, 0, 1);
@@ -144,6 +146,7 @@ pid_t WebHost::Fork(const std::function<int()>& body) {
     // What belongs to the launcher alone.
     control_.Close();
     signals_.Close();
+    lock_.Close();
     requests_.clear();
     checks_.clear();
     sigprocmask(SIG_SETMASK, &saved_mask_, nullptr);
@@ -234,9 +237,13 @@ void WebHost::FinishSignIn(const SignInCheck& check, bool is_password) {
     return;
   }
   gate_.Succeeded(check.user);
-  Json::Value body = SessionBody(check.user);
-  body["session"] = SignIn(check.user);
-  Answer(check.exchange.Get(), kHttpOk, body);
+  try {
+    Json::Value body = SessionBody(check.user);
+    body["session"] = SignIn(check.user);
+    Answer(check.exchange.Get(), kHttpOk, body);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "sign in: %s", error.what());
+  }
 }
 
 bool WebHost::TakeSignal() {

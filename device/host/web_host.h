@@ -3,9 +3,9 @@
 #ifndef DEVICE_HOST_WEB_HOST_H_
 #define DEVICE_HOST_WEB_HOST_H_
 
-#include <signal.h>
 #include <sys/types.h>
 
+#include <csignal>
 #include <functional>
 #include <map>
 #include <set>

@@ -1,5 +1,6 @@
 #include "device/web/body.h"
 
+#include <cctype>
 #include <cstdlib>
 #include <stdexcept>
 
@@ -13,7 +14,8 @@ constexpr char kFormType[] = "application/x-www-form-urlencoded";
 
 int HexDigit(char digit) {
   const std::string digits = "0123456789abcdef";
-  const std::size_t value = digits.find(static_cast<char>(digit | 0x20));
+  const std::size_t value =
+      digits.find(static_cast<char>(std::tolower(static_cast<unsigned char>(digit))));
   return value == std::string::npos ? -1 : static_cast<int>(value);
 }
 
@@ -59,9 +61,8 @@ int VersionOf(const Json::Value& field) {
     return field.asInt();
   }
   const std::string text = field.isString() ? field.asString() : "";
-  char* end = nullptr;
-  const long number = std::strtol(text.c_str(), &end, 10);
-  if (text.empty() || *end != 0 || number < 0 || number > 1000) {
+  const long number = std::strtol(text.c_str(), nullptr, 10);
+  if (text.find_first_not_of("0123456789") != std::string::npos || text.empty() || number > 1000) {
     throw std::runtime_error("'version' is missing or not a number");
   }
   return static_cast<int>(number);

@@ -1,5 +1,6 @@
 #include "device/web/front_end.h"
 
+#include <malloc.h>
 #include <poll.h>
 #include <sys/socket.h>
 
@@ -19,12 +20,14 @@ using httplib::Request;
 using httplib::Response;
 
 constexpr std::size_t kMostBodyBytes = std::size_t{8} << 20U;
+constexpr std::size_t kMostStrangersBytes = std::size_t{64} << 10U;  // of one without a session
 constexpr int kBacklog = 1024;
 constexpr int kReadTimeout = 10;  // seconds without a byte from a client
 constexpr int kHeartbeatMs = 5000;
 constexpr std::chrono::seconds kEndGrace(5);
 constexpr char kJson[] = "application/json";
 constexpr char kSession[] = "/session";
+constexpr char kSessionKind[] = "session";
 constexpr char kWebApi[] = "/webapi";
 constexpr char kCookie[] = "session";
 constexpr char kCookieAttributes[] = "; Path=/; HttpOnly; SameSite=Strict";
@@ -57,6 +60,17 @@ std::string SessionOf(const Request& request) {
   return cookies.substr(value, cookies.find(';', value) - value);
 }
 
+// True when the name that the client knows the device by is not this machine's own, though it came
+// in over the loopback address: another site's name may lead here.
+bool IsForeignHost(const Request& request) {
+  const std::string host = request.get_header_value("Host");
+  const std::string name = host.substr(0, host.find(':', host.rfind(']') + 1));
+  const bool is_loopback =
+      request.local_addr.compare(0, 4, "127.") == 0 || request.local_addr == "::1";
+  return is_loopback && name != "localhost" && name != "127.0.0.1" && name != "[::1]" &&
+         name != request.local_addr;
+}
+
 // Browsers name the page that a request comes from; others leave it out.
 bool IsForeign(const Request& request) {
   const std::string origin = request.get_header_value("Origin");
@@ -84,7 +98,7 @@ const char* ReasonFor(int status) {
     case Device::kHttpNotFound:
       return "no such route";
     case Device::kHttpTooLarge:
-      return "the body is longer than 8 MiB";
+      return "the body is too long";
     case Device::kHttpInternal:
       return "the front end has failed";
     default:
@@ -123,6 +137,22 @@ bool ReadBody(const Request& request, const httplib::ContentReader& reader, std:
   return is_read && !is_too_long;
 }
 
+// What is long is looked into for those alone who are signed in.
+bool MayParse(const Request& request, const std::string& body, Response& response) {
+  if (body.size() > kMostStrangersBytes) {
+    if (request.path == kSession) {
+      response.status = Device::kHttpTooLarge;
+      return false;
+    }
+    const Answer answer = Exchange(Asked(request, kSessionKind)).Receive();
+    if (answer.status != Device::kHttpOk) {
+      Respond(response, answer.status, answer.body);
+      return false;
+    }
+  }
+  return true;
+}
+
 std::string EventText(const Json::Value& frame) {
   return "event: " + frame["event"].asString() + "\ndata: " + BodyText(frame["data"]) + "\n\n";
 }
@@ -153,7 +183,7 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
     const_cast<Request&>(request).ranges.clear();
     if (is_ending_) {
       Refuse(response, Device::kHttpUnavailable, "the device is ending");
-    } else if (IsForeign(request)) {
+    } else if (IsForeign(request) || IsForeignHost(request)) {
       Refuse(response, Device::kHttpForbidden, "the request comes from another site's page");
     } else if (request.has_header("Content-Encoding")) {
       Refuse(response, Device::kHttpNotDecoded, "the body is in an encoding");
@@ -195,7 +225,7 @@ void FrontEnd::AddRoutes() {
   server_.Delete(kSession,
                  [this](const Request& request, Response& response,
                         const httplib::ContentReader& /*body*/) { SignOut(request, response); });
-  for (const char* kind : {"session", "tasks", "codes"}) {
+  for (const char* kind : {kSessionKind, "tasks", "codes"}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
       Pass(Asked(request, kind), response);
     });
@@ -222,9 +252,12 @@ void FrontEnd::Post(const char* route,
     const std::shared_ptr<void> counted(&serving_, [this](void*) { --serving_; });
     std::string body;
     try {
-      if (ReadBody(request, reader, body, response)) {
+      if (ReadBody(request, reader, body, response) && MayParse(request, body, response)) {
         (this->*handler)(request, ParseBody(request.get_header_value("Content-Type"), body),
                          response);
+      }
+      if (body.size() > kMostStrangersBytes) {
+        malloc_trim(0);  // as JSON it has taken a hundred times its length
       }
     } catch (const std::runtime_error& error) {
       Refuse(response, Device::kHttpBadRequest, error.what());

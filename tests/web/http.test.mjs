@@ -74,8 +74,10 @@ test('what is wrong is refused with its status and reason', async () => {
     [400, "'path' is missing", '/files', {}],
     [401, 'wrong user name', '/session', {
       method: 'POST', body: new URLSearchParams({ user: 'bob', password: 'bob\0x' }) }],
-    [413, '8 MiB', ...post(long, json)],
-    [413, '8 MiB', ...post(new Blob([long]).stream(), json)],
+    [413, 'too long', ...post(long, json)],
+    [413, 'too long', ...post(new Blob([long]).stream(), json)],
+    [413, 'too long', '/session', { method: 'POST', body: `user=${long.slice(0, 70000)}` }],
+    [401, 'no session', ...post(long.slice(0, 70000), { Cookie: 'session=stale' })],
     [415, 'an encoding', ...post(gzipSync('{}'), { ...json, 'Content-Encoding': 'gzip' })],
     [404, 'no such route', '/none', { method: 'PUT', body: 'x' }],
     [400, 'not a request', ...post(new FormData())],
@@ -86,6 +88,8 @@ test('what is wrong is refused with its status and reason', async () => {
     assert.equal(answer.status, status, `${route}: ${answer.text}`);
     assert.ok(answer.body.error.includes(words), `${answer.text} has no "${words}"`);
   }
+  const { stdout } = await run('curl', ['-s', '-H', 'Host: evil.example', `${device.url}/codes`]);
+  assert.match(stdout, /another site's page/);
   const part = await alice.ask('/none', { headers: { Range: 'bytes=0-1' } });
   assert.match(part.text, /no such route/);
   const sameSite = await alice.ask('/tasks', { headers: { Origin: device.url } });
