@@ -165,7 +165,7 @@ double Workbench::Job(const Strings& sources, const std::string& format, const s
 
 double Workbench::Bare(const fs::path& folder, const Strings& names, Strings switches) {
   const fs::path list = folder_ / "list";
-  const fs::path archive = folder_ / "bare";
+  const fs::path archive = folder_ / "bare.out";  // 7z adds an ending where there is none
   std::ofstream text(list);
   for (const std::string& name : names) {
     text << name << '\n';
