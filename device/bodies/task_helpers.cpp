@@ -64,6 +64,8 @@ bool IsStale(const std::string& user, const TaskRow& row) {
 }
 
 void RemoveStaleTasks(const std::string& user) {
+  // Read before the tasks: the worker of a task that is made meanwhile is not among them.
+  const std::vector<pid_t> workers = StoreOf(user).AllWorkers();
   std::set<pid_t> named;
   for (const TaskRow& row : StoreOf(user).AllTasks()) {
     if (IsStale(user, row)) {
@@ -72,7 +74,7 @@ void RemoveStaleTasks(const std::string& user) {
       named.insert(WorkerOf(row));
     }
   }
-  ForgetEndedWorkers(user, named);
+  ForgetEndedWorkers(user, workers, named);
 }
 
 // The worker may end between two looks: what it stored last counts, so that a result is never

@@ -46,6 +46,8 @@ bool IsDead(const std::string& user, const TaskRow& row) {
 
 }  // namespace
 
+bool HasData(const TaskRow& row) { return Property(row, kPropData).isObject(); }
+
 Json::Value TaskView(const std::string& user, const TaskRow& row) {
   const Json::Value& data = DataOf(row);
   const Json::Value& progress = Property(row, "progress");

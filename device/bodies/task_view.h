@@ -10,6 +10,9 @@
 
 namespace Device {
 
+// False for a moment, until "start" has stored what the task is about.
+bool HasData(const TaskRow& row);
+
 // "taskid", "dest_file_path", "state" ("running", "finished", "failed", or "dead": the worker went
 // without an outcome), "progress" (0 to 1), "total_size" (bytes), "started" (seconds since 1970)
 // and, of a failed one, "errors". No password.

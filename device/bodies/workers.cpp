@@ -132,7 +132,7 @@ bool EndWorker(const std::string& user, pid_t pid) {
                            ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0
                            : kill(pid, SIGTERM) == 0;
   if (!is_told) {
-    return false;
+    return errno == ESRCH;  // it has ended in this moment
   }
   if (has_descriptor) {
     WaitForProcess(process, deadline);
@@ -144,8 +144,9 @@ bool EndWorker(const std::string& user, pid_t pid) {
   return WaitForGroup(pid, Clock::now() + kGrace);
 }
 
-void ForgetEndedWorkers(const std::string& user, const std::set<pid_t>& kept) {
-  for (const pid_t pid : StoreOf(user).AllWorkers()) {
+void ForgetEndedWorkers(const std::string& user, const std::vector<pid_t>& workers,
+                        const std::set<pid_t>& kept) {
+  for (const pid_t pid : workers) {
     if (kept.count(pid) == 0 && !IsWorkerAlive(user, pid)) {
       StoreOf(user).RemoveWorker(pid);
     }

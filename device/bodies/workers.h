@@ -7,6 +7,7 @@
 
 #include <set>
 #include <string>
+#include <vector>
 
 namespace Device {
 
@@ -23,8 +24,9 @@ bool IsBeingStopped(const std::string& user, pid_t pid);
 // a grace of 5 s. False when it is none, or could not be ended.
 bool EndWorker(const std::string& user, pid_t pid);
 
-// Forgets the workers that have ended, but those which a task still names.
-void ForgetEndedWorkers(const std::string& user, const std::set<pid_t>& kept);
+// Forgets those of the workers that have ended, but those to be kept.
+void ForgetEndedWorkers(const std::string& user, const std::vector<pid_t>& workers,
+                        const std::set<pid_t>& kept);
 
 }  // namespace Device
 

@@ -71,6 +71,9 @@ class Watcher {
     std::map<std::string, Json::Value> tasks;
     StoreOf(user_).RefreshTasks(rows_);
     for (const auto& [id, row] : rows_) {
+      if (!HasData(row)) {
+        continue;
+      }
       const Json::Value view = TaskView(user_, row);
       tasks[id] = view;
       if (const auto known = tasks_.find(id); known == tasks_.end() || known->second != view) {

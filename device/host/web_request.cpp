@@ -60,7 +60,9 @@ void AnswerTasks(int exchange, const std::string& user) {
   Json::Value body(Json::objectValue);
   body["tasks"] = Json::Value(Json::arrayValue);
   for (const TaskRow& row : StoreOf(user).AllTasks()) {
-    body["tasks"].append(TaskView(user, row));
+    if (HasData(row)) {
+      body["tasks"].append(TaskView(user, row));
+    }
   }
   Answer(exchange, kHttpOk, body);
 }

@@ -35,11 +35,24 @@ function addFile(file, content = 'x') {
   }
 }
 
+let lastPage;
+
+// A test that leaves behind what it saw when it fails.
+function check(name, options, body = options) {
+  test(name, body === options ? {} : options, () => body().catch(async (error) => {
+    await lastPage.screenshot({ path: path.join(shots, 'failed-test.png') });
+    const alice = await Client.signIn(device, 'alice');
+    console.error(device.log, JSON.stringify(await alice.tasks()));
+    throw error;
+  }));
+}
+
 // A page of a new visitor; anything that a script throws, or a dialog of its own, fails the test.
 async function visit(options = {}) {
   const context = await browser.newContext({ viewport: { width: 1280, height: 800 }, ...options });
   const page = await context.newPage();
   page.setDefaultTimeout(30000);
+  lastPage = page;
   page.faults = [];
   page.on('pageerror', (error) => page.faults.push(error.message));
   page.on('dialog', (dialog) => { page.faults.push(dialog.message()); dialog.dismiss(); });
@@ -89,7 +102,7 @@ async function noFaults(page, state) {
   assert.ok(!(scrollWidth > clientWidth), `${state} scrolls sideways`);
 }
 
-test('signing in, and what a wrong password says', async () => {
+check('signing in, and what a wrong password says', async () => {
   const page = await visit();
   await noFaults(page, 'sign-in');
   await page.getByLabel('User name').fill('alice');
@@ -104,7 +117,7 @@ test('signing in, and what a wrong password says', async () => {
   await page.getByLabel('User name').waitFor();
 });
 
-test('what is selected in two shared folders comes into one archive', async () => {
+check('what is selected in two shared folders comes into one archive', async () => {
   const page = await signIn(await visit());
   await open(page, 'photo', 'trip');
   await row(page, 'day1').click();
@@ -126,7 +139,7 @@ test('what is selected in two shared folders comes into one archive', async () =
   assert.deepEqual(await (await Client.signIn(device, 'alice')).tasks(), []);
 });
 
-test('the dialog says at the field what is wrong with it', async () => {
+check('the dialog says at the field what is wrong with it', async () => {
   const page = await signIn(await visit());
   await open(page, 'photo');
   await row(page, 'cat.jpg').click();
@@ -141,7 +154,7 @@ test('the dialog says at the field what is wrong with it', async () => {
   }
 });
 
-test('a running job is there after a reload and in a second window, and stops at a click',
+check('a running job is there after a reload and in a second window, and stops at a click',
   async () => {
     const page = await signIn(await visit());
     await open(page, 'photo');
@@ -159,7 +172,7 @@ test('a running job is there after a reload and in a second window, and stops at
     await until(() => !device.processes().some(({ args }) => args.includes('.kavo-7z-')));
   });
 
-test('a failure is told in words', { skip: !isRoot && 'a full volume takes root' }, async () => {
+check('a failure is told in words', { skip: !isRoot && 'a full volume takes root' }, async () => {
   const page = await signIn(await visit({ colorScheme: 'dark' }));
   await open(page, 'photo');
   await row(page, 'trip').click();
@@ -168,7 +181,7 @@ test('a failure is told in words', { skip: !isRoot && 'a full volume takes root'
   await noFaults(page, 'failed-dark');
 });
 
-test('a name that is all markup is shown as it is, everywhere', async () => {
+check('a name that is all markup is shown as it is, everywhere', async () => {
   addFile(`vol1/photo/${markup}`);
   const page = await signIn(await visit());
   await open(page, 'photo');
@@ -184,7 +197,7 @@ test('a name that is all markup is shown as it is, everywhere', async () => {
   await noFaults(page, 'markup');
 });
 
-test('users do not see each other\'s tasks', async () => {
+check('users do not see each other\'s tasks', async () => {
   const alice = await Client.signIn(device, 'alice');
   const taskid = await alice.start(['/photo/endless'], '/photo/alices.7z', { format: '7z' });
   const page = await signIn(await visit(), 'bob');
@@ -193,7 +206,7 @@ test('users do not see each other\'s tasks', async () => {
   await alice.call('stop', { taskid });
 });
 
-test('the keyboard alone does, on a phone\'s width', async () => {
+check('the keyboard alone does, on a phone\'s width', async () => {
   const page = await visit({ viewport: { width: 360, height: 740 } });
   const press = async (...keys) => { for (const key of keys) { await page.keyboard.press(key); } };
   await page.getByLabel('User name').focus();

@@ -156,8 +156,12 @@ async function killsAtRandom() {
     await new Promise((resolve) => { setTimeout(resolve, random(120)); });
     const polling = client.call('status', { taskid }).catch(() => null);
     for (const { pid } of victims(device, kind).slice(0, 1 + random(2))) {
-      killed += 1;
-      process.kill(pid, 'SIGKILL');
+      try {
+        process.kill(pid, 'SIGKILL');
+        killed += 1;
+      } catch {
+        // It has ended by itself meanwhile.
+      }
     }
     await polling;
     if (kind === 'launcher') {
