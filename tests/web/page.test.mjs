@@ -209,6 +209,7 @@ check('users do not see each other\'s tasks', async () => {
 check('the keyboard alone does, on a phone\'s width', async () => {
   const page = await visit({ viewport: { width: 360, height: 740 } });
   const press = async (...keys) => { for (const key of keys) { await page.keyboard.press(key); } };
+  await page.getByLabel('User name').waitFor();
   await page.getByLabel('User name').focus();
   await page.keyboard.type('bob');
   await press('Tab');
