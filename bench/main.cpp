@@ -1,6 +1,7 @@
 // kavo-bench FOLDER [ROW]...: what the module costs beside the least that does the same. Prints the
 // table's rows, all or those named, and leaves in FOLDER/growth the cost against the number of
 // sources, for the plot.
+#include <poll.h>
 #include <sqlite3.h>
 #include <sys/wait.h>
 #include <syslog.h>
@@ -172,6 +173,14 @@ double PrivateBytes(pid_t pid) {
   return 1024 * kilobytes;
 }
 
+// True once the worker has a child.
+bool HasArchiver(pid_t worker) {
+  const std::string id = std::to_string(worker);
+  std::ifstream children("/proc/" + id + "/task/" + id + "/children");
+  pid_t child = 0;
+  return static_cast<bool>(children >> child);
+}
+
 void WorkerMemory(Workbench& bench) {
   bench.AddFiles(bench.Share("photo/endless"), 1, std::size_t{1} << 40U, true);
   const std::size_t count = 100000;
@@ -197,10 +206,10 @@ void WorkerMemory(Workbench& bench) {
       }
     }
     Require(worker > 0, "no worker");
-    while (bench.Ask("status", id).data["progress"].asDouble() == 0 &&
-           bench.Ask("status", id).code == 0 && PrivateBytes(worker) == 0) {
+    // With its sources checked and listed, it starts the archiver.
+    while (bench.Ask("status", id).code == 0 && !HasArchiver(worker)) {
+      poll(nullptr, 0, 1);
     }
-    usleep(sources.size() == 1 ? 300000 : 6000000);
     const bool is_many = sources.size() > 1;
     const double limit = is_many ? 8 * bytes_of_paths : 3.0 * kMiB;
     std::ostringstream ours;

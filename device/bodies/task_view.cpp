@@ -8,8 +8,6 @@ namespace Device {
 namespace {
 
 constexpr char kPropData[] = "data";
-constexpr char kRunning[] = "running";
-constexpr char kDead[] = "dead";
 
 const Json::Value& Property(const TaskRow& row, const std::string& name) {
   const auto found = row.properties.find(name);
@@ -31,7 +29,8 @@ std::string StateOf(const std::string& user, const TaskRow& row, const Json::Val
     return "finished";
   }
   const pid_t pid = data["pid"].isInt() ? data["pid"].asInt() : -1;
-  return pid < 0 || IsWorkerAlive(user, pid) || IsBeingStopped(user, pid) ? kRunning : kDead;
+  return pid < 0 || IsWorkerAlive(user, pid) || IsBeingStopped(user, pid) ? kTaskRunning
+                                                                          : kTaskDead;
 }
 
 Json::Value Destination(const Json::Value& data) {
@@ -41,7 +40,7 @@ Json::Value Destination(const Json::Value& data) {
 }
 
 bool IsDead(const std::string& user, const TaskRow& row) {
-  return StateOf(user, row, DataOf(row)) == kDead;
+  return StateOf(user, row, DataOf(row)) == kTaskDead;
 }
 
 }  // namespace

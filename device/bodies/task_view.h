@@ -10,12 +10,15 @@
 
 namespace Device {
 
+// States of a task, beside "finished" and "failed".
+inline constexpr char kTaskRunning[] = "running";
+inline constexpr char kTaskDead[] = "dead";  // the worker went without an outcome
+
 // False for a moment, until "start" has stored what the task is about.
 bool HasData(const TaskRow& row);
 
-// "taskid", "dest_file_path", "state" ("running", "finished", "failed", or "dead": the worker went
-// without an outcome), "progress" (0 to 1), "total_size" (bytes), "started" (seconds since 1970)
-// and, of a failed one, "errors". No password.
+// "taskid", "dest_file_path", "state", "progress" (0 to 1), "total_size" (bytes), "started"
+// (seconds since 1970) and, of a failed one, "errors". No password.
 Json::Value TaskView(const std::string& user, const TaskRow& row);
 
 // Gives every dead task of the user's the outcome that its worker could not store: one error item,

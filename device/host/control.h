@@ -26,6 +26,15 @@ struct ControlMessage {
   FileDescriptor exchange;  // each frame on it is {"status": HTTP status, "body": JSON}
 };
 
+// What a frame from the front end asks for, by its "kind"; beside it "session" and what the kind
+// needs.
+inline constexpr char kKindCall[] = "call";  // "api", "version", "method", "params", "followed"
+inline constexpr char kKindSession[] = "session";  // who is signed in
+inline constexpr char kKindFiles[] = "files";      // "path"
+inline constexpr char kKindTasks[] = "tasks";
+inline constexpr char kKindEvents[] = "events";
+inline constexpr char kKindCodes[] = "codes";  // no session needed
+
 // False when the other side is gone.
 bool SendControl(int socket, ControlKind kind, const std::string& text, int exchange);
 

@@ -49,11 +49,12 @@ class Watcher {
     }
   }
 
-  // Tasks are read only when a worker has gone: they can be large.
+  // All tasks are read only when a worker has gone: they can be large.
   void EndTasksOfLostWorkers() {
     const auto is_lost = [&](pid_t pid) { return !IsWorkerAlive(user_, pid); };
     const auto lost = std::remove_if(workers_.begin(), workers_.end(), is_lost);
-    if (lost != workers_.end()) {
+    if (lost != workers_.end() || has_dead_) {
+      has_dead_ = false;
       workers_.erase(lost, workers_.end());
       EndDeadTasks(user_);
       version_ = -1;  // this process's own changes do not count as such
@@ -74,7 +75,11 @@ class Watcher {
       if (!HasData(row)) {
         continue;
       }
-      const Json::Value view = TaskView(user_, row);
+      Json::Value view = TaskView(user_, row);
+      if (view["state"] == kTaskDead) {
+        view["state"] = kTaskRunning;  // until it has its outcome, at the next look
+        has_dead_ = true;
+      }
       tasks[id] = view;
       if (const auto known = tasks_.find(id); known == tasks_.end() || known->second != view) {
         Send("task", view);
@@ -113,6 +118,7 @@ class Watcher {
   std::vector<pid_t> workers_;  // that were alive
   std::map<std::string, TaskRow> rows_;
   std::map<std::string, Json::Value> tasks_;  // as they were sent
+  bool has_dead_ = false;  // a task whose worker had gone before it was seen alive
   bool is_read_ = true;
 };
 

@@ -59,7 +59,7 @@ FileDescriptor LockDevice() {
   return file;
 }
 
-// One that fails is for good: the launcher exits with it.
+// What the front end's process becomes; one that cannot start says so.
 [[noreturn]] void BecomeFrontEnd(const FrontEndFiles& files, int control,
                                  const std::string& listen) {
   dup2(control, STDIN_FILENO);

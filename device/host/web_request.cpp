@@ -9,6 +9,7 @@
 #include "device/bodies/json_text.h"
 #include "device/bodies/task_store.h"
 #include "device/bodies/task_view.h"
+#include "device/host/control.h"
 #include "device/host/file_listing.h"
 #include "device/host/frame.h"
 #include "device/host/http_status.h"

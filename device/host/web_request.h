@@ -7,15 +7,6 @@
 
 namespace Device {
 
-// What a frame from the front end asks for, by its "kind"; beside it "session" and what the kind
-// needs.
-inline constexpr char kKindCall[] = "call";  // "api", "version", "method", "params", "followed"
-inline constexpr char kKindSession[] = "session";  // who is signed in
-inline constexpr char kKindFiles[] = "files";      // "path"
-inline constexpr char kKindTasks[] = "tasks";
-inline constexpr char kKindEvents[] = "events";
-inline constexpr char kKindCodes[] = "codes";  // no session needed
-
 // Reads the request from the stream, serves it with the identity of the session's user, and answers
 // on the stream.
 void ServeWebRequest(Launcher& launcher, FileDescriptor exchange);

@@ -27,7 +27,6 @@ constexpr int kHeartbeatMs = 5000;
 constexpr std::chrono::seconds kEndGrace(5);
 constexpr char kJson[] = "application/json";
 constexpr char kSession[] = "/session";
-constexpr char kSessionKind[] = "session";
 constexpr char kWebApi[] = "/webapi";
 constexpr char kCookie[] = "session";
 constexpr char kCookieAttributes[] = "; Path=/; HttpOnly; SameSite=Strict";
@@ -129,7 +128,7 @@ bool ReadBody(const Request& request, const httplib::ContentReader& reader, std:
     if (!is_too_long) {
       body.append(data, size);
     }
-    return true;  // to its end, where the connection's next request begins
+    return true;  // to its end: closed with bytes unread, the connection would lose the answer
   });
   if (is_too_long) {
     response.status = Device::kHttpTooLarge;
@@ -144,7 +143,7 @@ bool MayParse(const Request& request, const std::string& body, Response& respons
       response.status = Device::kHttpTooLarge;
       return false;
     }
-    const Answer answer = Exchange(Asked(request, kSessionKind)).Receive();
+    const Answer answer = Exchange(Asked(request, Device::kKindSession)).Receive();
     if (answer.status != Device::kHttpOk) {
       Respond(response, answer.status, answer.body);
       return false;
@@ -225,7 +224,7 @@ void FrontEnd::AddRoutes() {
   server_.Delete(kSession,
                  [this](const Request& request, Response& response,
                         const httplib::ContentReader& /*body*/) { SignOut(request, response); });
-  for (const char* kind : {kSessionKind, "tasks", "codes"}) {
+  for (const char* kind : {Device::kKindSession, Device::kKindTasks, Device::kKindCodes}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
       Pass(Asked(request, kind), response);
     });
@@ -235,7 +234,7 @@ void FrontEnd::AddRoutes() {
       Refuse(response, Device::kHttpBadRequest, "'path' is missing");
       return;
     }
-    Json::Value asked = Asked(request, "files");
+    Json::Value asked = Asked(request, Device::kKindFiles);
     asked["path"] = request.get_param_value("path");
     Pass(asked, response);
   });
@@ -295,14 +294,14 @@ void FrontEnd::SignOut(const Request& request, Response& response) {
 
 void FrontEnd::CallApi(const Request& request, const Json::Value& body, Response& response) {
   Json::Value asked = ApiRequest(body);
-  asked["kind"] = "call";
+  asked["kind"] = Device::kKindCall;
   asked["session"] = SessionOf(request);
   asked["followed"] = streams_.HasAny(asked["session"].asString());
   Pass(asked, response);
 }
 
 void FrontEnd::StreamEvents(const Request& request, Response& response) {
-  const Json::Value asked = Asked(request, "events");
+  const Json::Value asked = Asked(request, Device::kKindEvents);
   const std::shared_ptr<void> counted = streams_.Open(asked["session"].asString());
   if (counted == nullptr) {
     response.set_header("Retry-After", "10");
