@@ -1,7 +1,6 @@
 #include "bench/bench.h"
 
 #include <fcntl.h>
-#include <poll.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -145,18 +144,13 @@ Device::Outcome Workbench::Ask(const std::string& method, const std::string& tas
 }
 
 void Workbench::Finish(const std::string& task_id) {
-  constexpr int kLongestPauseMs = 20;
-  constexpr int kLookEach = 20;  // of the time that has gone
-  const auto begin = std::chrono::steady_clock::now();
+  constexpr std::chrono::milliseconds kPause(250);  // of a client that asks from time to time
   Device::Outcome outcome;
   while (!outcome.data["finished"].asBool()) {
-    const auto gone = std::chrono::steady_clock::now() - begin;
-    const auto pause = std::chrono::duration_cast<std::chrono::milliseconds>(gone) / kLookEach;
-    poll(nullptr, 0, std::clamp(static_cast<int>(pause.count()), 1, kLongestPauseMs));
+    Device::Launcher::AwaitWorker(kPause);
     outcome = Ask("status", task_id);
     Require(outcome.code == 0 && !outcome.data.isMember("errors"), Device::ToText(outcome.data));
   }
-  Device::Launcher::Reap();
 }
 
 double Workbench::Job(const Strings& sources, const std::string& format, const std::string& level) {

@@ -79,7 +79,7 @@ class ArchiverTest : public testing::Test {
     WriteFile(share / "huge", "");
     fs::resize_file(share / "huge", size);
     auto run = std::make_unique<Program>(CommandLine("new", {"huge"}, options), share);
-    EXPECT_TRUE(run->ReadUntil("Compressing huge\n")) << run->Seen();
+    EXPECT_TRUE(run->ReadUntil("Progress: 0\n")) << run->Seen();
     return run;
   }
 
@@ -117,10 +117,7 @@ TEST_F(ArchiverTest, KeepsEveryNameWhateverItHolds) {
   sources.insert(sources.end(), {"d/sub", "d", "*", "pipe"});
   for (const char* page : {static_cast<const char*>(nullptr), ""}) {
     const std::string archive = page == nullptr ? "a*b" : "zip!";
-    const Strings lines = Good(archive, sources, {"a", "", "", page});
-    EXPECT_EQ(std::count_if(lines.begin(), lines.end(),
-                            [](const auto& line) { return line.rfind("Compressing ", 0) == 0; }),
-              static_cast<long>(2 * names.size() + (page == nullptr ? 1 : 3)));  // with the pipes
+    Good(archive, sources, {"a", "", "", page});
     EXPECT_EQ(Unpacked(out / archive), expected);
     EXPECT_EQ(ReadFile(out / archive).substr(0, 2), page == nullptr ? "7z" : "PK");
   }
@@ -305,6 +302,7 @@ TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
     Good("new", {"a"});
     const std::string other = ReadFile(out / "new");
     EXPECT_EQ(run->Wait(), 1);
+    EXPECT_TRUE(run->ReadUntil("\nCompressing huge\nProgress: "));
     EXPECT_TRUE(run->ReadUntil("it has changed meanwhile"));
     EXPECT_EQ(ReadFile(out / "new"), other);
     EXPECT_EQ(InOut(), Strings{"new"});

@@ -23,10 +23,19 @@ bool NumberBefore(std::string_view text, size_t end, uint64_t* number) {
   return true;
 }
 
-// A progress text is "  0M Scan " or " 84% 12": it starts with blanks or digits, as no line does.
+// A progress text is "  0M Scan " or " 84% 12 + name": it starts with blanks or digits, as no line
+// does.
 bool StartsProgress(std::string_view text) {
   return !text.empty() && (text[0] == ' ' || (text[0] >= '0' && text[0] <= '9')) &&
          text.find_first_of("%M") != std::string::npos;
+}
+
+// The name in " 84% 12 + name", where "+" stands for a new file and "U" for a changed one.
+std::string_view NameIn(std::string_view text) {
+  const size_t mark = text.find_first_not_of(" 0123456789%");
+  const bool is_name = mark != std::string_view::npos && text.find('%') < mark &&
+                       (text.substr(mark, 2) == "+ " || text.substr(mark, 2) == "U ");
+  return is_name ? text.substr(mark + 2) : std::string_view();
 }
 
 }  // namespace
@@ -53,7 +62,8 @@ std::vector<Event> OutputParser::Feed(const std::string& bytes) {
 }
 
 // Reports the percentage that `line` starts with at once, for 7z wipes a progress text only when it
-// has a new one. Returns the length of the text and its wiping, 0 while that is not complete.
+// has a new one; the name, which may still be cut, is reported then. Returns the length of the text
+// and its wiping, 0 while that is not complete.
 size_t OutputParser::TakeProgress(std::string_view line, std::vector<Event>* events) {
   const std::string_view text = line.substr(0, line.find(kWipe));
   if (!StartsProgress(text)) {
@@ -67,15 +77,19 @@ size_t OutputParser::TakeProgress(std::string_view line, std::vector<Event>* eve
   }
   const std::string back(text.size(), kWipe);
   const std::string wiping = back + std::string(text.size(), ' ') + back;
-  return line.compare(text.size(), wiping.size(), wiping) == 0 ? text.size() + wiping.size() : 0;
+  if (line.compare(text.size(), wiping.size(), wiping) != 0) {
+    return 0;
+  }
+  if (const std::string_view name = NameIn(text); !name.empty()) {
+    events->push_back({Event::Kind::kFile, 0, std::string(name)});
+  }
+  return text.size() + wiping.size();
 }
 
 void OutputParser::TakeLine(const std::string& line, std::vector<Event>* events) {
   uint64_t bytes = 0;
-  if (line.compare(0, 2, "+ ") == 0 || line.compare(0, 2, "U ") == 0) {
-    events->push_back({Event::Kind::kFile, 0, line.substr(2)});
-  } else if (line.compare(0, std::strlen(kTotal), kTotal) == 0 &&
-             NumberBefore(line, line.find(" byte"), &bytes)) {
+  if (line.compare(0, std::strlen(kTotal), kTotal) == 0 &&
+      NumberBefore(line, line.find(" byte"), &bytes)) {
     events->push_back({Event::Kind::kTotal, bytes, {}});
   }
 }

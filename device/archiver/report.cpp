@@ -6,15 +6,12 @@
 #include <algorithm>
 #include <cerrno>
 #include <climits>
-#include <utility>
 
 #include "device/archiver/failure.h"
 
 namespace Archiver {
 
 namespace {
-
-constexpr std::chrono::milliseconds kPercentPause(100);
 
 // Begins a line of its own, as the one before may be cut off. Waits for nothing: the reader may be
 // gone or not reading.
@@ -34,25 +31,20 @@ void Report::Total(uint64_t bytes) {
   }
 }
 
-void Report::Compressing(const std::string& name) { Line("Compressing " + Printable(name)); }
-
-void Report::Progress(uint64_t percent) {
-  const Clock::time_point now = Clock::now();
-  if (now >= next_percent_) {
-    next_percent_ = now + kPercentPause;
-    Percent(static_cast<int>(std::min<uint64_t>(percent, 99)));
+void Report::Compressing(const std::string& name) {
+  if (name != name_) {
+    name_ = name;
+    Line("Compressing " + Printable(name));
   }
 }
 
-void Report::Done() {
-  Percent(100);
-  Flush();
+void Report::Progress(uint64_t percent) {
+  Percent(static_cast<int>(std::min<uint64_t>(percent, 99)));
 }
 
-void Report::Error(const std::string& reason) {
-  Line("Error: " + Printable(reason));
-  Flush();
-}
+void Report::Done() { Percent(100); }
+
+void Report::Error(const std::string& reason) { Line("Error: " + Printable(reason)); }
 
 void Report::CancelledRun() { LastWord(cancel_.ReportFd(), "\nError: cancelled\n"); }
 
@@ -65,19 +57,17 @@ void Report::Percent(int percent) {
   }
 }
 
-void Report::Line(const std::string& text) { lines_ += text + '\n'; }
-
-void Report::Flush() {
-  const std::string lines = std::exchange(lines_, {});
-  for (size_t done = 0; done < lines.size();) {
+void Report::Line(const std::string& text) {
+  const std::string line = text + '\n';
+  for (size_t done = 0; done < line.size();) {
     pollfd watched[] = {{cancel_.ReportFd(), POLLOUT, 0}, {cancel_.SignalFd(), POLLIN, 0}};
     if (poll(watched, 2, -1) < 0 && errno == EINTR) {
       continue;
     }
     cancel_.Check();
     // A pipe that polls writable takes PIPE_BUF bytes without blocking, and promises no more.
-    const ssize_t written = write(cancel_.ReportFd(), lines.data() + done,
-                                  std::min<size_t>(lines.size() - done, PIPE_BUF));
+    const ssize_t written = write(cancel_.ReportFd(), line.data() + done,
+                                  std::min<size_t>(line.size() - done, PIPE_BUF));
     if (written > 0) {
       done += static_cast<size_t>(written);
     } else if (written < 0 && errno != EINTR && errno != EAGAIN) {

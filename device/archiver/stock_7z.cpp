@@ -9,7 +9,6 @@
 #include <algorithm>
 #include <array>
 #include <cerrno>
-#include <chrono>
 #include <csignal>
 #include <cstring>
 
@@ -23,8 +22,6 @@ namespace Archiver {
 const char* const kStock7z = KAVO_STOCK_7Z;
 
 namespace {
-
-using Clock = std::chrono::steady_clock;
 
 constexpr int kWarned = 1;  // its exit status
 constexpr char kCannotStart[] = "cannot start";
@@ -139,39 +136,25 @@ void PassOn(const std::vector<Event>& events, Report& report) {
         break;
     }
   }
-  report.Flush();
-}
-
-// 7z writes a line for each file. A reader that wakes up for each costs a job of small files a
-// quarter of its time, so it rests, for a hundredth of the time that the run has taken.
-int RestAfter(Clock::duration gone) {
-  constexpr int kShare = 100;
-  constexpr int kLongestMs = 20;
-  const auto share = std::chrono::duration_cast<std::chrono::milliseconds>(gone).count() / kShare;
-  return share == 0 ? -1 : static_cast<int>(std::min<std::int64_t>(share, kLongestMs));
 }
 
 void Drain(Device::FileDescriptor& output, Device::FileDescriptor& errors, ErrorText* text,
            const Cancel& cancel, Report& report) {
   OutputParser parser;
-  const Clock::time_point begin = Clock::now();
-  int rest_ms = -1;  // before the output is read again; below 0: none
   while ((output || errors) && !text->HasWarning()) {
-    pollfd watched[] = {{rest_ms < 0 ? output.Get() : -1, POLLIN, 0},
+    pollfd watched[] = {{output.Get(), POLLIN, 0},
                         {errors.Get(), POLLIN, 0},
                         {cancel.SignalFd(), POLLIN, 0},
                         {cancel.ReportFd(), 0, 0}};
-    if (poll(watched, 4, rest_ms) < 0 && errno != EINTR) {
+    if (poll(watched, 4, -1) < 0 && errno != EINTR) {
       throw SystemFailure("cannot read from", kStock7z, errno);
     }
     cancel.Check();
-    rest_ms = -1;
     if (watched[1].revents != 0) {
       text->Feed(ReadSome(errors));
     }
     if (watched[0].revents != 0) {
       PassOn(parser.Feed(ReadSome(output)), report);
-      rest_ms = RestAfter(Clock::now() - begin);
     }
   }
 }

@@ -24,9 +24,8 @@ std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& ru
       "-sae",  // the archive's name as it is, no extension added
       "-spd",  // names are no patterns
       "-sse",  // stop at a file that does not open
-      "-bb1",
       "-bso1",
-      "-bse2",  // name each file
+      "-bse2",
       "-bsp1",  // 7z flushes its standard output only with the progress on it
       "-y",
   };

@@ -1,8 +1,8 @@
 // "compress": one job from start to end, with its progress.
-#include <poll.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <cmath>
 #include <csignal>
 #include <iostream>
@@ -23,8 +23,8 @@ namespace {
 
 constexpr char kApi[] = "KAVO.Zantro.Compress";
 constexpr int kApiVersion = 3;
-constexpr int kFirstPauseMs = 10;
-constexpr int kLongestPauseMs = 250;
+constexpr std::chrono::milliseconds kFirstPause(10);
+constexpr std::chrono::milliseconds kLongestPause(250);
 
 volatile std::sig_atomic_t is_interrupted = 0;
 
@@ -114,7 +114,7 @@ class Job {
 
   int Follow() {
     ProgressDisplay display;
-    int pause = kFirstPauseMs;
+    std::chrono::milliseconds pause = kFirstPause;
     for (;;) {
       if (is_interrupted != 0) {
         display.Clear();
@@ -127,9 +127,8 @@ class Job {
         return Report(outcome);
       }
       display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
-      Launcher::Reap();
-      poll(nullptr, 0, pause);
-      pause = std::min(2 * pause, kLongestPauseMs);
+      Launcher::AwaitWorker(pause);
+      pause = std::min(2 * pause, kLongestPause);
     }
   }
 

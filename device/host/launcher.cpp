@@ -8,6 +8,8 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <csignal>
+#include <ctime>
 #include <optional>
 #include <stdexcept>
 
@@ -145,9 +147,29 @@ Outcome Launcher::Call(const Request& request) {
   return outcome;
 }
 
-void Launcher::Reap() {
+bool Launcher::Reap() {
+  bool has_reaped = false;
   while (waitpid(-1, nullptr, WNOHANG) > 0) {
+    has_reaped = true;
   }
+  return has_reaped;
+}
+
+void Launcher::AwaitWorker(std::chrono::milliseconds longest) {
+  constexpr long kMilli = 1000;
+  sigset_t child_ended;
+  sigset_t saved;
+  sigemptyset(&child_ended);
+  sigaddset(&child_ended, SIGCHLD);
+  // Held back, the signal of one that ends from now on is not missed.
+  sigprocmask(SIG_BLOCK, &child_ended, &saved);
+  if (!Reap()) {
+    const timespec time = {static_cast<std::time_t>(longest.count() / kMilli),
+                           static_cast<long>(longest.count() % kMilli) * kMilli * kMilli};
+    sigtimedwait(&child_ended, nullptr, &time);
+    Reap();
+  }
+  sigprocmask(SIG_SETMASK, &saved, nullptr);
 }
 
 }  // namespace Device

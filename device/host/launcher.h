@@ -5,6 +5,7 @@
 
 #include <json/json.h>
 
+#include <chrono>
 #include <memory>
 #include <string>
 
@@ -55,8 +56,11 @@ class Launcher {
   // The same; what the handler throws becomes an error code of the host's.
   Outcome CallSafely(const Request& request);
 
-  // Takes leave of workers that have ended.
-  static void Reap();
+  // Takes leave of workers that have ended. False when none has.
+  static bool Reap();
+
+  // The same, but waits for one, so long at the most; a signal ends the waiting too.
+  static void AwaitWorker(std::chrono::milliseconds longest);
 
  private:
   // Null, and the host's error code in `code`, when no row serves the request.
