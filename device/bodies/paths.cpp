@@ -1,5 +1,10 @@
 #include "device/bodies/paths.h"
 
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
 #include <algorithm>
 #include <climits>
 #include <cstdlib>
@@ -7,6 +12,7 @@
 #include <memory>
 
 #include "device/bodies/errors.h"
+#include "device/bodies/file_descriptor.h"
 #include "device/bodies/operations.h"
 #include "platform/lumo/file_manager.h"
 
@@ -78,8 +84,21 @@ bool IsOnVolumes(const std::string& path) {
                      [&](const std::string& volume) { return IsWithin(path, volume); });
 }
 
+// True of a file that is there and has no link on the way to it: what its path says is where it
+// lies. One call of the kernel's, where following takes one for each part of the path. False where
+// the kernel does not know it.
+bool HasNoLinks(const char* path) {
+  open_how how{};
+  how.flags = O_PATH | O_CLOEXEC;
+  how.resolve = RESOLVE_NO_SYMLINKS;
+  return static_cast<bool>(
+      FileDescriptor(static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path, &how, sizeof how))));
+}
+
+bool HasDots(const std::string& path) { return path.find("/.") != std::string::npos; }
+
 int CheckPath(const char* path) {
-  const std::string followed = FollowLinks(path);
+  const std::string followed = !HasDots(path) && HasNoLinks(path) ? path : FollowLinks(path);
   if (followed.empty()) {
     SetLastErrno(errno);
     return -1;

@@ -44,14 +44,16 @@ bool WaitForTask(Vesk::Task::State& task, int seconds, const std::function<bool(
   return false;
 }
 
-bool HoldsErrors(const Json::Value& data) { return data.isObject() && data.isMember(kDataErrors); }
+bool HoldsErrors(const Vesk::Task::State& task) {
+  return task.Find(kPropData).HasMember(kDataErrors);
+}
 
 // The worker that the task's data names, -1 when it names none.
 pid_t WorkerOf(const TaskRow& row) {
   const auto data = row.properties.find(kPropData);
-  const bool has_pid =
-      data != row.properties.end() && data->second.isObject() && data->second[kDataPid].isInt();
-  return has_pid ? data->second[kDataPid].asInt() : -1;
+  const Json::Value pid =
+      data == row.properties.end() ? Json::Value() : data->second.Member(kDataPid);
+  return pid.isInt() ? pid.asInt() : -1;
 }
 
 // When a worker went is not known; its last word in the store counts.
@@ -84,7 +86,7 @@ bool EndedWithoutResult(Vesk::Task::State& task, pid_t pid) {
     return false;
   }
   task.Reload();
-  return !task.row.finished && !HoldsErrors(task.Get(kPropData));
+  return !task.row.finished && !HoldsErrors(task);
 }
 
 }  // namespace
@@ -94,27 +96,23 @@ using Device::Operation;
 
 int SaveTaskData(Vesk::Task* task, Json::Value& data, float progress) {
   return Operation("SaveTaskData", task, data, progress).Run([&] {
-    const Json::Value fraction = static_cast<double>(progress);
-    return task->state->StoreNow({{Device::kPropData, &data}, {Device::kPropProgress, &fraction}},
-                                 false)
-               ? 1
-               : 0;
+    std::map<std::string, Device::StoredValue> properties;
+    properties.emplace(Device::kPropData, data);
+    properties.emplace(Device::kPropProgress, Json::Value(static_cast<double>(progress)));
+    return task->state->StoreNow(std::move(properties), false) ? 1 : 0;
   });
 }
 
 int WaitForTaskDataReady(Vesk::Task* task, const char* property, int seconds) {
   return Operation("WaitForTaskDataReady", task, property, seconds).Run([&] {
-    const auto is_there = [&] { return !task->state->Get(property).isNull(); };
+    const auto is_there = [&] { return !task->state->Find(property).IsNull(); };
     return Device::WaitForTask(*task->state, seconds, is_there) ? 1 : 0;
   });
 }
 
 int WaitForTaskDataKeyReady(Vesk::Task* task, const char* property, const char* key, int seconds) {
   return Operation("WaitForTaskDataKeyReady", task, property, key, seconds).Run([&] {
-    const auto is_there = [&] {
-      const Json::Value value = task->state->Get(property);
-      return value.isObject() && value.isMember(key);
-    };
+    const auto is_there = [&] { return task->state->Find(property).HasMember(key); };
     return Device::WaitForTask(*task->state, seconds, is_there) ? 1 : 0;
   });
 }
@@ -134,9 +132,8 @@ void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved) {
   Operation("LumoLibRemoveFinishedTask", task, pid, reserved).Run([&] {
     Vesk::Task::State* const state = task == nullptr ? nullptr : task->state;
     try {
-      if (state != nullptr &&
-          (state->row.finished || Device::HoldsErrors(state->Get(Device::kPropData)) ||
-           Device::EndedWithoutResult(*state, pid))) {
+      if (state != nullptr && (state->row.finished || Device::HoldsErrors(*state) ||
+                               Device::EndedWithoutResult(*state, pid))) {
         state->Remove();
       }
     } catch (const std::exception& error) {
