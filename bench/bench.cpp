@@ -34,12 +34,6 @@ void GiveToUser(const fs::path& path) {
   Require(geteuid() != 0 || chown(path.c_str(), kUid, Device::kUsersGroup) == 0, "chown");
 }
 
-std::string Format(const char* format, double value) {
-  char text[32];
-  std::snprintf(text, sizeof text, format, value);
-  return text;
-}
-
 }  // namespace
 
 double Seconds(const std::function<void()>& body) {
@@ -59,18 +53,6 @@ Medians Compare(const std::function<double()>& ours, const std::function<double(
     all_theirs.push_back(theirs());
   }
   return {Median(all_ours), Median(all_theirs)};
-}
-
-void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
-              double ratio, const std::string& limit) {
-  std::cout << "| " << what << " | " << ours << " | " << theirs << " | " << Format("%.2f", ratio)
-            << " | " << limit << " |" << std::endl;
-}
-
-void PrintRow(const std::string& what, const Medians& medians, const std::string& limit) {
-  constexpr double kMilli = 1000;
-  PrintRow(what, Format("%.4g ms", kMilli * medians.ours),
-           Format("%.4g ms", kMilli * medians.theirs), medians.ours / medians.theirs, limit);
 }
 
 void Require(bool holds, const std::string& what) {
