@@ -49,7 +49,7 @@ ArchiverEvent ParseArchiverLine(std::string_view line) {
     event.total_size = static_cast<std::uint64_t>(std::strtoll(size, nullptr, kDecimal));
   } else if (Behind(line, kFilePrefix) != nullptr) {
     event.kind = ArchiverEvent::kFile;
-    const std::string_view name = line.substr(sizeof(kFilePrefix) - 1);
+    const std::string name(line.substr(sizeof(kFilePrefix) - 1));
     // The last character alone, the line feed; deliberate.
     event.file = name.substr(name.length() - 1);
   } else if (const char* percent = Behind(line, kProgressPrefix)) {
