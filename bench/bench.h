@@ -36,8 +36,11 @@ class Workbench {
   Strings AddFiles(const fs::path& folder, std::size_t count, std::size_t size,
                    bool is_sparse = false);
 
-  // Makes /photo/out of the sources; the task's id.
-  std::string Start(const Strings& sources, const std::string& format, const std::string& level);
+  // The request to make /photo/out, which is not there then, of the sources.
+  Device::Request Prepare(const Strings& sources, const std::string& format,
+                          const std::string& level) const;
+  // The task's id.
+  std::string Start(const Device::Request& request);
   Device::Outcome Ask(const std::string& method, const std::string& task_id);
   // Until "status" says finished. Throws when the job failed.
   void Finish(const std::string& task_id);

@@ -148,8 +148,8 @@ void Answers(Workbench& bench, const fs::path& folder) {
            Compare(
                [&] {
                  std::string id;
-                 const double seconds =
-                     Seconds([&] { id = bench.Start({"/photo/endless"}, "7z", "best"); });
+                 const Device::Request request = bench.Prepare({"/photo/endless"}, "7z", "best");
+                 const double seconds = Seconds([&] { id = bench.Start(request); });
                  bench.Ask("stop", id);
                  return seconds;
                },
@@ -160,7 +160,7 @@ void Answers(Workbench& bench, const fs::path& folder) {
                },
                kTries),
            "3");
-  const std::string id = bench.Start({"/photo/endless"}, "7z", "best");
+  const std::string id = bench.Start(bench.Prepare({"/photo/endless"}, "7z", "best"));
   PrintRow(
       "\"status\"",
       Compare([&] { return Seconds([&] { bench.Ask("status", id); }); },
@@ -199,7 +199,7 @@ void WorkerMemory(Workbench& bench) {
     bytes_of_paths += static_cast<double>(many.back().size());
   }
   for (const Strings& sources : {Strings{"/photo/endless"}, many}) {
-    const std::string id = bench.Start(sources, "zip", "best");
+    const std::string id = bench.Start(bench.Prepare(sources, "zip", "best"));
     pid_t worker = -1;
     for (const auto& entry : fs::directory_iterator("/proc")) {
       std::ifstream stat(entry.path() / "stat");

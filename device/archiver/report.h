@@ -37,7 +37,7 @@ class Report {
   void Percent(int percent);
 
   using Clock = std::chrono::steady_clock;
-  static constexpr std::chrono::microseconds kPausePerSource{10};
+  static constexpr std::chrono::microseconds kPausePerSource{20};
 
   const Cancel& cancel_;
   bool has_total_ = false;
