@@ -97,10 +97,13 @@ bool HasNoLinks(const char* path) {
       FileDescriptor(static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path, &how, sizeof how))));
 }
 
-bool HasDots(const std::string& path) { return path.find("/.") != std::string::npos; }
+// True of a path that no text stands for twice. Names that begin with a dot are left to following.
+bool IsPlain(const std::string& path) {
+  return path.find("/.") == std::string::npos && path.find("//") == std::string::npos;
+}
 
 int CheckPath(const char* path) {
-  const std::string followed = !HasDots(path) && HasNoLinks(path) ? path : FollowLinks(path);
+  const std::string followed = IsPlain(path) && HasNoLinks(path) ? path : FollowLinks(path);
   if (followed.empty()) {
     SetLastErrno(errno);
     return -1;
