@@ -67,6 +67,7 @@ bool ZantroCompressHandler::ReadStartParameters(KavoSettings& settings, StartPar
   if (!ReadDestination(start)) {
     return false;
   }
+  start.source_paths.reserve(source_list.size());
   for (const Json::Value& source : source_list) {
     start.source_paths.push_back(source.asString());
   }
