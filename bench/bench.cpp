@@ -6,9 +6,7 @@
 
 #include <algorithm>
 #include <chrono>
-#include <cstdio>
 #include <fstream>
-#include <iostream>
 #include <stdexcept>
 
 #include "device/bodies/device.h"

@@ -8,7 +8,6 @@
 #include <unistd.h>
 
 #include <cmath>
-#include <cstring>
 #include <fstream>
 #include <iomanip>
 #include <iostream>

@@ -17,7 +17,7 @@ namespace {
 constexpr char kReader[] = "reader";
 constexpr char kMemchr[] = "memchr";
 
-// What the archiver prints for a job of many files.
+// What an archiver that names each file prints for a job of many.
 const std::string& Lines() {
   static const std::string lines = [] {
     std::string text = "Total: 5000000000\n";

@@ -35,8 +35,8 @@ TEST(OutputParser, ReadsTheSameEventsHoweverTheOutputIsCut) {
   const std::string output =
       wiped("  0M Scan ") +
       "1 file, 9 bytes\n\nAdd new data to archive: 2 files, 5000000000 bytes\n" + wiped("  0%") +
-      wiped(" 7% + a/50%") + wiped(" 84% 1 U 1 + b") + "= kept\n" + wiped(" 99% 2 D gone") +
-      "\n  3% 12 + cut";
+      wiped(" 7% + a/50%") + wiped(" 84% 1 U 1 + b") + wiped(" 85% + c\b\b/d\b") + "= kept\n" +
+      wiped(" 99% 2 D gone") + "\n  3% 12 + cut";
   for (size_t step = 1; step <= output.size(); ++step) {
     OutputParser parser;
     std::string found;
@@ -48,7 +48,8 @@ TEST(OutputParser, ReadsTheSameEventsHoweverTheOutputIsCut) {
         found += ' ';
       }
     }
-    EXPECT_EQ(found, "T5000000000 P0 P7 Fa/50% P84 F1 + b P99 P3 ") << "in steps of " << step;
+    EXPECT_EQ(found, "T5000000000 P0 P7 Fa/50% P84 F1 + b P85 Fc\b\b/d\b P99 P3 ")
+        << "in steps of " << step;
   }
 }
 

@@ -38,6 +38,19 @@ std::string_view NameIn(std::string_view text) {
   return is_name ? text.substr(mark + 2) : std::string_view();
 }
 
+// The length of the text that `line` starts with and that is wiped right behind: as many
+// backspaces, blanks and backspaces. 0 while that is not complete. A name may hold backspaces of
+// its own.
+size_t WipedLength(std::string_view line) {
+  for (size_t at = line.find(kWipe); 4 * at <= line.size(); at = line.find(kWipe, at + 1)) {
+    const std::string back(at, kWipe);
+    if (line.substr(at, 3 * at) == back + std::string(at, ' ') + back) {
+      return at;
+    }
+  }
+  return 0;
+}
+
 }  // namespace
 
 std::vector<Event> OutputParser::Feed(const std::string& bytes) {
@@ -75,15 +88,11 @@ size_t OutputParser::TakeProgress(std::string_view line, std::vector<Event>* eve
     percent_seen_ = true;
     events->push_back({Event::Kind::kPercent, percent, {}});
   }
-  const std::string back(text.size(), kWipe);
-  const std::string wiping = back + std::string(text.size(), ' ') + back;
-  if (line.compare(text.size(), wiping.size(), wiping) != 0) {
-    return 0;
-  }
-  if (const std::string_view name = NameIn(text); !name.empty()) {
+  const size_t length = WipedLength(line);
+  if (const std::string_view name = NameIn(line.substr(0, length)); !name.empty()) {
     events->push_back({Event::Kind::kFile, 0, std::string(name)});
   }
-  return text.size() + wiping.size();
+  return 4 * length;
 }
 
 void OutputParser::TakeLine(const std::string& line, std::vector<Event>* events) {

@@ -97,9 +97,11 @@ bool HasNoLinks(const char* path) {
       FileDescriptor(static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path, &how, sizeof how))));
 }
 
-// True of a path that no text stands for twice. Names that begin with a dot are left to following.
+// True of an absolute path without ".", ".." and doubled slashes: with no links on the way, it is
+// what following it would give. Names that begin with a dot are left to following.
 bool IsPlain(const std::string& path) {
-  return path.find("/.") == std::string::npos && path.find("//") == std::string::npos;
+  return path[0] == '/' && path.find("/.") == std::string::npos &&
+         path.find("//") == std::string::npos;
 }
 
 int CheckPath(const char* path) {

@@ -37,6 +37,9 @@ bool StoredValue::IsNull() const { return text == kNull; }
 
 Json::Value StoredValue::Value() const {
   Json::Value value = Parse(text);
+  if (!IsObject()) {
+    return value;
+  }
   for (const auto& [name, member] : members) {
     value[name] = Parse(member);
   }

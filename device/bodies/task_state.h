@@ -14,7 +14,7 @@ struct Vesk::Task::State {
   // What is gathered or, else, stored; null when the task has none of that name.
   const Device::StoredValue& Find(const std::string& name) const;
   // Stores at once, or gathers when an update is open. False when it is not stored.
-  bool Set(const std::string& name, const Device::StoredValue& value);
+  bool Set(const std::string& name, Device::StoredValue value);
   // Stores what is gathered and closes the update. False, and a line logged, when it is not stored.
   bool Store(bool is_finished);
   // Stores these, and nothing that is gathered.

@@ -31,15 +31,21 @@ std::string StateOf(const std::string& user, const TaskRow& row) {
              : kTaskDead;
 }
 
-// What the task manager noted when the task was made: the request's own parameters can be large.
+// What the task manager noted when the task was made.
 Json::Value InfoOf(const TaskRow& row) {
   const Json::Value info = Property(row, kPropData).Member(row.id);
   return info.isObject() ? info : Json::Value(Json::objectValue);
 }
 
-Json::Value Destination(const Json::Value& info) {
-  const Json::Value& title = info["title"];
-  return title.isString() ? title : Json::Value("");
+// The task manager's note has it too, and is small; the request's parameters can be large.
+Json::Value Destination(const TaskRow& row) {
+  const Json::Value title = InfoOf(row)["title"];
+  if (title.isString()) {
+    return title;
+  }
+  const Json::Value params = Property(row, kPropData).Member("params");
+  const Json::Value dest = params.isObject() ? params["dest_file_path"] : Json::Value();
+  return dest.isString() ? dest : Json::Value("");
 }
 
 bool IsDead(const std::string& user, const TaskRow& row) { return StateOf(user, row) == kTaskDead; }
@@ -50,16 +56,15 @@ bool HasData(const TaskRow& row) { return Property(row, kPropData).IsObject(); }
 
 Json::Value TaskView(const std::string& user, const TaskRow& row) {
   const StoredValue& data = Property(row, kPropData);
-  const Json::Value info = InfoOf(row);
   const Json::Value progress = Property(row, "progress").Value();
   const Json::Value total_size = data.Member("total_size");
   Json::Value view(Json::objectValue);
   view["taskid"] = row.id;
-  view["dest_file_path"] = Destination(info);
+  view["dest_file_path"] = Destination(row);
   view["state"] = StateOf(user, row);
   view["progress"] = progress.isNumeric() ? progress.asDouble() : 0.0;
   view["total_size"] = total_size.isNull() ? Json::Value(0U) : total_size;
-  view["started"] = info.get("started", 0);
+  view["started"] = InfoOf(row).get("started", 0);
   if (data.HasMember(kDataErrors)) {
     view[kDataErrors] = data.Member(kDataErrors);
   }
@@ -77,13 +82,15 @@ void EndDeadTasks(const std::string& user) {
       continue;
     }
     Json::Value item(Json::objectValue);
-    item["path"] = Destination(InfoOf(*row));
+    item["path"] = Destination(*row);
     item["code"] = kErrArchive;
     Json::Value errors(Json::arrayValue);
     errors.append(item);
     StoredValue data = Property(*row, kPropData);
     data.members[kDataErrors] = ToText(errors);
-    StoreOf(user).UpdateTask(*row, {{kPropData, data}}, true);
+    std::map<std::string, StoredValue> properties;
+    properties.emplace(kPropData, std::move(data));
+    StoreOf(user).UpdateTask(*row, std::move(properties), true);
   }
 }
 

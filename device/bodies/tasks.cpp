@@ -73,12 +73,14 @@ const Device::StoredValue& Task::State::Find(const std::string& name) const {
   return found == row.properties.end() ? kNone : found->second;
 }
 
-bool Task::State::Set(const std::string& name, const Device::StoredValue& value) {
-  if (!is_updating) {
-    return StoreNow({{name, value}}, false);
+bool Task::State::Set(const std::string& name, Device::StoredValue value) {
+  if (is_updating) {
+    pending[name] = std::move(value);
+    return true;
   }
-  pending[name] = value;
-  return true;
+  std::map<std::string, Device::StoredValue> properties;
+  properties.emplace(name, std::move(value));
+  return StoreNow(std::move(properties), false);
 }
 
 bool Task::State::Store(bool is_finished) {
