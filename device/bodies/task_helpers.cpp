@@ -77,16 +77,6 @@ void RemoveStaleTasks(const std::string& user) {
   ForgetEndedWorkers(user, workers, named);
 }
 
-// The worker may end between two looks: what it stored last counts, so that a result is never
-// removed before it was reported.
-bool EndedWithoutResult(Vesk::Task::State& task, pid_t pid) {
-  if (pid <= 0 || IsWorkerAlive(task.user, pid)) {
-    return false;
-  }
-  task.Reload();
-  return !task.row.finished && !HoldsErrors(task.Get(kPropData));
-}
-
 }  // namespace
 }  // namespace Device
 
@@ -134,9 +124,9 @@ void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved) {
   Operation("LumoLibRemoveFinishedTask", task, pid, reserved).Run([&] {
     Vesk::Task::State* const state = task == nullptr ? nullptr : task->state;
     try {
+      // As the answer has it: of a worker that has ended since, the next one reports the end.
       if (state != nullptr &&
-          (state->row.finished || Device::HoldsErrors(state->Get(Device::kPropData)) ||
-           Device::EndedWithoutResult(*state, pid))) {
+          (state->row.finished || Device::HoldsErrors(state->Get(Device::kPropData)))) {
         state->Remove();
       }
     } catch (const std::exception& error) {

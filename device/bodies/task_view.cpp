@@ -1,5 +1,10 @@
 #include "device/bodies/task_view.h"
 
+#include <syslog.h>
+
+#include <stdexcept>
+#include <utility>
+
 #include "device/bodies/errors.h"
 #include "device/bodies/workers.h"
 
@@ -29,8 +34,9 @@ std::string StateOf(const std::string& user, const TaskRow& row, const Json::Val
     return "finished";
   }
   const pid_t pid = data["pid"].isInt() ? data["pid"].asInt() : -1;
-  return pid < 0 || IsWorkerAlive(user, pid) || IsBeingStopped(user, pid) ? kTaskRunning
-                                                                          : kTaskDead;
+  const bool has_worker = pid >= 0 && StoreOf(user).FindWorker(pid);
+  return has_worker && !IsWorkerAlive(user, pid) && !IsBeingStopped(user, pid) ? kTaskDead
+                                                                               : kTaskRunning;
 }
 
 Json::Value Destination(const Json::Value& data) {
@@ -64,23 +70,42 @@ Json::Value TaskView(const std::string& user, const TaskRow& row) {
   return view;
 }
 
-void EndDeadTasks(const std::string& user) {
-  for (const TaskRow& seen : StoreOf(user).AllTasks()) {
-    if (!IsDead(user, seen)) {
-      continue;
-    }
-    // What the worker stored last counts: it may have ended between the two looks.
-    std::optional<TaskRow> row = StoreOf(user).FindTask(seen.id);
-    if (!row || !IsDead(user, *row)) {
-      continue;
-    }
-    Json::Value data = DataOf(*row);
-    Json::Value item(Json::objectValue);
-    item["path"] = Destination(data);
-    item["code"] = kErrArchive;
-    data["errors"].append(item);
-    StoreOf(user).UpdateTask(*row, {{kPropData, &data}}, true);
+bool EndIfDead(const std::string& user, TaskRow& row) {
+  if (!IsDead(user, row)) {
+    return true;
   }
+  // What the worker stored last counts: it may have ended between the two looks.
+  if (!StoreOf(user).RefreshTask(row)) {
+    return false;
+  }
+  if (!IsDead(user, row)) {
+    return true;
+  }
+  const std::int64_t version = row.version;
+  Json::Value data = DataOf(row);
+  Json::Value item(Json::objectValue);
+  item["path"] = Destination(data);
+  item["code"] = kErrArchive;
+  data["errors"].append(item);
+  try {
+    StoreOf(user).UpdateTask(row, {{kPropData, &data}}, true);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "end of a killed worker: %s", error.what());
+    row.properties[kPropData] = data;
+    row.finished = true;
+    row.version = version;
+  }
+  return true;
+}
+
+std::vector<TaskRow> EndDeadTasks(const std::string& user) {
+  std::vector<TaskRow> rows;
+  for (TaskRow& row : StoreOf(user).AllTasks()) {
+    if (EndIfDead(user, row)) {
+      rows.push_back(std::move(row));
+    }
+  }
+  return rows;
 }
 
 }  // namespace Device

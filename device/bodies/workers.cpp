@@ -3,6 +3,7 @@
 #include <dirent.h>
 #include <poll.h>
 #include <sys/syscall.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -107,7 +108,8 @@ bool IsBeingStopped(const std::string& user, pid_t pid) {
   // From the first signal to the task's removal; a request that died meanwhile removes nothing.
   constexpr std::time_t kLongest = 30;
   const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
-  return worker && worker->stopped != 0 && std::time(nullptr) - worker->stopped < kLongest;
+  const std::time_t age = worker ? std::time(nullptr) - worker->stopped : kLongest;
+  return age >= 0 && age < kLongest;  // below when the clock was set back since
 }
 
 bool EndWorker(const std::string& user, pid_t pid) {
@@ -126,7 +128,11 @@ bool EndWorker(const std::string& user, pid_t pid) {
   if (error == ESRCH || !IsWorkerAlive(user, pid)) {
     return true;  // it has ended already, and an archiver that nobody reads from ends by itself
   }
-  StoreOf(user).NoteStop(pid);
+  try {
+    StoreOf(user).NoteStop(pid);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "stop: %s", error.what());  // a store without room stops no stop
+  }
   const Clock::time_point deadline = Clock::now() + kGrace;
   const bool is_told = has_descriptor
                            ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0
