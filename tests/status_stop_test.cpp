@@ -1,6 +1,6 @@
 // Following a job and ending it, from requests of their own.
+#include <sched.h>
 #include <sqlite3.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -116,7 +116,7 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
 TEST_F(TaskTest, AWorkerYieldsToAnswersAndIsReportedAsFailedWhenItIsKilled) {
   const std::string task_id = StartEndlessJob();
   ASSERT_TRUE(IsPacking());
-  EXPECT_EQ(getpriority(PRIO_PROCESS, static_cast<id_t>(Worker())), 19);
+  EXPECT_EQ(sched_getscheduler(Worker()), SCHED_IDLE);
   kill(Worker(), SIGKILL);
   ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
   const Json::Value answer = Ask("status", task_id).data;

@@ -1,7 +1,7 @@
 // Starting processes: the worker's fork, and programs by argument vector.
 #include <fcntl.h>
+#include <sched.h>
 #include <spawn.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <syslog.h>
@@ -30,7 +30,6 @@ namespace {
 
 constexpr char kArchiverProgram[] = "/usr/bin/7z";
 constexpr unsigned int kRunAndWait = 187;
-constexpr int kWorkerNiceness = 19;
 
 // Which process writes to a stream that KLIBCPopenv returned.
 std::map<FILE*, pid_t>& Streams() {
@@ -111,7 +110,8 @@ void BecomeWorker() {
   setpgid(0, 0);
   // Answers come before packing. In a session of its own it would yield to nobody: where the kernel
   // shares out time by sessions, the launcher would get no more than each job does.
-  setpriority(PRIO_PROCESS, 0, kWorkerNiceness);
+  const sched_param none{};
+  sched_setscheduler(0, SCHED_IDLE, &none);
   TheDevice().outcome.Close();
   const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   dup2(null.Get(), STDIN_FILENO);

@@ -47,9 +47,7 @@ class Watcher {
   }
 
   // One that is being stopped is looked at until its task is gone: the request may have died.
-  bool IsAtWork(pid_t pid) const {
-    return IsWorkerAlive(user_, pid) || IsBeingStopped(user_, pid);
-  }
+  bool IsAtWork(pid_t pid) const { return IsWorkerAlive(user_, pid) || IsBeingStopped(user_, pid); }
 
   // All tasks are read only when a worker has gone: they can be large.
   bool HasLostWorker() const {
