@@ -8,6 +8,7 @@
 #include <csignal>
 #include <filesystem>
 
+#include "device/bodies/json_text.h"
 #include "device/bodies/task_store.h"
 #include "device/bodies/workers.h"
 #include "tests/device_fixture.h"
@@ -113,17 +114,23 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
   EXPECT_TRUE(Group(Worker()).empty());
 }
 
-TEST_F(TaskTest, AWorkerYieldsToAnswersAndIsReportedAsFailedWhenItIsKilled) {
-  const std::string task_id = StartEndlessJob();
-  ASSERT_TRUE(IsPacking());
-  EXPECT_EQ(sched_getscheduler(Worker()), SCHED_IDLE);
-  kill(Worker(), SIGKILL);
-  ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
-  const Json::Value answer = Ask("status", task_id).data;
-  EXPECT_TRUE(answer["finished"].asBool());
-  EXPECT_EQ(answer["errors"][0]["path"], "/photo/z.7z");
-  EXPECT_EQ(answer["errors"][0]["code"], 1300);
-  EXPECT_EQ(Ask("status", task_id).code, 599);
+TEST_F(TaskTest, AJobYieldsToAnswersAndIsReportedAsFailedWhenItIsKilled) {
+  for (const bool is_worker_killed : {true, false}) {
+    Watch();
+    const std::string task_id = StartEndlessJob();
+    ASSERT_TRUE(IsPacking());
+    for (const pid_t pid : Group(Worker())) {
+      EXPECT_EQ(sched_getscheduler(pid), SCHED_IDLE);
+      if ((pid == Worker()) == is_worker_killed) {
+        kill(pid, SIGKILL);
+      }
+    }
+    ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
+    const Json::Value answer = Ask("status", task_id).data;
+    EXPECT_TRUE(answer["finished"].asBool());
+    EXPECT_EQ(Device::ToText(answer["errors"]), R"([{"code":1300,"path":"/photo/z.7z"}])");
+    EXPECT_EQ(Ask("status", task_id).code, 599);
+  }
 }
 
 // Of a "stop" that has died in the middle, in a time that the clock says is yet to come.

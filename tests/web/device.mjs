@@ -9,7 +9,7 @@ export const build = process.env.KAVO_BUILD;
 const program = path.join(build, 'kavo-device');
 export const isRoot = process.getuid() === 0;
 
-// Runs the program behind two folders with mounts and a small /tmp of its own, in which the two stay.
+// Runs the program behind two folders with mounts and a small /tmp of its own, where the two stay.
 const ownMounts = `
   mkdir -p "$1/tmp" && mount -t tmpfs -o mode=1777,size=8m tmp "$1/tmp" && for kept in "$1" "$2"; do
     case "$kept" in

@@ -1,8 +1,9 @@
-// Load and faults on served devices: storm.mjs [--short] [SEED] [NAME...]. One line for each storm; the
-// exit status tells whether all held. The seed of a run is printed, so that it can be repeated.
+// Load and faults on served devices: storm.mjs [--short] [SEED] [NAME...]. One line for each storm;
+// the exit status tells whether all held. The seed of a run is printed, so that it can be repeated.
 import { Device } from './device.mjs';
-import { archiverIsMissing, clockIsSetBack, killsAtRandom, storeIsDamaged, volumesAreFull } from
+import { archiverIsMissing, clockIsSetBack, storeIsDamaged, volumesAreFull } from
   './storm/faults.mjs';
+import { killsAtRandom } from './storm/kills.mjs';
 import { hoursOfUse, manyJobsAtOnce, stopsAtAnyMoment } from './storm/load.mjs';
 import { names, seed } from './storm/tools.mjs';
 

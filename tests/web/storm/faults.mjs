@@ -1,91 +1,17 @@
-// Faults: processes killed, volumes full or read-only, the archiver missing, the clock set back, the
-// store damaged.
-import { execFileSync } from 'node:child_process';
-import { chownSync, readFileSync, readdirSync, rmSync, statSync, writeFileSync } from 'node:fs';
+// Faults: volumes full or read-only, the archiver missing, the clock set back, the store damaged.
+import { readFileSync, readdirSync, rmSync, statSync, writeFileSync } from 'node:fs';
 import path from 'node:path';
 
-import { Client, Device, build, isRoot, listing, until } from '../device.mjs';
-import { addEndless, calmCheck, ended, follow, kill, moment, pick, processes, random, require, runJob, scale }
-  from './tools.mjs';
+import { Client, Device, build, isRoot, until } from '../device.mjs';
+import { addEndless, calmCheck, ended, follow, isFailure, kill, processes, random, require, runJob,
+  scale } from './tools.mjs';
 
 const longest = 60;  // seconds, of anything
-const signIn = (device) => until(() => Client.signIn(device, 'alice').catch(() => null));
-const isFailure = (end, dest) => JSON.stringify(end.errors) === `[{"code":1300,"path":"${dest}"}]`;
 const startEndless = async (device, client) => {
   const taskid = await client.start(['/photo/endless'], '/photo/endless.7z', { level: 'store' });
   await until(() => processes(device, '7z').length > 0);
   return taskid;
 };
-
-// What "status" may answer after processes of one kind were killed. A job that is as long as the storm
-// goes on, or has failed; one of the shorter ones may have ended and been reported meanwhile.
-function isAllowed(kind, isEndless, { code, data }) {
-  if (code === 599) {
-    return !isEndless;
-  }
-  const isHit = ['worker', 'archiver', '7z'].includes(kind);
-  return code === 0 && (data.errors ? isHit && isFailure(data, '/photo/old.7z')
-    : !data.finished || !isEndless);
-}
-
-export async function killsAtRandom() {
-  const device = await Device.start({ isolated: isRoot });
-  const isCalm = await calmCheck(device);
-  addEndless(device);
-  const archive = device.at('vol1/photo/old.7z');
-  execFileSync('7z', ['a', '-bso0', 'old.7z', 'cat.jpg'], { cwd: device.at('vol1/photo') });
-  if (isRoot) {
-    chownSync(archive, 65001, 65100);
-  }
-  const old = readFileSync(archive);
-  const both = [...new Set(['cat.jpg', ...listing(archive), 'trip'])];
-  const rounds = scale(200, 12);
-  const kinds = ['worker', 'archiver', '7z', 'request', 'front end', 'launcher'];
-  const counts = {};
-  for (let round = 0; round < rounds; ++round) {
-    const kind = kinds[round % kinds.length];
-    let client = await signIn(device);
-    const close = await follow(client);
-    const isEndless = random(2) === 0;
-    const taskid = await client.start([isEndless ? '/photo/endless' : '/photo/trip'],
-      '/photo/old.7z', { format: '7z', level: 'store' });
-    await moment(120);
-    const polling = client.call('status', { taskid }).catch(() => null);
-    await moment(4);
-    const killed = processes(device, kind).slice(0, 1 + random(2)).filter(({ pid }) => kill(pid));
-    counts[kind] = (counts[kind] ?? 0) + killed.length;
-    const polled = await polling;
-    await close();
-    require(polled === null || polled.code === undefined ||
-      isAllowed(kind, isEndless, polled), { kind, isEndless, polled });
-    if (kind === 'launcher') {
-      await device.ended;
-      await device.serve();
-    }
-    client = await signIn(device);
-    const mustFail = isEndless && killed.length > 0 && ['worker', 'archiver', '7z'].includes(kind);
-    const isReported = polled?.data?.finished ?? false;
-    await until(async () => {
-      const answer = await client.call('status', { taskid });
-      require(isAllowed(kind, isEndless && !isReported, answer), { kind, isEndless, answer });
-      return !mustFail || isReported || answer.data.errors;
-    });
-    require((await client.call('stop', { taskid })).code === 0, 'stop');
-    await until(() => !processes(device, '7z').length && !processes(device, 'worker').length);
-    execFileSync('/usr/bin/7z', ['t', archive]);
-    require(listing(archive).every((name) => both.includes(name.split('/')[0])) &&
-      listing(archive).includes('cat.jpg'), `${listing(archive)}`);
-    writeFileSync(archive, old);
-  }
-  // What an archiver that was killed has left, the next one of the same folder removes.
-  const client = await signIn(device);
-  await runJob(client, ['/photo/cat.jpg'], '/photo/last.7z');
-  await isCalm({ lists: rounds });
-  require((await client.tasks()).length === 0, 'tasks are left');
-  require(!device.log.includes('set aside'), 'a store was damaged');
-  await device.remove();
-  return `${rounds} rounds; killed ${Object.entries(counts).map((each) => each.join(' ')).join(', ')}`;
-}
 
 // Breaks something while a device is in use, looks at what it does, and mends it again.
 async function disturbed(rows) {
@@ -146,7 +72,8 @@ export const volumesAreFull = () => disturbed([{
   mends: 'rm "$1/users/alice/filler"',
   says: /task store .*full/,
   look: async (device, client, breaks) => {
-    const [stopped, killed] = [await startEndless(device, client), await startEndless(device, client)];
+    const stopped = await startEndless(device, client);
+    const killed = await startEndless(device, client);
     breaks();
     await refusesToStart(client);
     require((await client.tasks()).every(({ state }) => state === 'running'), 'a job has failed');
@@ -228,7 +155,7 @@ export async function clockIsSetBack() {
   processes(device, 'request').forEach(({ pid }) => kill(pid));
   await stopping;
   kill(deaf);
-  require(isFailure(await ended(client, lost), '/photo/endless.7z'), 'a job that was to be stopped');
+  require(isFailure(await ended(client, lost), '/photo/endless.7z'), 'a job to be stopped');
   const { started } = (await client.tasks()).find(({ taskid }) => taskid === done);
   const fresh = await client.start(['/photo/cat.jpg'], '/photo/fresh.zip');
   const task = await client.taskIn('finished', fresh);
@@ -244,7 +171,7 @@ export async function clockIsSetBack() {
     (await Client.signIn(device, 'alice', 'wrong')).signedIn.status === 429);
   writeFileSync(shift, days(-6));
   await until(async () => (await Client.signIn(device, 'alice')).signedIn.status === 200, 10);
-  require(tries <= 20 && (await client.tasks()).length === 0, `${tries} tries, or tasks that are left`);
+  require(tries <= 20 && (await client.tasks()).length === 0, `${tries} tries, or tasks are left`);
   await isCalm({ lists: 2 });
   await device.remove();
   return 'set back by three days and three more among running, stopped, killed and finished jobs';
@@ -261,7 +188,7 @@ export async function storeIsDamaged() {
     }
     return bytes;
   };
-  const damages = {  // by what each does to the bytes of a file, and whether that is sure to be seen
+  const damages = {  // what each does to the bytes of a file, and whether that is sure to be seen
     garbage: [file, (bytes) => noise(bytes, 0, bytes.length, 8 * bytes.length), true],
     header: [file, (bytes) => noise(bytes, 0, 16, 99), true],
     truncated: [file, (bytes) => bytes.subarray(0, 4096 + random(bytes.length - 4096)), true],

@@ -1,5 +1,5 @@
-// Asks the device at fixed times, from a thread of its own: a late answer puts off no later question,
-// and the storm's own work no answer. Tells first how long answers take when nothing else is asked.
+// Asks the device at fixed times, from a thread of its own: a late answer puts off no question, and
+// the storm's own work no answer. Tells first how long answers take when nothing else is asked.
 import { parentPort, workerData } from 'node:worker_threads';
 
 import { Client } from '../device.mjs';

@@ -54,9 +54,14 @@ export async function ended(client, taskid, seconds = 60) {
   return answer;
 }
 
+// The one error item of a job that has failed for no reason that has a code.
+export const isFailure = (end, dest) =>
+  JSON.stringify(end.errors) === `[{"code":1300,"path":"${dest}"}]`;
+
 // Opens an event stream, so that what jobs log reaches the device's log; returns what closes it.
 export async function follow(client) {
-  const { body } = await fetch(`${client.device.url}/events`, { headers: { Cookie: client.cookie } });
+  const headers = { Cookie: client.cookie };
+  const { body } = await fetch(`${client.device.url}/events`, { headers });
   return () => body.cancel().catch(() => {});
 }
 
@@ -70,7 +75,8 @@ export async function runJob(client, sources, dest, params = { level: 'store' })
 export function processes(device, kind) {
   const launcher = device.process.pid;
   const is = {
-    worker: ({ pid, group, args }) => pid === group && pid !== launcher && args.includes(device.folder),
+    worker: ({ pid, group, args }) =>
+      pid === group && pid !== launcher && args.includes(device.folder),
     archiver: ({ args }) => args.includes('-progress') && args.includes(device.folder),
     '7z': ({ args }) => args.startsWith('/usr/lib/p7zip') && args.includes(device.folder),
     request: ({ pid, parent, group, args }) => parent === launcher && pid !== group &&
@@ -113,9 +119,9 @@ function isLeft(device, name) {
   return execFileSync('find', [path.join(device.tmp, name), '-type', 'f']).length > 0;
 }
 
-// Of a device that nobody has asked yet. In the end nothing more may be there: no process, list, hidden
-// folder, lock but the launcher's, or descriptor. Folders of links are left on purpose, as many as jobs
-// have made, and lists where workers were killed.
+// Of a device that nobody has asked yet. In the end nothing more may be there: no process, list,
+// hidden folder, lock but the launcher's, or descriptor. Folders of links are left on purpose, as
+// many as jobs have made, and lists where workers were killed.
 export async function calmCheck(device) {
   const before = staged(device);
   const descriptors = () => footprints(device).map((each) => each.descriptors).join();
