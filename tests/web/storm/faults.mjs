@@ -191,7 +191,7 @@ export async function storeIsDamaged() {
   const damages = {  // what each does to the bytes of a file, and whether that is sure to be seen
     garbage: [file, (bytes) => noise(bytes, 0, bytes.length, 8 * bytes.length), true],
     header: [file, (bytes) => noise(bytes, 0, 16, 99), true],
-    truncated: [file, (bytes) => bytes.subarray(0, 4096 + random(bytes.length - 4096)), true],
+    truncated: [file, (bytes) => bytes.subarray(0, 4096 + random(bytes.length - 8191)), true],
     empty: [file, (bytes) => bytes.subarray(0, 0), false],
     bytes: [file, (bytes) => noise(bytes, 0, bytes.length, 1 + random(400)), false],
     log: [`${file}-wal`, (bytes) => noise(bytes, 0, bytes.length, 99), false],
