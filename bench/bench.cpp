@@ -34,12 +34,6 @@ void GiveToUser(const fs::path& path) {
   Require(geteuid() != 0 || chown(path.c_str(), kUid, Device::kUsersGroup) == 0, "chown");
 }
 
-std::string Format(const char* format, double value) {
-  char text[32];
-  std::snprintf(text, sizeof text, format, value);
-  return text;
-}
-
 }  // namespace
 
 double Seconds(const std::function<void()>& body) {
@@ -59,18 +53,6 @@ Medians Compare(const std::function<double()>& ours, const std::function<double(
     all_theirs.push_back(theirs());
   }
   return {Median(all_ours), Median(all_theirs)};
-}
-
-void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
-              double ratio, const std::string& limit) {
-  std::cout << "| " << what << " | " << ours << " | " << theirs << " | " << Format("%.2f", ratio)
-            << " | " << limit << " |" << std::endl;
-}
-
-void PrintRow(const std::string& what, const Medians& medians, const std::string& limit) {
-  constexpr double kMilli = 1000;
-  PrintRow(what, Format("%.4g ms", kMilli * medians.ours),
-           Format("%.4g ms", kMilli * medians.theirs), medians.ours / medians.theirs, limit);
 }
 
 void Require(bool holds, const std::string& what) {
@@ -109,8 +91,8 @@ Strings Workbench::AddFiles(const fs::path& folder, std::size_t count, std::size
   return names;
 }
 
-std::string Workbench::Start(const Strings& sources, const std::string& format,
-                             const std::string& level) {
+Device::Request Workbench::Prepare(const Strings& sources, const std::string& format,
+                                   const std::string& level) const {
   fs::remove(Share("photo") / "out");
   Json::Value list(Json::arrayValue);
   for (const std::string& source : sources) {
@@ -127,6 +109,10 @@ std::string Workbench::Start(const Strings& sources, const std::string& format,
   request.user = "alice";
   request.session_id = session_;
   request.is_followed = true;
+  return request;
+}
+
+std::string Workbench::Start(const Device::Request& request) {
   const Device::Outcome outcome = launcher_->Call(request);
   Require(outcome.code == 0, "start: " + std::to_string(outcome.code));
   return outcome.data["taskid"].asString();
@@ -144,7 +130,7 @@ Device::Outcome Workbench::Ask(const std::string& method, const std::string& tas
 }
 
 void Workbench::Finish(const std::string& task_id) {
-  constexpr std::chrono::milliseconds kPause(250);  // of a client that asks from time to time
+  constexpr std::chrono::seconds kPause(1);  // of a client that asks from time to time
   Device::Outcome outcome;
   while (!outcome.data["finished"].asBool()) {
     Device::Launcher::AwaitWorker(kPause);
@@ -154,7 +140,8 @@ void Workbench::Finish(const std::string& task_id) {
 }
 
 double Workbench::Job(const Strings& sources, const std::string& format, const std::string& level) {
-  return Seconds([&] { Finish(Start(sources, format, level)); });
+  const Device::Request request = Prepare(sources, format, level);
+  return Seconds([&] { Finish(Start(request)); });
 }
 
 double Workbench::Bare(const fs::path& folder, const Strings& names, Strings switches) {

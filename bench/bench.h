@@ -9,6 +9,7 @@
 #include <string>
 #include <vector>
 
+#include "bench/table.h"
 #include "device/host/launcher.h"
 
 namespace Bench {
@@ -16,21 +17,11 @@ namespace Bench {
 namespace fs = std::filesystem;
 using Strings = std::vector<std::string>;
 
-struct Medians {
-  double ours = 0;  // seconds
-  double theirs = 0;
-};
-
 // Runs both sides by turns, A B A B, after a first run of each that does not count. Each side
 // returns the seconds it took.
 Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
                 int pairs);
 double Seconds(const std::function<void()>& body);
-
-// Prints a row of the table.
-void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
-              double ratio, const std::string& limit);
-void PrintRow(const std::string& what, const Medians& medians, const std::string& limit);
 
 // Throws std::runtime_error that says what does not hold.
 void Require(bool holds, const std::string& what);
@@ -45,8 +36,11 @@ class Workbench {
   Strings AddFiles(const fs::path& folder, std::size_t count, std::size_t size,
                    bool is_sparse = false);
 
-  // Makes /photo/out of the sources; the task's id.
-  std::string Start(const Strings& sources, const std::string& format, const std::string& level);
+  // The request to make /photo/out, which is not there then, of the sources.
+  Device::Request Prepare(const Strings& sources, const std::string& format,
+                          const std::string& level) const;
+  // The task's id.
+  std::string Start(const Device::Request& request);
   Device::Outcome Ask(const std::string& method, const std::string& task_id);
   // Until "status" says finished. Throws when the job failed.
   void Finish(const std::string& task_id);

@@ -30,10 +30,9 @@ inline constexpr char kLogSource[] = "KAVO.Zantro.Compress";
 
 // What "start" has made of the request before it forks; the worker inherits it.
 struct StartParameters {
-  Json::Value source_list;                // array of texts
   std::string dest;                       // user path of the archive, without slashes at its end
   std::string codepage;                   // may be empty
-  std::vector<std::string> source_paths;  // source_list as texts
+  std::vector<std::string> source_paths;  // at least one
 };
 
 class ZantroCompressHandler final : public FileWebAPI {
@@ -72,9 +71,9 @@ class ZantroCompressHandler final : public FileWebAPI {
   void KillWorker();
 
   // The worker, worker.cpp. Lets no exception out and ends the process.
-  [[noreturn]] void RunWorker(const StartParameters& start, _tag_CompressInfo_& info) noexcept;
-  bool RunJob(const StartParameters& start, _tag_CompressInfo_& info) noexcept;
-  bool RunPipeline(const StartParameters& start, _tag_CompressInfo_& info);
+  [[noreturn]] void RunWorker(StartParameters& start, _tag_CompressInfo_& info) noexcept;
+  bool RunJob(StartParameters& start, _tag_CompressInfo_& info) noexcept;
+  bool RunPipeline(StartParameters& start, _tag_CompressInfo_& info);
   void StoreOutcome(bool succeeded, const std::string& dest);
 
   // The worker's steps. Zero or false means failed: the step has recorded its error items and

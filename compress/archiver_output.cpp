@@ -25,12 +25,12 @@ constexpr ErrorText kErrorTexts[] = {
 
 // What stands behind the prefix, null when the line does not begin with it.
 template <std::size_t kSize>
-const char* Behind(const std::string& line, const char (&prefix)[kSize]) {
+const char* Behind(std::string_view line, const char (&prefix)[kSize]) {
   constexpr std::size_t kLength = kSize - 1;
-  return line.compare(0, kLength, prefix) == 0 ? line.c_str() + kLength : nullptr;
+  return line.compare(0, kLength, prefix) == 0 ? line.data() + kLength : nullptr;
 }
 
-ArchiverError FindError(const std::string& line) {
+ArchiverError FindError(std::string_view line) {
   for (const ErrorText& row : kErrorTexts) {
     if (line.find(row.text) != std::string::npos) {
       return row.error;
@@ -41,7 +41,7 @@ ArchiverError FindError(const std::string& line) {
 
 }  // namespace
 
-ArchiverEvent ParseArchiverLine(const std::string& line) {
+ArchiverEvent ParseArchiverLine(std::string_view line) {
   constexpr int kDecimal = 10;
   ArchiverEvent event;
   if (const char* size = Behind(line, kTotalPrefix)) {
@@ -49,7 +49,7 @@ ArchiverEvent ParseArchiverLine(const std::string& line) {
     event.total_size = static_cast<std::uint64_t>(std::strtoll(size, nullptr, kDecimal));
   } else if (Behind(line, kFilePrefix) != nullptr) {
     event.kind = ArchiverEvent::kFile;
-    const std::string name = line.substr(sizeof(kFilePrefix) - 1);
+    const std::string name(line.substr(sizeof(kFilePrefix) - 1));
     // The last character alone, the line feed; deliberate.
     event.file = name.substr(name.length() - 1);
   } else if (const char* percent = Behind(line, kProgressPrefix)) {

@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <string>
+#include <string_view>
 
 namespace Zantro {
 
@@ -20,9 +21,10 @@ struct ArchiverEvent {
   ArchiverError error = ArchiverError::kUnknown;
 };
 
-// `line` is one line with its line feed, which the last one may lack. Throws std::out_of_range for
-// a "Compressing " line with nothing behind it, not even a line feed.
-ArchiverEvent ParseArchiverLine(const std::string& line);
+// `line` is one line with its line feed, which the last one may lack; a zero byte stands behind it,
+// as getline leaves it. Throws std::out_of_range for a "Compressing " line with nothing behind it,
+// not even a line feed.
+ArchiverEvent ParseArchiverLine(std::string_view line);
 
 }  // namespace Zantro
 

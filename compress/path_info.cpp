@@ -10,6 +10,9 @@ namespace Zantro {
 int ZantroCompressHandler::GeneratePathInfo(_tag_CompressInfo_& info) {
   int resolved = 1;
   PathInfo path_info;  // overwritten from source to source, not cleared
+  info.path_infos.reserve(info.src_paths.size());
+  info.src_names.reserve(info.src_paths.size());
+  info.src_dirs.reserve(info.src_paths.size());
   for (const std::string& source : info.src_paths) {
     resolved = PathInfoFactory::create(login_user.c_str(), source, path_info);
     if (resolved == 0) {

@@ -58,8 +58,8 @@ bool ZantroCompressHandler::ReadStartParameters(KavoSettings& settings, StartPar
     return false;
   }
   start.codepage = SettleCodepage(settings);
-  start.source_list = ExplodeParam(kParamPath, "");
-  if (start.source_list.empty()) {
+  const Json::Value source_list = ExplodeParam(kParamPath, "");
+  if (source_list.empty()) {
     syslog(LOG_ERR, "%s:%d Bad parameter: no input source file", kLogSource, __LINE__);
     SetError(kErrBadParameter);
     return false;
@@ -67,7 +67,8 @@ bool ZantroCompressHandler::ReadStartParameters(KavoSettings& settings, StartPar
   if (!ReadDestination(start)) {
     return false;
   }
-  for (const Json::Value& source : start.source_list) {
+  start.source_paths.reserve(source_list.size());
+  for (const Json::Value& source : source_list) {
     start.source_paths.push_back(source.asString());
   }
   return true;

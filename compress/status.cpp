@@ -23,8 +23,8 @@ int WorkerOf(const Json::Value& data) {
 Json::Value MakeAnswer(const Json::Value& data) {
   Json::Value answer(Json::objectValue);
   if (data.isMember(kDataParams)) {
-    answer[kParamDest] =
-        data.get(kDataParams, Json::Value(Json::objectValue)).get(kParamDest, "").asString();
+    const Json::Value& params = data[kDataParams];  // may be large
+    answer[kParamDest] = params.get(kParamDest, "").asString();
   }
   if (data.isMember(kDataErrors)) {
     // Errors alone decide: the worker may have failed to mark the task finished.

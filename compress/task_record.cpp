@@ -1,13 +1,16 @@
 #include "compress/task_record.h"
 
 #include <json/json.h>
+#include <malloc.h>
 #include <syslog.h>
 
 #include "compress/KAVO.Zantro.Compress.h"
 
 namespace Zantro {
 
-void WriteTaskProgress(const std::string& file, float progress, std::uint64_t total_size) {
+namespace {
+
+void StoreProgress(const std::string& file, float progress, std::uint64_t total_size) {
   pTask->reload();
   Json::Value data = pTask->getProperty(kPropData);
   if (data.isNull() || !data.isObject()) {
@@ -19,6 +22,14 @@ void WriteTaskProgress(const std::string& file, float progress, std::uint64_t to
   if (SaveTaskData(pTask, data, progress) == 0) {
     syslog(LOG_ERR, "%s:%d Failed to save task data", kLogSource, __LINE__);
   }
+}
+
+}  // namespace
+
+void WriteTaskProgress(const std::string& file, float progress, std::uint64_t total_size) {
+  StoreProgress(file, progress, total_size);
+  // The data of a job of many sources is large, and it may be long until the next progress.
+  malloc_trim(0);
 }
 
 }  // namespace Zantro

@@ -1,6 +1,7 @@
 // The background worker: takes on the user's identity, runs the job's steps, writes the outcome
 // into the task, notifies the desktop and leaves. It never returns into the host and never answers
 // a request; all that it has to say goes into the task and the log.
+#include <malloc.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -8,6 +9,7 @@
 #include <cstdlib>
 #include <exception>
 #include <optional>
+#include <utility>
 
 #include "compress/KAVO.Zantro.Compress.h"
 #include "compress/error_codes.h"
@@ -74,6 +76,15 @@ void EndProcessGroup(int signal_number) {
   }
 }
 
+// Once they are listed, nothing asks for the sources any more, and the archiver may run for hours.
+void ReleaseSources(_tag_CompressInfo_& info) {
+  for (std::vector<std::string>* texts : {&info.src_dirs, &info.src_names, &info.src_paths}) {
+    *texts = std::vector<std::string>();
+  }
+  info.path_infos = std::vector<PathInfo>();
+  malloc_trim(0);
+}
+
 void TellSuccess(const std::string& name, Json::Value& data) {
   if (pTask->getBoolProperty(kPropNotify, false)) {
     pTask->sendNotifyMessageNoEncode(kNotifyApp, pTask->getTaskId(), kNotifyTitle, kNotifyCompleted,
@@ -100,8 +111,7 @@ void TellFailure(const std::string& name, Json::Value& data) {
 
 }  // namespace
 
-void ZantroCompressHandler::RunWorker(const StartParameters& start,
-                                      _tag_CompressInfo_& info) noexcept {
+void ZantroCompressHandler::RunWorker(StartParameters& start, _tag_CompressInfo_& info) noexcept {
   std::signal(SIGTERM, EndProcessGroup);
   const bool succeeded = RunJob(start, info);
   try {
@@ -119,8 +129,7 @@ void ZantroCompressHandler::RunWorker(const StartParameters& start,
 
 // An exception out of a step, such as a request value that is no text, fails the job; it must not
 // reach the host's frames.
-bool ZantroCompressHandler::RunJob(const StartParameters& start,
-                                   _tag_CompressInfo_& info) noexcept {
+bool ZantroCompressHandler::RunJob(StartParameters& start, _tag_CompressInfo_& info) noexcept {
   try {
     WaitForTaskDataReady(pTask, kPropData, kDataWaitSeconds);
     // Packing an archive into itself is done already, deliberately.
@@ -137,7 +146,7 @@ bool ZantroCompressHandler::RunJob(const StartParameters& start,
   return false;
 }
 
-bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_CompressInfo_& info) {
+bool ZantroCompressHandler::RunPipeline(StartParameters& start, _tag_CompressInfo_& info) {
   const std::string session_id = request->GetSessionID();
   if (LumoLibUGIDSet(session_id.c_str(), login_user.c_str()) < 0) {
     syslog(LOG_ERR, "%s:%d Failed to set UGID for user=%s, sid=%s", kLogSource, __LINE__,
@@ -145,7 +154,7 @@ bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_Compr
     SetErrItem(start.dest, LumoLibGetErr());
     return false;
   }
-  info.src_paths = start.source_paths;
+  info.src_paths = std::move(start.source_paths);
   if (GeneratePathInfo(info) == 0) {
     syslog(LOG_ERR, "%s:%d Failed to generate path info", kLogSource, __LINE__);
     return false;
@@ -165,6 +174,7 @@ bool ZantroCompressHandler::RunPipeline(const StartParameters& start, _tag_Compr
   }
   const ListFileOwner list_file(info.list_file);
   held_back.reset();
+  ReleaseSources(info);
   info.dest_path = start.dest;
   info.codepage = start.codepage;
   LumoGetZipInfo(info);

@@ -70,25 +70,33 @@ TEST_F(StoreTest, ARowSeesWhatAnotherHasChangedMemberByMember) {
                                R"({"kept":2.5})"};
   for (const char* step : steps) {
     const Json::Value value = Device::ParseJson(step);
-    ASSERT_TRUE(store.UpdateTask(mine, {{"data", &value}}, false));
-    EXPECT_EQ(mine.properties["data"], value);
+    ASSERT_TRUE(store.UpdateTask(mine, {{"data", value}}, false));
+    EXPECT_EQ(mine.properties["data"].Value(), value);
     ASSERT_TRUE(store.RefreshTask(other));
-    EXPECT_EQ(other.properties["data"], value) << step;
-    EXPECT_EQ(store.FindTask(mine.id)->properties["data"], value) << step;
+    EXPECT_EQ(other.properties["data"].Value(), value) << step;
+    EXPECT_EQ(store.FindTask(mine.id)->properties["data"].Value(), value) << step;
   }
   // One that knows an old state only overwrites what it is told to, wholly.
   Device::TaskRow late;
   late.id = mine.id;
   const Json::Value value = Device::ParseJson(R"({"late":true})");
-  ASSERT_TRUE(store.UpdateTask(late, {{"data", &value}}, true));
+  ASSERT_TRUE(store.UpdateTask(late, {{"data", value}}, true));
   ASSERT_TRUE(store.RefreshTask(other));
-  EXPECT_EQ(other.properties["data"], value);
+  EXPECT_EQ(other.properties["data"].Value(), value);
   EXPECT_TRUE(other.finished);
   store.RemoveTask(mine.id);
   EXPECT_FALSE(store.RefreshTask(other));
   std::map<std::string, Device::TaskRow> rows = {{mine.id, mine}};
   store.RefreshTasks(rows);
   EXPECT_TRUE(rows.empty());
+}
+
+TEST_F(StoreTest, AValueThatIsDamagedIsNullAndSaidInALine) {
+  Device::StoredValue value(Device::ParseJson(R"({"whole":1,"torn":[2]})"));
+  value.members["torn"].resize(1);
+  Watch();
+  EXPECT_EQ(value.Value(), Device::ParseJson(R"({"whole":1,"torn":null})"));
+  EXPECT_EQ(Log().size(), 1U);
 }
 
 }  // namespace

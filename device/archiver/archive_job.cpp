@@ -75,6 +75,13 @@ std::vector<std::string> Sources(const Request& request) {
   return sources;
 }
 
+template <typename IsWanted>
+std::vector<std::string> Those(const std::vector<std::string>& sources, IsWanted is_wanted) {
+  std::vector<std::string> result;
+  std::copy_if(sources.begin(), sources.end(), std::back_inserter(result), is_wanted);
+  return result;
+}
+
 void Pack(const Request& request, PackRun run, const std::string& folder, const Cancel& cancel,
           Report& report) {
   const Device::FileDescriptor sources = UnnamedFile(run.sources.list);
@@ -93,14 +100,15 @@ void Pack(const Request& request, PackRun run, const std::string& folder, const 
 
 // The special files are left out of the main run and then added from harmless copies of them, so
 // that links end as links and the rest as empty files, as they do when 7z meets them on its own.
+// `suspects` are the sources that can be special or have some below them.
 void PackWithSpecials(const Request& request, PackRun run, std::vector<std::string> left_out,
-                      const std::vector<std::string>& sources, const WorkPlace& place,
+                      const std::vector<std::string>& sources,
+                      const std::vector<std::string>& suspects, const WorkPlace& place,
                       const Cancel& cancel, Report& report) {
-  const std::vector<std::string> specials = FindSpecials(place, sources, request.exclude);
+  const std::vector<std::string> specials = FindSpecials(place, suspects, request.exclude);
   const std::set<std::string> known(specials.begin(), specials.end());
-  std::vector<std::string> others;
-  std::copy_if(sources.begin(), sources.end(), std::back_inserter(others),
-               [&](const std::string& source) { return known.count(source) == 0; });
+  const std::vector<std::string> others =
+      Those(sources, [&](const std::string& source) { return known.count(source) == 0; });
   if (!others.empty()) {
     left_out.insert(left_out.end(), specials.begin(), specials.end());
     run.sources = DivideNames(others);
@@ -131,9 +139,12 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
   const bool recode = request.zip && !CodePage::IsUtf8(request.code_page);
   const auto page = recode ? std::make_unique<CodePage>(request.code_page) : nullptr;
   const std::vector<std::string> listed = Sources(request);
+  report.Pace(listed.size());
   const WorkPlace place = FindWorkPlace(listed, request.list_path);
-  CheckSources(place, listed);
-  const std::vector<std::string> sources = WithoutNested(listed);
+  const std::unordered_set<std::string> no_files = CheckSources(place, listed);
+  const std::vector<std::string> sources = WithoutNested(listed, no_files);
+  const std::vector<std::string> suspects =
+      Those(sources, [&](const std::string& source) { return no_files.count(source) != 0; });
   const ArchiveState seen = LookAtArchive(request.archive);
   const WorkFolder work(request.archive);
 
@@ -154,7 +165,7 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
     run.left_out = DivideNames(left_out);
     Pack(request, run, place.folder, cancel, report);
   } else {
-    PackWithSpecials(request, run, left_out, sources, place, cancel, report);
+    PackWithSpecials(request, run, left_out, sources, suspects, place, cancel, report);
   }
   if (page) {
     NamesToCodePage(*page, work.Result(), cancel);

@@ -1,6 +1,7 @@
 #include "device/archiver/list_file.h"
 
-#include <unordered_set>
+#include <algorithm>
+#include <string_view>
 
 #include "device/archiver/failure.h"
 
@@ -11,7 +12,7 @@ constexpr char kCannotPack[] = "cannot pack";
 
 // Calls `use` for each part of `text` between separators, the last one included.
 template <typename Use>
-void ForEachPart(const std::string& text, char separator, Use use) {
+void ForEachPart(std::string_view text, char separator, Use use) {
   for (size_t begin = 0; begin <= text.size();) {
     const size_t end = std::min(text.find(separator, begin), text.size());
     use(text.substr(begin, end - begin));
@@ -19,24 +20,28 @@ void ForEachPart(const std::string& text, char separator, Use use) {
   }
 }
 
-std::string Normalize(const std::string& line) {
+[[noreturn]] void Refuse(std::string_view line, const char* reason) {
+  throw NamedFailure(kCannotPack, std::string(line), reason);
+}
+
+std::string Normalize(std::string_view line) {
   if (line[0] == '/') {
-    throw NamedFailure(kCannotPack, line, "not relative to the working directory");
+    Refuse(line, "not relative to the working directory");
   }
   if (line.find('\0') != std::string::npos) {
-    throw NamedFailure(kCannotPack, line, "the name holds a zero byte");
+    Refuse(line, "the name holds a zero byte");
   }
   std::string path;
-  ForEachPart(line, '/', [&](const std::string& part) {
+  ForEachPart(line, '/', [&](std::string_view part) {
     if (part == "..") {
-      throw NamedFailure(kCannotPack, line, "leads out of the working directory");
+      Refuse(line, "leads out of the working directory");
     }
     if (!part.empty() && part != ".") {
-      path += (path.empty() ? "" : "/") + part;
+      path.append(path.empty() ? "" : "/").append(part);
     }
   });
   if (path.empty()) {
-    throw NamedFailure(kCannotPack, line, "the working directory itself is no source");
+    Refuse(line, "the working directory itself is no source");
   }
   return path;
 }
@@ -53,13 +58,15 @@ bool HasAncestorIn(const std::unordered_set<std::string>& names, const std::stri
 }  // namespace
 
 std::vector<std::string> ReadSources(const std::string& text, const std::string& list_path) {
+  const auto lines = static_cast<size_t>(std::count(text.begin(), text.end(), '\n')) + 1;
   std::vector<std::string> listed;
-  std::unordered_set<std::string> known;
-  ForEachPart(text, '\n', [&](const std::string& line) {
+  listed.reserve(lines);  // so that what `known` looks at stays in its place
+  std::unordered_set<std::string_view> known(lines);
+  ForEachPart(text, '\n', [&](std::string_view line) {
     if (!line.empty()) {
-      std::string path = Normalize(line);
-      if (known.insert(path).second) {
-        listed.push_back(std::move(path));
+      listed.push_back(Normalize(line));
+      if (!known.insert(listed.back()).second) {
+        listed.pop_back();
       }
     }
   });
@@ -69,11 +76,11 @@ std::vector<std::string> ReadSources(const std::string& text, const std::string&
   return listed;
 }
 
-std::vector<std::string> WithoutNested(const std::vector<std::string>& sources) {
-  const std::unordered_set<std::string> names(sources.begin(), sources.end());
+std::vector<std::string> WithoutNested(const std::vector<std::string>& sources,
+                                       const std::unordered_set<std::string>& folders) {
   std::vector<std::string> result;
   for (const std::string& source : sources) {
-    if (!HasAncestorIn(names, source)) {
+    if (folders.empty() || !HasAncestorIn(folders, source)) {
       result.push_back(source);
     }
   }

@@ -2,6 +2,7 @@
 #define DEVICE_ARCHIVER_LIST_FILE_H_
 
 #include <string>
+#include <unordered_set>
 #include <vector>
 
 namespace Archiver {
@@ -11,8 +12,10 @@ namespace Archiver {
 // for a list that names nothing. `list_path` serves messages only.
 std::vector<std::string> ReadSources(const std::string& text, const std::string& list_path);
 
-// Drops sources that lie in others, for 7z refuses to meet a file twice.
-std::vector<std::string> WithoutNested(const std::vector<std::string>& sources);
+// Drops sources that lie in others, for 7z refuses to meet a file twice. `folders` are those of the
+// sources that others can lie in.
+std::vector<std::string> WithoutNested(const std::vector<std::string>& sources,
+                                       const std::unordered_set<std::string>& folders);
 
 // Names as 7z takes them literally under -spd.
 struct NamesFor7z {

@@ -15,10 +15,10 @@ struct Event {
   std::string name;    // of a file
 };
 
-// Reads the standard output of "7z -bsp1": lines, with progress texts between them, five a second at
-// most, which 7z wipes by backspaces, blanks and backspaces before it goes on. They name the file
-// that it is at, cut in the middle when it is long. A line for each file would be had by -bb1, but
-// costs a job of many small files a twentieth of its time.
+// Reads the standard output of "7z -bsp1": lines, with progress texts between them, five a second
+// at most, which 7z wipes by backspaces, blanks and backspaces before it goes on. They name the
+// file that it is at, cut in the middle when it is long. A line for each file would be had by -bb1,
+// but costs a job of many small files a twentieth of its time.
 class OutputParser {
  public:
   // Takes the next bytes, however they were cut, and returns what they complete.

@@ -39,7 +39,11 @@ void Report::Compressing(const std::string& name) {
 }
 
 void Report::Progress(uint64_t percent) {
-  Percent(static_cast<int>(std::min<uint64_t>(percent, 99)));
+  const Clock::time_point now = Clock::now();
+  if (now >= next_percent_) {
+    next_percent_ = now + percent_pause_;
+    Percent(static_cast<int>(std::min<uint64_t>(percent, 99)));
+  }
 }
 
 void Report::Done() { Percent(100); }

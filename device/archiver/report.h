@@ -1,6 +1,7 @@
 #ifndef DEVICE_ARCHIVER_REPORT_H_
 #define DEVICE_ARCHIVER_REPORT_H_
 
+#include <chrono>
 #include <cstdint>
 #include <string>
 
@@ -8,8 +9,8 @@
 
 namespace Archiver {
 
-// The lines which the caller reads, each as soon as it is known; a caller that is slow to read holds
-// up the job but never its cancellation.
+// The lines which the caller reads, each as soon as it is known; a caller that is slow to read
+// holds up the job but never its cancellation.
 class Report {
  public:
   explicit Report(const Cancel& cancel) : cancel_(cancel) {}
@@ -20,6 +21,9 @@ class Report {
   void Compressing(const std::string& name);
   // Never goes backwards and leaves 100 to Done().
   void Progress(uint64_t percent);
+  // To be told before the first progress: each one costs the caller a look at what it knows of the
+  // job, which grows with the sources, so that of many come seldom.
+  void Pace(size_t sources) { percent_pause_ = sources * kPausePerSource; }
   // The archive stands under its final name.
   void Done();
   void Error(const std::string& reason);
@@ -32,9 +36,14 @@ class Report {
   void Line(const std::string& text);
   void Percent(int percent);
 
+  using Clock = std::chrono::steady_clock;
+  static constexpr std::chrono::microseconds kPausePerSource{20};
+
   const Cancel& cancel_;
   bool has_total_ = false;
   int percent_ = -1;
+  Clock::duration percent_pause_{};
+  Clock::time_point next_percent_;
   std::string name_;
 };
 

@@ -7,7 +7,7 @@
 #include <cstdlib>
 #include <memory>
 #include <set>
-#include <unordered_set>
+#include <string_view>
 
 #include "device/archiver/failure.h"
 #include "device/bodies/file_descriptor.h"
@@ -81,14 +81,19 @@ WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::stri
   return place;
 }
 
-void CheckSources(const WorkPlace& place, const std::vector<std::string>& sources) {
+std::unordered_set<std::string> CheckSources(const WorkPlace& place,
+                                             const std::vector<std::string>& sources) {
+  std::unordered_set<std::string> others;
   const Device::FileDescriptor folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  std::unordered_set<std::string> folders;
+  std::unordered_set<std::string_view> folders;
   struct stat info {};
   for (const std::string& source : sources) {
     for (size_t at = source.find('/'); at != std::string::npos; at = source.find('/', at + 1)) {
+      if (!folders.insert(std::string_view(source).substr(0, at)).second) {
+        continue;
+      }
       const std::string parent = source.substr(0, at);
-      if (place.shares.count(parent) == 0 && folders.insert(parent).second &&
+      if (place.shares.count(parent) == 0 &&
           fstatat(folder.Get(), parent.c_str(), &info, AT_SYMLINK_NOFOLLOW) == 0 &&
           S_ISLNK(info.st_mode)) {
         throw NamedFailure(kCannotPack, source, "it lies behind a symbolic link");
@@ -97,7 +102,11 @@ void CheckSources(const WorkPlace& place, const std::vector<std::string>& source
     if (fstatat(folder.Get(), source.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
       throw SystemFailure(kCannotPack, source, errno);
     }
+    if (!S_ISREG(info.st_mode)) {
+      others.insert(source);
+    }
   }
+  return others;
 }
 
 std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& path) {

@@ -3,6 +3,7 @@
 
 #include <map>
 #include <string>
+#include <unordered_set>
 #include <vector>
 
 namespace Archiver {
@@ -23,7 +24,9 @@ WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::stri
 
 // Throws Failure for a source that is missing or lies behind a link other than those of a staging
 // folder. 7z overlooks both when the name has a '*' or '?', for all that it matches literally.
-void CheckSources(const WorkPlace& place, const std::vector<std::string>& sources);
+// The result: those that are no plain files.
+std::unordered_set<std::string> CheckSources(const WorkPlace& place,
+                                             const std::vector<std::string>& sources);
 
 // The names, relative to the place, under which 7z can come across `path`, an absolute one.
 std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& path);

@@ -77,8 +77,11 @@ Json::Value ParseJson(const std::string& text, int depth) {
   return value;
 }
 
-std::string DecodeByteEscapes(const std::string& json) {
+std::string DecodeByteEscapes(std::string json) {
   constexpr std::size_t kEscape = sizeof "\\udc80" - 1;
+  if (json.find("\\u") == std::string::npos) {
+    return json;
+  }
   const auto code_at = [&](std::size_t at) {
     const bool is_escape = at + kEscape <= json.size() && json[at] == '\\' && json[at + 1] == 'u';
     const std::string digits = is_escape ? json.substr(at + 2, kEscape - 2) : "";

@@ -237,7 +237,7 @@ void Operation::Trace(const Json::Value& result) const {
   Json::Value line(Json::objectValue);
   line["pid"] = getpid();
   line["call"] = name_;
-  line["args"] = arguments_;
+  line["args"] = arguments_.isNull() ? Json::Value(Json::arrayValue) : arguments_;
   line["result"] = result;
   const std::string text = ToText(line) + "\n";
   // One write per line, so that processes do not mix theirs. A trace that cannot be written is

@@ -155,7 +155,7 @@ class Operation {
   void Trace(const Json::Value& result) const;
 
   const char* name_;
-  Json::Value arguments_{Json::arrayValue};
+  Json::Value arguments_;  // an array, null as long as it is empty
   const Fault* fault_ = nullptr;
 };
 

@@ -1,12 +1,20 @@
 #include "device/bodies/paths.h"
 
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
 #include <algorithm>
 #include <climits>
 #include <cstdlib>
 #include <cstring>
 #include <memory>
+#include <string_view>
+#include <utility>
 
 #include "device/bodies/errors.h"
+#include "device/bodies/file_descriptor.h"
 #include "device/bodies/operations.h"
 #include "platform/lumo/file_manager.h"
 
@@ -18,11 +26,11 @@ constexpr std::size_t kNameMax = 255;  // bytes
 constexpr std::size_t kEncryptedNameMax = 143;
 
 // The path's parts. False when ".." leads above the first of them, the shared folder.
-bool SplitPath(const std::string& path, std::vector<std::string>& parts) {
+bool SplitPath(std::string_view path, std::vector<std::string_view>& parts) {
   std::size_t begin = 0;
   while (begin < path.size()) {
     const std::size_t end = std::min(path.find('/', begin), path.size());
-    const std::string part = path.substr(begin, end - begin);
+    const std::string_view part = path.substr(begin, end - begin);
     begin = end + 1;
     if (part == "..") {
       if (parts.size() <= 1) {
@@ -78,8 +86,24 @@ bool IsOnVolumes(const std::string& path) {
                      [&](const std::string& volume) { return IsWithin(path, volume); });
 }
 
+// True of a file that is there and has no link on the way to it: what its path says is where it
+// lies. One call of the kernel's, where following takes one for each part of the path. False where
+// the kernel does not know it.
+bool HasNoLinks(const char* path) {
+  open_how how{};
+  how.flags = O_PATH | O_CLOEXEC;
+  how.resolve = RESOLVE_NO_SYMLINKS;
+  return static_cast<bool>(
+      FileDescriptor(static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path, &how, sizeof how))));
+}
+
+// True of a path that no text stands for twice. Names that begin with a dot are left to following.
+bool IsPlain(const std::string& path) {
+  return path.find("/.") == std::string::npos && path.find("//") == std::string::npos;
+}
+
 int CheckPath(const char* path) {
-  const std::string followed = FollowLinks(path);
+  const std::string followed = IsPlain(path) && HasNoLinks(path) ? path : FollowLinks(path);
   if (followed.empty()) {
     SetLastErrno(errno);
     return -1;
@@ -120,7 +144,7 @@ std::string CommonFolder(const std::string& one, const std::string& other) {
 
 ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const std::string& path) {
   ResolvedPath resolved;
-  std::vector<std::string> parts;
+  std::vector<std::string_view> parts;
   if (path.empty() || path[0] != '/' || path.find('\0') != std::string::npos) {
     resolved.error = kErrBadName;
   } else if (path.size() >= PATH_MAX) {
@@ -132,11 +156,11 @@ ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const st
   } else {
     resolved.share_name = parts.front();
     resolved.error = FindShareFolder(device, user, resolved) ? 0 : kErrNotFound;
-    resolved.user_path = "/" + parts.front();
+    resolved.user_path = "/" + resolved.share_name;
     resolved.real_path = resolved.share_real_path;
     for (std::size_t part = 1; part < parts.size(); ++part) {
-      resolved.user_path += "/" + parts[part];
-      resolved.real_path += "/" + parts[part];
+      resolved.user_path.append("/").append(parts[part]);
+      resolved.real_path.append("/").append(parts[part]);
     }
     if (resolved.error == 0 && resolved.real_path.size() >= PATH_MAX) {
       resolved.error = kErrNameTooLong;
@@ -187,12 +211,12 @@ int PathInfoFactory::create(const char* user, const std::string& path, PathInfo&
       Device::SetLastError(resolved.error);
       return 0;
     }
-    out.share_path = resolved.user_path;
     out.aux_1 = resolved.user_path.substr(1 + resolved.share_name.size());
-    out.real_path = resolved.real_path;
-    out.share_name = resolved.share_name;
-    out.volume_path = resolved.volume_path;
-    out.share_real_path = resolved.share_real_path;
+    out.share_path = std::move(resolved.user_path);
+    out.real_path = std::move(resolved.real_path);
+    out.share_name = std::move(resolved.share_name);
+    out.volume_path = std::move(resolved.volume_path);
+    out.share_real_path = std::move(resolved.share_real_path);
     out.aux_6 = user;
     return 1;
   });

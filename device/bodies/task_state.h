@@ -4,8 +4,6 @@
 #ifndef DEVICE_BODIES_TASK_STATE_H_
 #define DEVICE_BODIES_TASK_STATE_H_
 
-#include <json/json.h>
-
 #include <map>
 #include <string>
 
@@ -13,14 +11,14 @@
 #include "platform/vesk/task_manager.h"
 
 struct Vesk::Task::State {
-  // Null when the task has none of that name.
-  Json::Value Get(const std::string& name) const;
+  // What is gathered or, else, stored; null when the task has none of that name.
+  const Device::StoredValue& Find(const std::string& name) const;
   // Stores at once, or gathers when an update is open. False when it is not stored.
-  bool Set(const std::string& name, const Json::Value& value);
+  bool Set(const std::string& name, const Device::StoredValue& value);
   // Stores what is gathered and closes the update. False, and a line logged, when it is not stored.
   bool Store(bool is_finished);
   // Stores these, and nothing that is gathered.
-  bool StoreNow(const std::map<std::string, const Json::Value*>& properties, bool is_finished);
+  bool StoreNow(std::map<std::string, Device::StoredValue> properties, bool is_finished);
   // False when the task was removed meanwhile; it has no properties then. A store that cannot be
   // read is logged and leaves the task as it was known.
   bool Reload();
@@ -32,7 +30,7 @@ struct Vesk::Task::State {
   std::string user;
   Device::TaskRow row;
   bool is_updating = false;
-  std::map<std::string, Json::Value> pending;
+  std::map<std::string, Device::StoredValue> pending;
 };
 
 #endif  // DEVICE_BODIES_TASK_STATE_H_

@@ -44,7 +44,7 @@ TaskStore::TaskStore(const std::string& user)
     : database_(TheDevice().StateFolder(user) + "/store.db", kSchema, kSchemaVersion) {}
 
 void TaskStore::AddTask(TaskRow& row) {
-  const std::map<std::string, Json::Value> properties = std::exchange(row.properties, {});
+  const std::map<std::string, StoredValue> properties = std::exchange(row.properties, {});
   database_.InTransaction(kForWriting, [&] {
     row.updated = std::time(nullptr);
     row.version = 1;
@@ -60,45 +60,35 @@ void TaskStore::AddTask(TaskRow& row) {
 }
 
 void TaskStore::WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
-                            const Json::Value* value) {
+                            const std::string* text) {
   Statement insert(database_, "INSERT OR REPLACE INTO members VALUES (?, ?, ?, ?, ?)");
   insert.Bind(row.id).Bind(name).Bind(member);
-  if (value == nullptr) {
+  if (text == nullptr) {
     insert.BindNull();
   } else {
-    insert.Bind(ToText(*value));
+    insert.Bind(*text);
   }
   insert.Bind(row.version).Step();
 }
 
-void TaskStore::WriteProperty(TaskRow& row, const std::string& name, const Json::Value& value) {
-  const bool is_known = row.properties.count(name) != 0;
-  Json::Value& known = row.properties[name];
-  for (const std::string& member :
-       known.isObject() ? known.getMemberNames() : Json::Value::Members()) {
-    if (!value.isObject() || !value.isMember(member)) {
+void TaskStore::WriteProperty(TaskRow& row, const std::string& name, StoredValue value) {
+  const bool is_new = row.properties.count(name) == 0;
+  StoredValue& known = row.properties[name];
+  if (is_new || known.text != value.text) {
+    WriteMember(row, name, kWhole, &value.text);
+  }
+  for (const auto& [member, text] : known.members) {
+    if (!value.HasMember(member)) {
       WriteMember(row, name, kMemberMark + member, nullptr);
-      known.removeMember(member);
     }
   }
-  if (!value.isObject()) {
-    if (!is_known || known != value) {
-      WriteMember(row, name, kWhole, &value);
-      known = value;
-    }
-    return;
-  }
-  if (!known.isObject()) {
-    known = Json::Value(Json::objectValue);
-    WriteMember(row, name, kWhole, &known);
-  }
-  for (auto member = value.begin(); member != value.end(); ++member) {
-    const std::string key = member.name();
-    if (!known.isMember(key) || known[key] != *member) {
-      WriteMember(row, name, kMemberMark + key, &*member);
-      known[key] = *member;
+  for (const auto& [member, text] : value.members) {
+    const auto found = known.members.find(member);
+    if (found == known.members.end() || found->second != text) {
+      WriteMember(row, name, kMemberMark + member, &text);
     }
   }
+  known = std::move(value);
 }
 
 bool TaskStore::ReadChanges(TaskRow& row) {
@@ -111,19 +101,15 @@ bool TaskStore::ReadChanges(TaskRow& row) {
                     "ORDER BY name, member");
   changes.Bind(row.id).Bind(row.version);
   while (changes.Step()) {
-    Json::Value& property = row.properties[changes.Text(0)];
+    StoredValue& property = row.properties[changes.Text(0)];
     const std::string member = changes.Text(1);
     if (member == kWhole) {
-      const Json::Value value = ParseJson(changes.Text(2));
-      if (!value.isObject() || !property.isObject()) {
-        property = value;
-      }
-    } else if (!property.isObject()) {
-      continue;  // members that went with the object
+      property.text = changes.Text(2);
+      property.members.clear();
     } else if (const std::string key = member.substr(sizeof kMemberMark); changes.IsNull(2)) {
-      property.removeMember(key);
+      property.members.erase(key);
     } else {
-      property[key] = ParseJson(changes.Text(2));
+      property.members[key] = changes.Text(2);
     }
   }
   row.finished = task.Number(0) != 0;
@@ -172,8 +158,7 @@ std::vector<TaskRow> TaskStore::AllTasks() {
   return all;
 }
 
-bool TaskStore::UpdateTask(TaskRow& row,
-                           const std::map<std::string, const Json::Value*>& properties,
+bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> properties,
                            bool finished) {
   bool is_found = false;
   database_.InTransaction(kForWriting, [&] {
@@ -190,8 +175,8 @@ bool TaskStore::UpdateTask(TaskRow& row,
         .Bind(row.version)
         .Bind(row.id)
         .Step();
-    for (const auto& [name, value] : properties) {
-      WriteProperty(row, name, *value);
+    for (auto& [name, value] : properties) {
+      WriteProperty(row, name, std::move(value));
     }
   });
   return is_found;

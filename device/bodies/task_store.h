@@ -3,7 +3,6 @@
 #ifndef DEVICE_BODIES_TASK_STORE_H_
 #define DEVICE_BODIES_TASK_STORE_H_
 
-#include <json/json.h>
 #include <sys/types.h>
 
 #include <cstdint>
@@ -13,6 +12,7 @@
 #include <vector>
 
 #include "device/bodies/database.h"
+#include "device/bodies/stored_value.h"
 
 namespace Device {
 
@@ -22,7 +22,7 @@ struct TaskRow {
   bool finished = false;
   std::int64_t updated = 0;  // seconds since 1970
   std::int64_t version = 0;  // grows with every change
-  std::map<std::string, Json::Value> properties;
+  std::map<std::string, StoredValue> properties;
 };
 
 // A worker process. By its start time, one that has taken over its process id is not mistaken for
@@ -59,8 +59,7 @@ class TaskStore {
   void RefreshTasks(std::map<std::string, TaskRow>& rows);
   // Stores the properties and the finished state together, and brings the row up to date. Only what
   // differs from the store is written. False when there is no such task.
-  bool UpdateTask(TaskRow& row, const std::map<std::string, const Json::Value*>& properties,
-                  bool finished);
+  bool UpdateTask(TaskRow& row, std::map<std::string, StoredValue> properties, bool finished);
   void RemoveTask(const std::string& id);
 
   void AddWorker(pid_t pid, std::uint64_t start_time);
@@ -83,9 +82,9 @@ class TaskStore {
  private:
   // Within a transaction.
   bool ReadChanges(TaskRow& row);
-  void WriteProperty(TaskRow& row, const std::string& name, const Json::Value& value);
+  void WriteProperty(TaskRow& row, const std::string& name, StoredValue value);
   void WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
-                   const Json::Value* value);
+                   const std::string* text);
 
   Database database_;
 };

@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "device/bodies/errors.h"
+#include "device/bodies/json_text.h"
 #include "device/bodies/workers.h"
 
 namespace Device {
@@ -13,59 +14,60 @@ namespace Device {
 namespace {
 
 constexpr char kPropData[] = "data";
+constexpr char kDataErrors[] = "errors";
 
-const Json::Value& Property(const TaskRow& row, const std::string& name) {
+const StoredValue& Property(const TaskRow& row, const std::string& name) {
+  static const StoredValue kNone;
   const auto found = row.properties.find(name);
-  return found == row.properties.end() ? Json::Value::nullSingleton() : found->second;
+  return found == row.properties.end() ? kNone : found->second;
 }
 
-// The task's data; an empty object as long as there is none.
-const Json::Value& DataOf(const TaskRow& row) {
-  static const Json::Value kNone(Json::objectValue);
-  const Json::Value& data = Property(row, kPropData);
-  return data.isObject() ? data : kNone;
-}
-
-std::string StateOf(const std::string& user, const TaskRow& row, const Json::Value& data) {
-  if (data.isMember("errors")) {
+std::string StateOf(const std::string& user, const TaskRow& row) {
+  const StoredValue& data = Property(row, kPropData);
+  if (data.HasMember(kDataErrors)) {
     return "failed";
   }
   if (row.finished) {
     return "finished";
   }
-  const pid_t pid = data["pid"].isInt() ? data["pid"].asInt() : -1;
-  const bool has_worker = pid >= 0 && StoreOf(user).FindWorker(pid);
-  return has_worker && !IsWorkerAlive(user, pid) && !IsBeingStopped(user, pid) ? kTaskDead
-                                                                               : kTaskRunning;
+  const Json::Value pid = data.Member("pid");
+  const bool has_worker = pid.isInt() && StoreOf(user).FindWorker(pid.asInt());
+  return has_worker && !IsWorkerAlive(user, pid.asInt()) && !IsBeingStopped(user, pid.asInt())
+             ? kTaskDead
+             : kTaskRunning;
 }
 
-Json::Value Destination(const Json::Value& data) {
-  const Json::Value& params = data["params"];
-  const Json::Value dest = params.isObject() ? params["dest_file_path"] : Json::Value();
-  return dest.isString() ? dest : Json::Value("");
+// What the task manager noted when the task was made: the request's own parameters can be large.
+Json::Value InfoOf(const TaskRow& row) {
+  const Json::Value info = Property(row, kPropData).Member(row.id);
+  return info.isObject() ? info : Json::Value(Json::objectValue);
 }
 
-bool IsDead(const std::string& user, const TaskRow& row) {
-  return StateOf(user, row, DataOf(row)) == kTaskDead;
+Json::Value Destination(const Json::Value& info) {
+  const Json::Value& title = info["title"];
+  return title.isString() ? title : Json::Value("");
 }
+
+bool IsDead(const std::string& user, const TaskRow& row) { return StateOf(user, row) == kTaskDead; }
 
 }  // namespace
 
-bool HasData(const TaskRow& row) { return Property(row, kPropData).isObject(); }
+bool HasData(const TaskRow& row) { return Property(row, kPropData).IsObject(); }
 
 Json::Value TaskView(const std::string& user, const TaskRow& row) {
-  const Json::Value& data = DataOf(row);
-  const Json::Value& progress = Property(row, "progress");
-  const Json::Value& info = data[row.id];
+  const StoredValue& data = Property(row, kPropData);
+  const Json::Value info = InfoOf(row);
+  const Json::Value progress = Property(row, "progress").Value();
+  const Json::Value total_size = data.Member("total_size");
   Json::Value view(Json::objectValue);
   view["taskid"] = row.id;
-  view["dest_file_path"] = Destination(data);
-  view["state"] = StateOf(user, row, data);
+  view["dest_file_path"] = Destination(info);
+  view["state"] = StateOf(user, row);
   view["progress"] = progress.isNumeric() ? progress.asDouble() : 0.0;
-  view["total_size"] = data.get("total_size", 0U);
-  view["started"] = info.isObject() ? info.get("started", 0) : Json::Value(0);
-  if (data.isMember("errors")) {
-    view["errors"] = data["errors"];
+  view["total_size"] = total_size.isNull() ? Json::Value(0U) : total_size;
+  view["started"] = info.get("started", 0);
+  if (data.HasMember(kDataErrors)) {
+    view[kDataErrors] = data.Member(kDataErrors);
   }
   return view;
 }
@@ -82,13 +84,15 @@ bool EndIfDead(const std::string& user, TaskRow& row) {
     return true;
   }
   const std::int64_t version = row.version;
-  Json::Value data = DataOf(row);
   Json::Value item(Json::objectValue);
-  item["path"] = Destination(data);
+  item["path"] = Destination(InfoOf(row));
   item["code"] = kErrArchive;
-  data["errors"].append(item);
+  Json::Value errors(Json::arrayValue);
+  errors.append(item);
+  StoredValue data = Property(row, kPropData);
+  data.members[kDataErrors] = ToText(errors);
   try {
-    StoreOf(user).UpdateTask(row, {{kPropData, &data}}, true);
+    StoreOf(user).UpdateTask(row, {{kPropData, data}}, true);
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "end of a killed worker: %s", error.what());
     row.properties[kPropData] = data;

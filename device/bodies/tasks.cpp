@@ -64,18 +64,19 @@ auto LogAndThrow(const char* operation, Body body) {
 
 }  // namespace
 
-Json::Value Task::State::Get(const std::string& name) const {
+const Device::StoredValue& Task::State::Find(const std::string& name) const {
+  static const Device::StoredValue kNone;
   const auto gathered = pending.find(name);
   if (gathered != pending.end()) {
     return gathered->second;
   }
   const auto found = row.properties.find(name);
-  return found == row.properties.end() ? Json::Value() : found->second;
+  return found == row.properties.end() ? kNone : found->second;
 }
 
-bool Task::State::Set(const std::string& name, const Json::Value& value) {
+bool Task::State::Set(const std::string& name, const Device::StoredValue& value) {
   if (!is_updating) {
-    return StoreNow({{name, &value}}, false);
+    return StoreNow({{name, value}}, false);
   }
   pending[name] = value;
   return true;
@@ -83,18 +84,13 @@ bool Task::State::Set(const std::string& name, const Json::Value& value) {
 
 bool Task::State::Store(bool is_finished) {
   is_updating = false;
-  const std::map<std::string, Json::Value> gathered = std::exchange(pending, {});
-  std::map<std::string, const Json::Value*> properties;
-  for (const auto& [name, value] : gathered) {
-    properties[name] = &value;
-  }
-  return StoreNow(properties, is_finished);
+  return StoreNow(std::exchange(pending, {}), is_finished);
 }
 
-bool Task::State::StoreNow(const std::map<std::string, const Json::Value*>& properties,
+bool Task::State::StoreNow(std::map<std::string, Device::StoredValue> properties,
                            bool is_finished) {
   try {
-    return Device::StoreOf(user).UpdateTask(row, properties, is_finished);
+    return Device::StoreOf(user).UpdateTask(row, std::move(properties), is_finished);
   } catch (const std::exception& error) {
     LogFailure("store task", error);
     Forget();
@@ -138,7 +134,7 @@ Task::Task(const char* user, const char* task_id) : state(nullptr) {
     task_state->user = user;
     task_state->row.id = task_id;
     // When nobody watches the task, the desktop is to be told of its end.
-    task_state->row.properties[kPropNotify] = !Device::TheDevice().is_followed;
+    task_state->row.properties[kPropNotify] = Json::Value(!Device::TheDevice().is_followed);
     LogAndThrow("make task", [&] { Device::StoreOf(user).AddTask(task_state->row); });
     state = task_state.release();
   });
@@ -167,19 +163,19 @@ bool Task::setProperty(const char* name, const Json::Value& value) {
 }
 
 Json::Value Task::getProperty(const char* name) const {
-  return Operation("Vesk::Task::getProperty", name).Run([&] { return state->Get(name); });
+  return Operation("Vesk::Task::getProperty", name).Run([&] { return state->Find(name).Value(); });
 }
 
 bool Task::getBoolProperty(const char* name, bool fallback) const {
   return Operation("Vesk::Task::getBoolProperty", name, fallback).Run([&] {
-    const Json::Value value = state->Get(name);
+    const Json::Value value = state->Find(name).Value();
     return value.isBool() ? value.asBool() : fallback;
   });
 }
 
 double Task::getDoubleProperty(const char* name, double fallback) const {
   return Operation("Vesk::Task::getDoubleProperty", name, fallback).Run([&] {
-    const Json::Value value = state->Get(name);
+    const Json::Value value = state->Find(name).Value();
     return value.isNumeric() ? value.asDouble() : fallback;
   });
 }

@@ -2,6 +2,7 @@
 #include <algorithm>
 #include <cctype>
 #include <cstring>
+#include <utility>
 
 #include "device/bodies/json_text.h"
 #include "device/bodies/operations.h"
@@ -28,10 +29,10 @@ Json::Value SplitText(const std::string& text, const std::string& separator) {
 }
 
 // The array itself when every element is a text that can be a path, else an empty one.
-Json::Value OnlyTexts(const Json::Value& array) {
+Json::Value OnlyTexts(Json::Value array) {
   for (const Json::Value& element : array) {
-    if (!element.isString() || element.asString().find('\0') != std::string::npos ||
-        element.asString().empty()) {
+    const std::string text = element.isString() ? element.asString() : "";
+    if (text.empty() || text.find('\0') != std::string::npos) {
       return {Json::arrayValue};
     }
   }
@@ -48,8 +49,8 @@ Json::Value Explode(const Json::Value& value, const std::string& separator, int 
   const std::string text = value.asString();
   if (version >= kFirstVersionWithArrays && !text.empty() && text[0] == '[') {
     try {
-      const Json::Value array = ParseJson(DecodeByteEscapes(text));
-      return array.isArray() ? OnlyTexts(array) : Json::Value(Json::arrayValue);
+      Json::Value array = ParseJson(DecodeByteEscapes(text));
+      return array.isArray() ? OnlyTexts(std::move(array)) : Json::Value(Json::arrayValue);
     } catch (const std::exception&) {
       return {Json::arrayValue};  // begins like an array and is none
     }

@@ -135,7 +135,7 @@ void FuzzStartRequest(const std::string& input) {
     return;
   }
   Require(outcome.data["taskid"] == tasks[0].id, "the answer names the task");
-  const Json::Value params = tasks[0].properties.at("data")["params"];
+  const Json::Value params = tasks[0].properties.at("data").Member("params");
   Require(!params["path"].empty() && !params["path"][0].asString().empty(), "there is a source");
   Require(!params["dest_file_path"].asString().empty(), "there is a destination");
   Require(Device::ToText(params["password"]) == Device::ToText(scene["password"]),

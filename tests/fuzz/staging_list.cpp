@@ -53,7 +53,7 @@ void CheckRoundTrip(const Strings& paths) {
 
 void CheckForeignList(const std::string& list) {
   const Strings sources = Archiver::ReadSources(list, list);
-  const Strings packed = Archiver::WithoutNested(sources);
+  const Strings packed = Archiver::WithoutNested(sources, {sources.begin(), sources.end()});
   for (const std::string& source : sources) {
     const std::string framed = "/" + source + "/";
     Require(framed.find("/../") == framed.npos && framed.find("//") == framed.npos,
