@@ -128,10 +128,10 @@ bool EndWorker(const std::string& user, pid_t pid) {
   if (error == ESRCH || !IsWorkerAlive(user, pid)) {
     return true;  // it has ended already, and an archiver that nobody reads from ends by itself
   }
-  try {
+  try {  // a store without room keeps no job from being stopped
     StoreOf(user).NoteStop(pid);
-  } catch (const std::exception& error) {
-    syslog(LOG_ERR, "stop: %s", error.what());  // a store without room stops no stop
+  } catch (const std::exception& no_room) {
+    syslog(LOG_ERR, "stop: %s", no_room.what());
   }
   const Clock::time_point deadline = Clock::now() + kGrace;
   const bool is_told = has_descriptor
