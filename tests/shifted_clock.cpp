@@ -1,5 +1,6 @@
-// Preloaded into a device: the time of day that it sees, shifted by the seconds that stand in a file
-// when it asks. That is all that the device knows of the time of day; other clocks stay as they are.
+// Preloaded into a device: the time of day that it sees, shifted by the seconds that stand in a
+// file when it asks. That is all that the device knows of the time of day; other clocks stay as
+// they are.
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
