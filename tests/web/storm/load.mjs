@@ -65,7 +65,7 @@ export async function manyJobsAtOnce() {
   await isCalm({ folders: jobs.filter(({ paths }) => paths.length > 1).length });
   await prober.terminate();
   await device.remove();
-  // Answers among the starts have as many requests before them; those must not wait for the jobs too.
+  // Answers among the starts wait for those, which must not wait for the jobs too.
   const [during, after] = [answers.filter(({ asked }) => asked < accepted),
     answers.filter(({ asked }) => asked >= accepted)];
   const burst = accepted - answers[0].asked;
