@@ -149,6 +149,7 @@ export async function clockIsSetBack() {
   // A stop that dies when it has told the worker, which does not hear it.
   const deaf = await workerOf(1);
   kill(deaf, 'SIGSTOP');
+  await until(() => /State:\s*T/.test(readFileSync(`/proc/${deaf}/status`, 'utf8')));
   const stopping = client.call('stop', { taskid: lost }).catch(() => null);
   await until(() => isToldToEnd(deaf));
   writeFileSync(shift, days(-3));
