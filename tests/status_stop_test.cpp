@@ -1,4 +1,6 @@
 // Following a job and ending it, from requests of their own.
+#include <sched.h>
+#include <sqlite3.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -6,7 +8,9 @@
 #include <csignal>
 #include <filesystem>
 
+#include "device/bodies/json_text.h"
 #include "device/bodies/task_store.h"
+#include "device/bodies/workers.h"
 #include "tests/device_fixture.h"
 #include "tests/emulation.h"
 #include "tests/libc_calls.h"
@@ -108,6 +112,38 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
   }
   EXPECT_EQ(Ask("stop", task_id).code, 0);
   EXPECT_TRUE(Group(Worker()).empty());
+}
+
+TEST_F(TaskTest, AJobYieldsToAnswersAndIsReportedAsFailedWhenItIsKilled) {
+  for (const bool is_worker_killed : {true, false}) {
+    Watch();
+    const std::string task_id = StartEndlessJob();
+    ASSERT_TRUE(IsPacking());
+    for (const pid_t pid : Group(Worker())) {
+      EXPECT_EQ(sched_getscheduler(pid), SCHED_IDLE);
+      if ((pid == Worker()) == is_worker_killed) {
+        kill(pid, SIGKILL);
+      }
+    }
+    ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
+    const Json::Value answer = Ask("status", task_id).data;
+    EXPECT_TRUE(answer["finished"].asBool());
+    EXPECT_EQ(Device::ToText(answer["errors"]), R"([{"code":1300,"path":"/photo/z.7z"}])");
+    EXPECT_EQ(Ask("status", task_id).code, 599);
+  }
+}
+
+// Of a "stop" that has died in the middle, in a time that the clock says is yet to come.
+TEST_F(TaskTest, AClockThatIsSetBackStopsNoJob) {
+  Device::TaskStore store("alice");
+  store.AddWorker(1, 1);
+  store.NoteStop(1);
+  EXPECT_TRUE(Device::IsBeingStopped("alice", 1));
+  sqlite3* database = nullptr;
+  ASSERT_EQ(sqlite3_open(At("users/alice/store.db").c_str(), &database), SQLITE_OK);
+  sqlite3_exec(database, "UPDATE workers SET stopped = stopped + 9", nullptr, nullptr, nullptr);
+  ASSERT_EQ(sqlite3_close(database), SQLITE_OK);
+  EXPECT_FALSE(Device::IsBeingStopped("alice", 1));
 }
 
 TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {

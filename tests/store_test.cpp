@@ -36,7 +36,10 @@ TEST_F(StoreTest, ADamagedStoreIsSetAsideAndTheDeviceGoesOn) {
   const std::string whole = ReadFile(file_);
   std::string torn = whole;
   torn.replace(torn.size() / 4, torn.size() / 2, torn.size() / 2, '?');
-  for (const std::string& content : {std::string("garbage"), torn, whole.substr(0, 5000)}) {
+  std::string renamed = whole;
+  renamed[renamed.find("updated INTEGER")] = '?';
+  for (const std::string& content :
+       {std::string("garbage"), torn, whole.substr(0, 5000), renamed}) {
     for (const char* part : {"-wal", "-shm"}) {
       fs::remove(file_ + part);
     }

@@ -120,7 +120,11 @@ void Database::InTransaction(bool for_writing, const std::function<void()>& body
 Database::Statement::Statement(Database& database, const char* sql)
     : database_(database), statement_(nullptr, sqlite3_finalize) {
   sqlite3_stmt* statement = nullptr;
-  database_.Check(sqlite3_prepare_v2(database_.database_.get(), sql, -1, &statement, nullptr));
+  const int result = sqlite3_prepare_v2(database_.database_.get(), sql, -1, &statement, nullptr);
+  if (result == SQLITE_ERROR) {  // the statements are right: the schema's own text is damaged
+    database_.SetAside(sqlite3_errmsg(database_.database_.get()));
+  }
+  database_.Check(result);
   statement_.reset(statement);
 }
 

@@ -1,5 +1,6 @@
 // Starting processes: the worker's fork, and programs by argument vector.
 #include <fcntl.h>
+#include <sched.h>
 #include <spawn.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -12,7 +13,10 @@
 #include <cstdarg>
 #include <cstring>
 #include <map>
+#include <memory>
 #include <stdexcept>
+#include <string_view>
+#include <utility>
 #include <vector>
 
 #include "device/bodies/device.h"
@@ -28,6 +32,7 @@ namespace Device {
 namespace {
 
 constexpr char kArchiverProgram[] = "/usr/bin/7z";
+constexpr char kKilledLine[] = "\nError: the archiver was killed\n";
 constexpr unsigned int kRunAndWait = 187;
 
 // Which process writes to a stream that KLIBCPopenv returned.
@@ -78,6 +83,55 @@ int WaitForExit(pid_t pid) {
   return status;
 }
 
+// What stands behind the stream of the archiver, the one program that is read from. Its reader
+// looks at the lines alone, and when all of its processes were killed there is none that says so.
+struct Reading {
+  FileDescriptor output;
+  pid_t pid;
+  std::string_view last_line;  // what is left of it, once the output has ended
+  bool has_ended;
+};
+
+bool WasKilled(pid_t pid) {
+  siginfo_t ended{};
+  while (waitid(P_PID, static_cast<id_t>(pid), &ended, WEXITED | WNOWAIT) < 0 && errno == EINTR) {
+  }
+  return ended.si_code == CLD_KILLED || ended.si_code == CLD_DUMPED;
+}
+
+ssize_t ReadOutput(void* cookie, char* buffer, std::size_t size) {
+  auto& reading = *static_cast<Reading*>(cookie);
+  if (!reading.has_ended) {
+    ssize_t got = 0;
+    do {
+      got = read(reading.output.Get(), buffer, size);
+    } while (got < 0 && errno == EINTR);
+    if (got != 0) {
+      return got;
+    }
+    reading.has_ended = true;
+    reading.last_line = WasKilled(reading.pid) ? kKilledLine : "";
+  }
+  const std::size_t copied = reading.last_line.copy(buffer, size);
+  reading.last_line.remove_prefix(copied);
+  return static_cast<ssize_t>(copied);
+}
+
+int CloseOutput(void* cookie) {
+  delete static_cast<Reading*>(cookie);
+  return 0;
+}
+
+FILE* StreamOf(FileDescriptor& output, const char* mode, pid_t pid) {
+  auto reading = std::make_unique<Reading>(Reading{std::move(output), pid, {}, false});
+  FILE* const stream =
+      fopencookie(reading.get(), mode, {ReadOutput, nullptr, nullptr, CloseOutput});
+  if (stream != nullptr) {
+    reading.release();
+  }
+  return stream;
+}
+
 FILE* OpenProgram(const char* program, const char* mode, char* const* arguments) {
   int ends[2];
   if (std::strcmp(mode, "r") != 0 || pipe2(ends, O_CLOEXEC) != 0) {
@@ -92,22 +146,24 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     KLIB_ERROR(error);
     return nullptr;
   }
-  FILE* const stream = fdopen(read_end.Get(), mode);
+  FILE* const stream = StreamOf(read_end, mode, pid);
   if (stream == nullptr) {
     KLIB_ERROR(errno);
     kill(pid, SIGKILL);
     WaitForExit(pid);
     return nullptr;
   }
-  read_end.Release();
   Streams()[stream] = pid;
   return stream;
 }
 
-// A session and process group of its own; nothing of the request's that somebody waits to see
-// closed.
+// A process group of its own; nothing of the request's that somebody waits to see closed.
 void BecomeWorker() {
-  setsid();
+  setpgid(0, 0);
+  // Answers come before packing. In a session of its own it would yield to nobody: where the kernel
+  // shares out time by sessions, the launcher would get no more than each job does.
+  const sched_param none{};
+  sched_setscheduler(0, SCHED_IDLE, &none);
   TheDevice().outcome.Close();
   const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   dup2(null.Get(), STDIN_FILENO);

@@ -1,5 +1,6 @@
 // What the task manager's library offers beside its classes: waiting, saving, removing, killing.
 #include <syslog.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
@@ -80,16 +81,6 @@ void RemoveStaleTasks(const std::string& user) {
   ForgetEndedWorkers(user, workers, named);
 }
 
-// The worker may end between two looks: what it stored last counts, so that a result is never
-// removed before it was reported.
-bool EndedWithoutResult(Vesk::Task::State& task, pid_t pid) {
-  if (pid <= 0 || IsWorkerAlive(task.user, pid)) {
-    return false;
-  }
-  task.Reload();
-  return !task.row.finished && !HoldsErrors(task);
-}
-
 }  // namespace
 }  // namespace Device
 
@@ -133,8 +124,8 @@ void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved) {
   Operation("LumoLibRemoveFinishedTask", task, pid, reserved).Run([&] {
     Vesk::Task::State* const state = task == nullptr ? nullptr : task->state;
     try {
-      if (state != nullptr && (state->row.finished || Device::HoldsErrors(*state) ||
-                               Device::EndedWithoutResult(*state, pid))) {
+      // As the answer has it: of a worker that has ended since, the next one reports the end.
+      if (state != nullptr && (state->row.finished || Device::HoldsErrors(*state))) {
         state->Remove();
       }
     } catch (const std::exception& error) {
@@ -147,6 +138,7 @@ void CleanTimeOutTasks(const char* user) {
   Operation("CleanTimeOutTasks", user).Run([&] {
     try {
       Device::RemoveStaleTasks(user);
+      Device::StoreOf(user).NoteEnd(getpid());  // a worker's last call
     } catch (const std::exception& error) {
       syslog(LOG_ERR, "clean tasks: %s", error.what());
     }

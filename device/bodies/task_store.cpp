@@ -14,7 +14,7 @@ using Statement = Database::Statement;
 
 namespace {
 
-constexpr int kSchemaVersion = 1;  // one more with each change of the schema
+constexpr int kSchemaVersion = 2;  // one more with each change of the schema
 
 constexpr char kSchema[] = R"(
 CREATE TABLE tasks (
@@ -26,7 +26,8 @@ CREATE TABLE members (
   task TEXT NOT NULL, name TEXT NOT NULL, member TEXT NOT NULL, value TEXT,
   version INTEGER NOT NULL, PRIMARY KEY (task, name, member));
 CREATE TABLE workers (
-  pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL, stopped INTEGER NOT NULL);
+  pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL, stopped INTEGER NOT NULL,
+  ended INTEGER NOT NULL);
 CREATE TABLE notifications (
   time INTEGER NOT NULL, app TEXT NOT NULL, task TEXT NOT NULL, title TEXT NOT NULL,
   message TEXT NOT NULL, arguments TEXT NOT NULL);
@@ -190,18 +191,19 @@ void TaskStore::RemoveTask(const std::string& id) {
 }
 
 void TaskStore::AddWorker(pid_t pid, std::uint64_t start_time) {
-  Statement(database_, "INSERT OR REPLACE INTO workers VALUES (?, ?, 0)")
+  Statement(database_, "INSERT OR REPLACE INTO workers VALUES (?, ?, 0, 0)")
       .Bind(std::int64_t{pid})
       .Bind(static_cast<std::int64_t>(start_time))
       .Step();
 }
 
 std::optional<WorkerRow> TaskStore::FindWorker(pid_t pid) {
-  Statement select(database_, "SELECT start_time, stopped FROM workers WHERE pid = ?");
+  Statement select(database_, "SELECT start_time, stopped, ended FROM workers WHERE pid = ?");
   if (!select.Bind(std::int64_t{pid}).Step()) {
     return std::nullopt;
   }
-  return WorkerRow{static_cast<std::uint64_t>(select.Number(0)), select.Number(1)};
+  return WorkerRow{static_cast<std::uint64_t>(select.Number(0)), select.Number(1),
+                   select.Number(2) != 0};
 }
 
 void TaskStore::NoteStop(pid_t pid) {
@@ -209,6 +211,10 @@ void TaskStore::NoteStop(pid_t pid) {
       .Bind(std::time(nullptr))
       .Bind(std::int64_t{pid})
       .Step();
+}
+
+void TaskStore::NoteEnd(pid_t pid) {
+  Statement(database_, "UPDATE workers SET ended = 1 WHERE pid = ?").Bind(std::int64_t{pid}).Step();
 }
 
 std::vector<pid_t> TaskStore::AllWorkers() {

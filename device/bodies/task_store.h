@@ -30,6 +30,7 @@ struct TaskRow {
 struct WorkerRow {
   std::uint64_t start_time = 0;  // the kernel's ticks since boot
   std::int64_t stopped = 0;      // when "stop" asked it to end, in seconds since 1970; 0: never
+  bool has_come_to_end = false;  // it has done all that a worker does
 };
 
 struct NotificationRow {
@@ -66,6 +67,8 @@ class TaskStore {
   std::optional<WorkerRow> FindWorker(pid_t pid);
   // Notes that the worker is being stopped from now on.
   void NoteStop(pid_t pid);
+  // Notes that the worker, if it is one, has come to its end.
+  void NoteEnd(pid_t pid);
   std::vector<pid_t> AllWorkers();
   void RemoveWorker(pid_t pid);
 

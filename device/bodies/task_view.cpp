@@ -1,5 +1,10 @@
 #include "device/bodies/task_view.h"
 
+#include <syslog.h>
+
+#include <stdexcept>
+#include <utility>
+
 #include "device/bodies/errors.h"
 #include "device/bodies/json_text.h"
 #include "device/bodies/workers.h"
@@ -26,9 +31,7 @@ std::string StateOf(const std::string& user, const TaskRow& row) {
     return "finished";
   }
   const Json::Value pid = data.Member("pid");
-  return !pid.isInt() || IsWorkerAlive(user, pid.asInt()) || IsBeingStopped(user, pid.asInt())
-             ? kTaskRunning
-             : kTaskDead;
+  return pid.isInt() && HasDied(user, pid.asInt()) ? kTaskDead : kTaskRunning;
 }
 
 // What the task manager noted when the task was made.
@@ -49,6 +52,26 @@ Json::Value Destination(const TaskRow& row) {
 }
 
 bool IsDead(const std::string& user, const TaskRow& row) { return StateOf(user, row) == kTaskDead; }
+
+// In the row alone when the store has no room.
+void StoreFailure(const std::string& user, TaskRow& row) {
+  Json::Value item(Json::objectValue);
+  item["path"] = Destination(row);
+  item["code"] = kErrArchive;
+  Json::Value errors(Json::arrayValue);
+  errors.append(item);
+  StoredValue data = Property(row, kPropData);
+  data.members[kDataErrors] = ToText(errors);
+  const std::int64_t version = row.version;
+  try {
+    StoreOf(user).UpdateTask(row, {{kPropData, data}}, true);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "end of a killed worker: %s", error.what());
+    row.properties[kPropData] = std::move(data);
+    row.finished = true;
+    row.version = version;
+  }
+}
 
 }  // namespace
 
@@ -71,27 +94,28 @@ Json::Value TaskView(const std::string& user, const TaskRow& row) {
   return view;
 }
 
-void EndDeadTasks(const std::string& user) {
-  for (const TaskRow& seen : StoreOf(user).AllTasks()) {
-    if (!IsDead(user, seen)) {
-      continue;
-    }
-    // What the worker stored last counts: it may have ended between the two looks.
-    std::optional<TaskRow> row = StoreOf(user).FindTask(seen.id);
-    if (!row || !IsDead(user, *row)) {
-      continue;
-    }
-    Json::Value item(Json::objectValue);
-    item["path"] = Destination(*row);
-    item["code"] = kErrArchive;
-    Json::Value errors(Json::arrayValue);
-    errors.append(item);
-    StoredValue data = Property(*row, kPropData);
-    data.members[kDataErrors] = ToText(errors);
-    std::map<std::string, StoredValue> properties;
-    properties.emplace(kPropData, std::move(data));
-    StoreOf(user).UpdateTask(*row, std::move(properties), true);
+bool EndIfDead(const std::string& user, TaskRow& row) {
+  if (!IsDead(user, row)) {
+    return true;
   }
+  // What the worker stored last counts: it may have ended between the two looks.
+  if (!StoreOf(user).RefreshTask(row)) {
+    return false;
+  }
+  if (IsDead(user, row)) {
+    StoreFailure(user, row);
+  }
+  return true;
+}
+
+std::vector<TaskRow> EndDeadTasks(const std::string& user) {
+  std::vector<TaskRow> rows;
+  for (TaskRow& row : StoreOf(user).AllTasks()) {
+    if (EndIfDead(user, row)) {
+      rows.push_back(std::move(row));
+    }
+  }
+  return rows;
 }
 
 }  // namespace Device

@@ -5,6 +5,7 @@
 #include <json/json.h>
 
 #include <string>
+#include <vector>
 
 #include "device/bodies/task_store.h"
 
@@ -21,9 +22,13 @@ bool HasData(const TaskRow& row);
 // (seconds since 1970) and, of a failed one, "errors". No password.
 Json::Value TaskView(const std::string& user, const TaskRow& row);
 
-// Gives every dead task of the user's the outcome that its worker could not store: one error item,
-// the destination with the code of a failed archive.
-void EndDeadTasks(const std::string& user);
+// Gives a task whose worker went without an outcome the one that it could not store: one error
+// item, the destination with the code of a failed archive. Where the store has no room for it, the
+// row has it alone. False when the task was removed meanwhile.
+bool EndIfDead(const std::string& user, TaskRow& row);
+
+// All tasks of the user's, none of them dead.
+std::vector<TaskRow> EndDeadTasks(const std::string& user);
 
 }  // namespace Device
 

@@ -13,6 +13,7 @@
 #include "device/bodies/operations.h"
 #include "device/bodies/random_id.h"
 #include "device/bodies/task_state.h"
+#include "device/bodies/task_view.h"
 
 using Device::Operation;
 
@@ -239,7 +240,7 @@ Task* TaskMgr::getTaskWithThrow(const char* task_id) {
   return Operation("Vesk::TaskMgr::getTaskWithThrow", task_id).Run([&] {
     std::optional<Device::TaskRow> row =
         LogAndThrow("find task", [&] { return Device::StoreOf(state_->user).FindTask(task_id); });
-    if (!row) {
+    if (!row || !Device::EndIfDead(state_->user, *row)) {
       throw std::runtime_error("no task '" + std::string(task_id) + "'");
     }
     return new Task(new Task::State{state_->user, std::move(*row), false, {}});

@@ -3,6 +3,7 @@
 #include <dirent.h>
 #include <poll.h>
 #include <sys/syscall.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -81,6 +82,18 @@ bool WaitForGroup(pid_t group, Clock::time_point deadline) {
   return true;
 }
 
+bool IsAlive(pid_t pid, const WorkerRow& worker) {
+  const std::optional<ProcessStat> stat = ReadStat(pid);
+  return stat && stat->start_time == worker.start_time && !HasEnded(*stat);
+}
+
+bool IsBeingStopped(const WorkerRow& worker) {
+  // From the first signal to the task's removal; a request that died meanwhile removes nothing.
+  constexpr std::time_t kLongest = 30;
+  const std::time_t age = std::time(nullptr) - worker.stopped;
+  return age >= 0 && age < kLongest;  // below when the clock was set back since
+}
+
 void WaitForProcess(const FileDescriptor& process, Clock::time_point deadline) {
   const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
   pollfd ended = {process.Get(), POLLIN, 0};
@@ -99,15 +112,17 @@ void RegisterWorker(const std::string& user, pid_t pid) {
 
 bool IsWorkerAlive(const std::string& user, pid_t pid) {
   const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
-  const std::optional<ProcessStat> stat = ReadStat(pid);
-  return worker && stat && stat->start_time == worker->start_time && !HasEnded(*stat);
+  return worker && IsAlive(pid, *worker);
 }
 
 bool IsBeingStopped(const std::string& user, pid_t pid) {
-  // From the first signal to the task's removal; a request that died meanwhile removes nothing.
-  constexpr std::time_t kLongest = 30;
   const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
-  return worker && worker->stopped != 0 && std::time(nullptr) - worker->stopped < kLongest;
+  return worker && IsBeingStopped(*worker);
+}
+
+bool HasDied(const std::string& user, pid_t pid) {
+  const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
+  return worker && !IsAlive(pid, *worker) && !IsBeingStopped(*worker) && !worker->has_come_to_end;
 }
 
 bool EndWorker(const std::string& user, pid_t pid) {
@@ -126,7 +141,11 @@ bool EndWorker(const std::string& user, pid_t pid) {
   if (error == ESRCH || !IsWorkerAlive(user, pid)) {
     return true;  // it has ended already, and an archiver that nobody reads from ends by itself
   }
-  StoreOf(user).NoteStop(pid);
+  try {  // a store without room keeps no job from being stopped
+    StoreOf(user).NoteStop(pid);
+  } catch (const std::exception& no_room) {
+    syslog(LOG_ERR, "stop: %s", no_room.what());
+  }
   const Clock::time_point deadline = Clock::now() + kGrace;
   const bool is_told = has_descriptor
                            ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0

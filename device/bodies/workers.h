@@ -20,6 +20,10 @@ bool IsWorkerAlive(const std::string& user, pid_t pid);
 // True if "stop" is ending the worker: its task is going to be removed.
 bool IsBeingStopped(const std::string& user, pid_t pid);
 
+// True of a worker that was killed, or that ended before its end: it has stored no outcome and
+// never will.
+bool HasDied(const std::string& user, pid_t pid);
+
 // Ends a worker of the user's and all that runs in its process group: asks first, and insists after
 // a grace of 5 s. False when it is none, or could not be ended.
 bool EndWorker(const std::string& user, pid_t pid);

@@ -22,18 +22,15 @@ constexpr int kPauseMs = 200;
 class Watcher {
  public:
   Watcher(int stream, std::string user)
-      : stream_(stream), user_(std::move(user)), last_(StoreOf(user_).LastNotification()) {
-    EndDeadTasks(user_);
-  }
+      : stream_(stream), user_(std::move(user)), last_(StoreOf(user_).LastNotification()) {}
 
   // False when nobody reads any more.
   bool Look() {
-    EndTasksOfLostWorkers();
     const std::int64_t version = StoreOf(user_).Version();
-    if (version != version_) {
+    if (version != version_ || HasLostWorker()) {
+      FindWorkers();
       SendTasks();
       SendNotifications();
-      FindWorkers();
     }
     version_ = version;
     return is_read_;
@@ -43,22 +40,19 @@ class Watcher {
   void FindWorkers() {
     workers_.clear();
     for (const pid_t pid : StoreOf(user_).AllWorkers()) {
-      if (IsWorkerAlive(user_, pid)) {
+      if (IsAtWork(pid)) {
         workers_.push_back(pid);
       }
     }
   }
 
+  // One that is being stopped is looked at until its task is gone: the request may have died.
+  bool IsAtWork(pid_t pid) const { return IsWorkerAlive(user_, pid) || IsBeingStopped(user_, pid); }
+
   // All tasks are read only when a worker has gone: they can be large.
-  void EndTasksOfLostWorkers() {
-    const auto is_lost = [&](pid_t pid) { return !IsWorkerAlive(user_, pid); };
-    const auto lost = std::remove_if(workers_.begin(), workers_.end(), is_lost);
-    if (lost != workers_.end() || has_dead_) {
-      has_dead_ = false;
-      workers_.erase(lost, workers_.end());
-      EndDeadTasks(user_);
-      version_ = -1;  // this process's own changes do not count as such
-    }
+  bool HasLostWorker() const {
+    return !std::all_of(workers_.begin(), workers_.end(),
+                        [this](pid_t pid) { return IsAtWork(pid); });
   }
 
   void Send(const char* event, const Json::Value& data) {
@@ -71,15 +65,11 @@ class Watcher {
   void SendTasks() {
     std::map<std::string, Json::Value> tasks;
     StoreOf(user_).RefreshTasks(rows_);
-    for (const auto& [id, row] : rows_) {
-      if (!HasData(row)) {
+    for (auto& [id, row] : rows_) {
+      if (!EndIfDead(user_, row) || !HasData(row)) {
         continue;
       }
-      Json::Value view = TaskView(user_, row);
-      if (view["state"] == kTaskDead) {
-        view["state"] = kTaskRunning;  // until it has its outcome, at the next look
-        has_dead_ = true;
-      }
+      const Json::Value view = TaskView(user_, row);
       tasks[id] = view;
       if (const auto known = tasks_.find(id); known == tasks_.end() || known->second != view) {
         Send("task", view);
@@ -115,10 +105,9 @@ class Watcher {
   std::string user_;
   std::int64_t last_;           // notification that was sent
   std::int64_t version_ = -1;   // of the store, when it was looked at
-  std::vector<pid_t> workers_;  // that were alive
+  std::vector<pid_t> workers_;  // that were at work
   std::map<std::string, TaskRow> rows_;
   std::map<std::string, Json::Value> tasks_;  // as they were sent
-  bool has_dead_ = false;  // a task whose worker had gone before it was seen alive
   bool is_read_ = true;
 };
 

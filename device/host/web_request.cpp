@@ -57,10 +57,9 @@ void AnswerFiles(int exchange, const std::string& user, const std::string& path)
 }
 
 void AnswerTasks(int exchange, const std::string& user) {
-  EndDeadTasks(user);
   Json::Value body(Json::objectValue);
   body["tasks"] = Json::Value(Json::arrayValue);
-  for (const TaskRow& row : StoreOf(user).AllTasks()) {
+  for (const TaskRow& row : EndDeadTasks(user)) {
     if (HasData(row)) {
       body["tasks"].append(TaskView(user, row));
     }

@@ -19,8 +19,8 @@ const char* KLIBCErrorGetFile();
 int KLIBCErrorGetLine();
 
 // Like fork: negative on failure, 0 in the child, the child's process id in the parent. The child
-// is the leader of a session and process group of its own: a worker that is told to end signals its
-// whole group.
+// is the leader of a process group of its own: a worker that is told to end signals its whole
+// group.
 pid_t KLIBCProcFork();
 
 // Starts a program with the null-terminated argument vector, no shell between, and returns a stream

@@ -9,15 +9,26 @@ export const build = process.env.KAVO_BUILD;
 const program = path.join(build, 'kavo-device');
 export const isRoot = process.getuid() === 0;
 
+// Runs the program behind two folders with mounts and a small /tmp of its own, where the two stay.
+const ownMounts = `
+  mkdir -p "$1/tmp" && mount -t tmpfs -o mode=1777,size=8m tmp "$1/tmp" && for kept in "$1" "$2"; do
+    case "$kept" in
+      /tmp/*) mkdir -p "$1/tmp\${kept#/tmp}" && mount --bind "$kept" "$1/tmp\${kept#/tmp}" ;;
+    esac
+  done && mount --move "$1/tmp" /tmp && shift 2 && exec "$@"`;
+
 export class Device {
-  // `volume` is the size of vol2 as tmpfs has it, on a mount that only the device sees.
-  static async start({ volume, faults = [] } = {}) {
+  static all = new Set();
+
+  // One that is `isolated` has mounts and a /tmp that only it sees; that takes root.
+  static async start({ isolated = false, faults = [], env = {} } = {}) {
     const device = new Device();
+    Device.all.add(device);
     device.base = mkdtempSync(path.join(tmpdir(), 'kavo-web-'));
     chmodSync(device.base, 0o755);
     device.folder = path.join(device.base, 'nas');
     device.faults = faults.flatMap((rule) => ['--fault', rule]);
-    device.volume = volume;
+    Object.assign(device, { isolated, env: { ...process.env, ...env } });
     execFileSync(program, ['init', device.folder], { stdio: 'pipe' });
     await device.serve();
     return device;
@@ -25,11 +36,9 @@ export class Device {
 
   async serve() {
     const serve = [program, 'serve', this.folder, '--listen', '127.0.0.1:0', ...this.faults];
-    const mount = 'mount -t tmpfs -o mode=0755,size="$1" full "$2/vol2/video" && ' +
-                  'chown 65001 "$2/vol2/video" && shift 2 && exec "$@"';
-    this.process = this.volume
-      ? spawn('unshare', ['-m', 'sh', '-c', mount, 'sh', this.volume, this.folder, ...serve])
-      : spawn(serve[0], serve.slice(1));
+    const [command, ...args] = this.isolated
+      ? ['unshare', '-m', 'sh', '-c', ownMounts, 'sh', this.base, build, ...serve] : serve;
+    this.process = spawn(command, args, { env: this.env });
     this.log = '';
     this.process.stderr.on('data', (data) => { this.log += data; });
     this.ended = new Promise((resolve) => { this.process.on('exit', resolve); });
@@ -46,6 +55,7 @@ export class Device {
   }
 
   async remove() {
+    Device.all.delete(this);
     await this.stop();
     for (const { pid } of this.processes()) {
       try {
@@ -55,6 +65,17 @@ export class Device {
       }
     }
     rmSync(this.base, { recursive: true, force: true, maxRetries: 50 });
+  }
+
+  // Runs a script where the device sees its mounts; $1 is the device's folder.
+  inside(script) {
+    execFileSync('nsenter', ['-t', this.process.pid, '-m', 'sh', '-ec', script, 'sh', this.folder],
+      { stdio: 'pipe' });
+  }
+
+  // The device's /tmp, as others reach it.
+  get tmp() {
+    return this.isolated ? `/proc/${this.process.pid}/root/tmp` : '/tmp';
   }
 
   // A path in the device's folder.

@@ -197,7 +197,7 @@ test('a job outlives its device, and is found again', async () => {
 
 test('the end of a killed worker is a failed task', async () => {
   const taskid = await startEndless();
-  const stat = (pid) => execFileSync('ps', ['-o', 'sid=', '-p', pid], { encoding: 'utf8' }).trim();
+  const stat = (pid) => execFileSync('ps', ['-o', 'pgid=', '-p', pid], { encoding: 'utf8' }).trim();
   const worker = stat(device.processes().find(({ args }) => args.includes('.kavo-7z-')).pid);
   process.kill(Number(worker), 'SIGKILL');
   const task = await alice.taskIn('failed', taskid);
