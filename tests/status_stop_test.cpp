@@ -24,10 +24,11 @@ using Device::Outcome;
 class TaskTest : public DeviceTest {
  protected:
   // A job that goes on until it is stopped: hours of zeros that take no room.
-  std::string StartEndlessJob() {
-    fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
-    const Outcome started = Call(
-        "start", JobParams({"/photo/zeros"}, "/photo/z.7z", R"({"format":"7z","level":"best"})"));
+  std::string StartEndlessJob(const char* params = R"({"format":"7z","level":"best"})") {
+    if (!fs::exists(At("vol1/photo/zeros"))) {
+      fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
+    }
+    const Outcome started = Call("start", JobParams({"/photo/zeros"}, "/photo/z.7z", params));
     EXPECT_EQ(started.code, 0);
     return started.data["taskid"].asString();
   }
@@ -114,13 +115,27 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
   EXPECT_TRUE(Group(Worker()).empty());
 }
 
-TEST_F(TaskTest, AJobYieldsToAnswersAndIsReportedAsFailedWhenItIsKilled) {
+TEST_F(TaskTest, TheFifthJobAtOnceYieldsToAllElse) {
+  Strings tasks;
+  for (const int scheduler : {SCHED_OTHER, SCHED_OTHER, SCHED_OTHER, SCHED_OTHER, SCHED_IDLE}) {
+    Watch();
+    tasks.push_back(StartEndlessJob(R"({"format":"7z","level":"fastest"})"));
+    ASSERT_TRUE(IsPacking());
+    for (const pid_t pid : Group(Worker())) {
+      EXPECT_EQ(sched_getscheduler(pid), scheduler);
+    }
+  }
+  for (const std::string& task_id : tasks) {
+    EXPECT_EQ(Ask("stop", task_id).code, 0);
+  }
+}
+
+TEST_F(TaskTest, AKilledJobIsReportedAsFailed) {
   for (const bool is_worker_killed : {true, false}) {
     Watch();
     const std::string task_id = StartEndlessJob();
     ASSERT_TRUE(IsPacking());
     for (const pid_t pid : Group(Worker())) {
-      EXPECT_EQ(sched_getscheduler(pid), SCHED_IDLE);
       if ((pid == Worker()) == is_worker_killed) {
         kill(pid, SIGKILL);
       }
@@ -144,6 +159,7 @@ TEST_F(TaskTest, AClockThatIsSetBackStopsNoJob) {
   sqlite3_exec(database, "UPDATE workers SET stopped = stopped + 9", nullptr, nullptr, nullptr);
   ASSERT_EQ(sqlite3_close(database), SQLITE_OK);
   EXPECT_FALSE(Device::IsBeingStopped("alice", 1));
+  Device::CloseStores();
 }
 
 TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {

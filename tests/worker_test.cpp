@@ -89,13 +89,20 @@ TEST_F(WorkerTest, TakesAnArchiveOfItselfForDone) {
 
 TEST_F(WorkerTest, DoesNotFinishATaskItCannotRead) {
   Device::AddFault("Vesk::Task::getProperty=null");
-  Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip"));
+  const Device::Outcome started = Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip"));
   ASSERT_TRUE(WaitUntil([&] { return !Calls("_exit").empty(); }));
   EXPECT_EQ(Log().front(), "Failed to get task data");
   EXPECT_EQ(Log().back(), "Failed to get json data");
   EXPECT_EQ(Behind(Sequence(Worker()), "Vesk::Task::getProperty"),
             Words("syslog KAVO::APIRequest::GetLoginUserName CleanTimeOutTasks _exit"));
   EXPECT_TRUE(Calls("SaveTaskData").empty());
+  Watch();
+  ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
+  for (int time = 0; time < 2; ++time) {  // until it is removed
+    const Device::Outcome status = Ask("status", started.data["taskid"].asString());
+    EXPECT_EQ(status.code, 0);
+    EXPECT_FALSE(status.data["finished"].asBool());
+  }
 }
 
 TEST_F(WorkerTest, LogsWhatItCannotStoreAndEndsAllTheSame) {

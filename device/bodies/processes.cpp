@@ -1,6 +1,5 @@
 // Starting processes: the worker's fork, and programs by argument vector.
 #include <fcntl.h>
-#include <sched.h>
 #include <spawn.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -159,11 +158,9 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
 
 // A process group of its own; nothing of the request's that somebody waits to see closed.
 void BecomeWorker() {
+  // No session of its own: where the kernel shares out time by sessions, the launcher would get no
+  // more than each job does.
   setpgid(0, 0);
-  // Answers come before packing. In a session of its own it would yield to nobody: where the kernel
-  // shares out time by sessions, the launcher would get no more than each job does.
-  const sched_param none{};
-  sched_setscheduler(0, SCHED_IDLE, &none);
   TheDevice().outcome.Close();
   const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   dup2(null.Get(), STDIN_FILENO);

@@ -2,6 +2,7 @@
 
 #include <dirent.h>
 #include <poll.h>
+#include <sched.h>
 #include <sys/syscall.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -28,6 +29,7 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
+constexpr int kJobsAtOnce = 4;  // of a user, that need not yield
 constexpr std::chrono::seconds kGrace(5);
 constexpr std::chrono::milliseconds kGroupPoll(5);
 
@@ -107,7 +109,16 @@ void RegisterWorker(const std::string& user, pid_t pid) {
   if (!stat) {
     throw std::runtime_error("no process " + std::to_string(pid));
   }
-  StoreOf(user).AddWorker(pid, stat->start_time);
+  TaskStore& store = StoreOf(user);
+  store.AddWorker(pid, stat->start_time);
+  const std::vector<pid_t> workers = store.AllWorkers();
+  const auto is_alive = [&](pid_t worker) { return IsWorkerAlive(user, worker); };
+  if (workers.size() > kJobsAtOnce &&
+      std::count_if(workers.begin(), workers.end(), is_alive) > kJobsAtOnce) {
+    // Answers come before the packing of a crowd. Failing costs time, no more.
+    const sched_param none{};
+    sched_setscheduler(pid, SCHED_IDLE, &none);
+  }
 }
 
 bool IsWorkerAlive(const std::string& user, pid_t pid) {
