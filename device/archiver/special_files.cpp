@@ -8,6 +8,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <memory>
 #include <utility>
@@ -44,7 +45,7 @@ class Scan {
   void Visit(int parent, const char* name, mode_t type, const std::string& path) {
     if (S_ISDIR(type)) {
       VisitFolder(parent, name, path);
-    } else if (S_ISLNK(type) ? links_too_ : !S_ISREG(type)) {
+    } else if (IsSpecial(type)) {
       found.push_back(path);
     }
   }
@@ -52,6 +53,13 @@ class Scan {
   std::vector<std::string> found;
 
  private:
+  bool IsSpecial(mode_t type) const { return S_ISLNK(type) ? links_too_ : !S_ISREG(type); }
+
+  bool IsLeftOut(const char* name) const {
+    return std::strcmp(name, ".") == 0 || std::strcmp(name, "..") == 0 ||
+           std::find(excluded_.begin(), excluded_.end(), name) != excluded_.end();
+  }
+
   void VisitFolder(int parent, const char* name, const std::string& path) {
     const int fd = openat(parent, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     const std::unique_ptr<DIR, CloseDir> dir(fd < 0 ? nullptr : fdopendir(fd));
@@ -59,14 +67,13 @@ class Scan {
       throw SystemFailure(kCannotRead, path, errno);
     }
     while (const dirent* entry = readdir(dir.get())) {
-      const std::string child = entry->d_name;
-      const bool left_out = child == "." || child == ".." ||
-                            std::find(excluded_.begin(), excluded_.end(), child) != excluded_.end();
-      if (!left_out) {
-        const mode_t type = entry->d_type == DT_UNKNOWN
-                                ? Status(fd, child, AT_SYMLINK_NOFOLLOW).st_mode
-                                : DTTOIF(entry->d_type);
-        Visit(fd, child.c_str(), type, std::string(path).append("/").append(child));
+      const char* const child = entry->d_name;
+      const mode_t type = entry->d_type == DT_UNKNOWN
+                              ? Status(fd, child, AT_SYMLINK_NOFOLLOW).st_mode
+                              : DTTOIF(entry->d_type);
+      // Plain files, which are the most, take no more than that look.
+      if ((S_ISDIR(type) || IsSpecial(type)) && !IsLeftOut(child)) {
+        Visit(fd, child, type, std::string(path).append("/").append(child));
       }
     }
   }

@@ -19,10 +19,7 @@ namespace Device {
 
 namespace {
 
-constexpr char kPropData[] = "data";
 constexpr char kPropProgress[] = "progress";
-constexpr char kDataErrors[] = "errors";
-constexpr char kDataPid[] = "pid";
 constexpr std::time_t kDeadKept = 3600;  // seconds
 constexpr std::time_t kFinishedKept = 24 * kDeadKept;
 

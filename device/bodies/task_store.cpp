@@ -183,8 +183,9 @@ bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> prop
   return is_found;
 }
 
-void TaskStore::RemoveTask(const std::string& id) {
+void TaskStore::RemoveTask(const std::string& id, pid_t worker) {
   database_.InTransaction(kForWriting, [&] {
+    RemoveWorker(worker);
     Statement(database_, "DELETE FROM members WHERE task = ?").Bind(id).Step();
     Statement(database_, "DELETE FROM tasks WHERE id = ?").Bind(id).Step();
   });

@@ -16,6 +16,11 @@
 
 namespace Device {
 
+// Of a task, what the device itself looks at: a property, and members of it.
+inline constexpr char kPropData[] = "data";
+inline constexpr char kDataPid[] = "pid";
+inline constexpr char kDataErrors[] = "errors";
+
 // A task as the store had it at one moment.
 struct TaskRow {
   std::string id;
@@ -61,7 +66,8 @@ class TaskStore {
   // Stores the properties and the finished state together, and brings the row up to date. Only what
   // differs from the store is written. False when there is no such task.
   bool UpdateTask(TaskRow& row, std::map<std::string, StoredValue> properties, bool finished);
-  void RemoveTask(const std::string& id);
+  // With what is known of its worker, if it has one.
+  void RemoveTask(const std::string& id, pid_t worker = -1);
 
   void AddWorker(pid_t pid, std::uint64_t start_time);
   std::optional<WorkerRow> FindWorker(pid_t pid);

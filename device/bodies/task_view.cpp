@@ -13,9 +13,6 @@ namespace Device {
 
 namespace {
 
-constexpr char kPropData[] = "data";
-constexpr char kDataErrors[] = "errors";
-
 const StoredValue& Property(const TaskRow& row, const std::string& name) {
   static const StoredValue kNone;
   const auto found = row.properties.find(name);
@@ -30,7 +27,7 @@ std::string StateOf(const std::string& user, const TaskRow& row) {
   if (row.finished) {
     return "finished";
   }
-  const Json::Value pid = data.Member("pid");
+  const Json::Value pid = data.Member(kDataPid);
   return pid.isInt() && HasDied(user, pid.asInt()) ? kTaskDead : kTaskRunning;
 }
 

@@ -124,7 +124,8 @@ bool Task::State::Reload() {
 
 void Task::State::Remove() {
   try {
-    Device::StoreOf(user).RemoveTask(row.id);
+    const Json::Value worker = Find(Device::kPropData).Member(Device::kDataPid);
+    Device::StoreOf(user).RemoveTask(row.id, worker.isInt() ? worker.asInt() : -1);
   } catch (const std::exception& error) {
     LogFailure("remove task", error);
   }
