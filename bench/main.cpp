@@ -51,7 +51,7 @@ void Tree(Workbench& bench) {
         std::string("20,000 small files, ") + format,
         Compare([&, name = format] { return bench.Job({"/photo/tree"}, name, "normal"); },
                 [&, with = switches] { return bench.Bare(bench.Share("photo"), {"tree"}, with); },
-                kPairs),
+                3 * kPairs),
         "1.03");
   }
 }

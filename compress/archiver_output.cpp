@@ -1,5 +1,6 @@
 #include "compress/archiver_output.h"
 
+#include <algorithm>
 #include <cstdlib>
 
 namespace Zantro {
@@ -49,9 +50,10 @@ ArchiverEvent ParseArchiverLine(std::string_view line) {
     event.total_size = static_cast<std::uint64_t>(std::strtoll(size, nullptr, kDecimal));
   } else if (Behind(line, kFilePrefix) != nullptr) {
     event.kind = ArchiverEvent::kFile;
-    const std::string name(line.substr(sizeof(kFilePrefix) - 1));
-    // The last character alone, the line feed; deliberate.
-    event.file = name.substr(name.length() - 1);
+    const std::string_view name = line.substr(sizeof(kFilePrefix) - 1);
+    const std::string end(name.substr(name.length() - std::min<std::size_t>(name.length(), 1)));
+    // The last character alone, the line feed; deliberate. Without one this throws.
+    event.file = end.substr(end.length() - 1);
   } else if (const char* percent = Behind(line, kProgressPrefix)) {
     event.kind = ArchiverEvent::kProgress;
     event.progress = static_cast<float>(std::strtol(percent, nullptr, kDecimal)) / 100.0F;
