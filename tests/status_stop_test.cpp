@@ -115,16 +115,28 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
   EXPECT_TRUE(Group(Worker()).empty());
 }
 
-TEST_F(TaskTest, TheFifthJobAtOnceYieldsToAllElse) {
+TEST_F(TaskTest, FromTheFifthJobAtOnceOnAllYield) {
   Strings tasks;
-  for (const int scheduler : {SCHED_OTHER, SCHED_OTHER, SCHED_OTHER, SCHED_OTHER, SCHED_IDLE}) {
+  std::vector<pid_t> workers;
+  const auto expect_policy = [&](int policy) {
+    for (const pid_t worker : workers) {
+      std::set<pid_t> processes = Group(worker);
+      processes.insert(worker);
+      for (const pid_t pid : processes) {
+        EXPECT_EQ(sched_getscheduler(pid), policy) << tasks.size();
+      }
+    }
+  };
+  for (int job = 1; job <= 4; ++job) {
     Watch();
     tasks.push_back(StartEndlessJob(R"({"format":"7z","level":"fastest"})"));
     ASSERT_TRUE(IsPacking());
-    for (const pid_t pid : Group(Worker())) {
-      EXPECT_EQ(sched_getscheduler(pid), scheduler);
-    }
+    workers.push_back(Worker());
   }
+  expect_policy(SCHED_OTHER);
+  tasks.push_back(StartEndlessJob());
+  workers.push_back(Worker());
+  expect_policy(SCHED_IDLE);
   for (const std::string& task_id : tasks) {
     EXPECT_EQ(Ask("stop", task_id).code, 0);
   }

@@ -15,6 +15,7 @@
 #include <cstdlib>
 #include <ctime>
 #include <fstream>
+#include <iterator>
 #include <memory>
 #include <optional>
 #include <sstream>
@@ -29,7 +30,7 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr int kJobsAtOnce = 4;  // of a user, that need not yield
+constexpr std::size_t kJobsAtOnce = 4;  // of a user, that need not yield
 constexpr std::chrono::seconds kGrace(5);
 constexpr std::chrono::milliseconds kGroupPoll(5);
 
@@ -61,21 +62,41 @@ std::optional<ProcessStat> ReadStat(pid_t pid) {
 
 bool HasEnded(const ProcessStat& stat) { return stat.state == 'Z' || stat.state == 'X'; }
 
-bool IsGroupAlive(pid_t group) {
-  const std::unique_ptr<DIR, int (*)(DIR*)> processes(opendir("/proc"), closedir);
-  while (const dirent* const entry = processes ? readdir(processes.get()) : nullptr) {
+// The entries of /proc, or of a process's folder "task", that are numbers.
+std::vector<pid_t> IdsIn(const std::string& folder) {
+  std::vector<pid_t> ids;
+  const std::unique_ptr<DIR, int (*)(DIR*)> entries(opendir(folder.c_str()), closedir);
+  while (const dirent* const entry = entries ? readdir(entries.get()) : nullptr) {
     if (std::isdigit(static_cast<unsigned char>(entry->d_name[0])) != 0) {
-      const std::optional<ProcessStat> stat = ReadStat(std::atoi(entry->d_name));
-      if (stat && stat->group == group && !HasEnded(*stat)) {
-        return true;
-      }
+      ids.push_back(std::atoi(entry->d_name));
     }
   }
-  return false;
+  return ids;
+}
+
+std::vector<pid_t> LivingProcesses(const std::set<pid_t>& groups) {
+  std::vector<pid_t> living;
+  for (const pid_t pid : IdsIn("/proc")) {
+    const std::optional<ProcessStat> stat = ReadStat(pid);
+    if (stat && groups.count(stat->group) != 0 && !HasEnded(*stat)) {
+      living.push_back(pid);
+    }
+  }
+  return living;
+}
+
+// The policy for all threads there. A failure costs time, no more.
+void Schedule(const std::set<pid_t>& groups, int policy) {
+  const sched_param none{};
+  for (const pid_t pid : LivingProcesses(groups)) {
+    for (const pid_t thread : IdsIn("/proc/" + std::to_string(pid) + "/task")) {
+      sched_setscheduler(thread, policy, &none);
+    }
+  }
 }
 
 bool WaitForGroup(pid_t group, Clock::time_point deadline) {
-  while (IsGroupAlive(group)) {
+  while (!LivingProcesses({group}).empty()) {
     if (Clock::now() >= deadline) {
       return false;
     }
@@ -102,6 +123,31 @@ void WaitForProcess(const FileDescriptor& process, Clock::time_point deadline) {
   poll(&ended, 1, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
 }
 
+bool IsYielding(pid_t worker) { return sched_getscheduler(worker) == SCHED_IDLE; }
+
+// Answers come before the packing of a crowd. All its jobs yield, so that none waits for the
+// others.
+void YieldIfCrowded(const std::string& user, pid_t newest) {
+  std::set<pid_t> jobs;
+  for (const pid_t worker : StoreOf(user).AllWorkers()) {
+    if (IsWorkerAlive(user, worker)) {
+      jobs.insert(worker);
+    }
+  }
+  if (jobs.size() <= kJobsAtOnce) {
+    return;
+  }
+  // It may not lead its group yet; what it starts will yield like itself.
+  const sched_param none{};
+  sched_setscheduler(newest, SCHED_IDLE, &none);
+  std::set<pid_t> pressing;
+  std::copy_if(jobs.begin(), jobs.end(), std::inserter(pressing, pressing.end()),
+               [](pid_t worker) { return !IsYielding(worker); });
+  if (!pressing.empty()) {
+    Schedule(pressing, SCHED_IDLE);
+  }
+}
+
 }  // namespace
 
 void RegisterWorker(const std::string& user, pid_t pid) {
@@ -109,16 +155,8 @@ void RegisterWorker(const std::string& user, pid_t pid) {
   if (!stat) {
     throw std::runtime_error("no process " + std::to_string(pid));
   }
-  TaskStore& store = StoreOf(user);
-  store.AddWorker(pid, stat->start_time);
-  const std::vector<pid_t> workers = store.AllWorkers();
-  const auto is_alive = [&](pid_t worker) { return IsWorkerAlive(user, worker); };
-  if (workers.size() > kJobsAtOnce &&
-      std::count_if(workers.begin(), workers.end(), is_alive) > kJobsAtOnce) {
-    // Answers come before the packing of a crowd. Failing costs time, no more.
-    const sched_param none{};
-    sched_setscheduler(pid, SCHED_IDLE, &none);
-  }
+  StoreOf(user).AddWorker(pid, stat->start_time);
+  YieldIfCrowded(user, pid);
 }
 
 bool IsWorkerAlive(const std::string& user, pid_t pid) {
@@ -156,6 +194,9 @@ bool EndWorker(const std::string& user, pid_t pid) {
     StoreOf(user).NoteStop(pid);
   } catch (const std::exception& no_room) {
     syslog(LOG_ERR, "stop: %s", no_room.what());
+  }
+  if (IsYielding(pid)) {
+    Schedule({pid}, SCHED_OTHER);
   }
   const Clock::time_point deadline = Clock::now() + kGrace;
   const bool is_told = has_descriptor

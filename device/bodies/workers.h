@@ -11,8 +11,8 @@
 
 namespace Device {
 
-// Enters a process that has just been forked. One beyond the user's fourth at work gets, with all
-// that it starts, the time that nobody else wants. Throws std::runtime_error.
+// Enters a process that has just been forked. From a user's fifth at work on, all of that user's
+// get, with what they have started, the time that nobody else wants. Throws std::runtime_error.
 void RegisterWorker(const std::string& user, pid_t pid);
 
 // True if the process is a worker of the user's and has not ended; a zombie has.
