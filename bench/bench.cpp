@@ -23,9 +23,12 @@ constexpr char kConfig[] = R"({"volumes": ["vol1"],
              {"name": "music", "volume": "vol1", "access": {"alice": "rw"}}]})";
 constexpr uid_t kUid = 65001;
 
-double Median(std::vector<double> values) {
+constexpr double kHalf = 0.5;
+constexpr double kQuarter = 0.25;
+
+double Quantile(std::vector<double> values, double part) {
   std::sort(values.begin(), values.end());
-  return values[values.size() / 2];
+  return values[static_cast<std::size_t>(part * static_cast<double>(values.size()))];
 }
 
 void GiveToUser(const fs::path& path) {
@@ -46,11 +49,14 @@ Medians Compare(const std::function<double()>& ours, const std::function<double(
   theirs();
   std::vector<double> all_ours;
   std::vector<double> all_theirs;
+  std::vector<double> ratios;
   for (int pair = 0; pair < pairs; ++pair) {
     all_ours.push_back(ours());
     all_theirs.push_back(theirs());
+    ratios.push_back(all_ours.back() / all_theirs.back());
   }
-  return {Median(all_ours), Median(all_theirs)};
+  return {Quantile(all_ours, kHalf), Quantile(all_theirs, kHalf), Quantile(ratios, kHalf),
+          Quantile(ratios, kQuarter), Quantile(ratios, 1 - kQuarter)};
 }
 
 void Require(bool holds, const std::string& what) {

@@ -16,15 +16,19 @@ std::string Format(const char* format, double value) {
 }  // namespace
 
 void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
-              double ratio, const std::string& limit) {
+              double ratio, const std::string& limit, const std::string& spread) {
   std::cout << "| " << what << " | " << ours << " | " << theirs << " | " << Format("%.2f", ratio)
-            << " | " << limit << " |" << std::endl;
+            << " | " << spread << " | " << limit << " |" << std::endl;
 }
 
 void PrintRow(const std::string& what, const Medians& medians, const std::string& limit) {
+  PrintRow(what, Milliseconds(medians.ours), Milliseconds(medians.theirs), medians.ratio, limit,
+           Format("%.2f", medians.lower_quarter) + " to " + Format("%.2f", medians.upper_quarter));
+}
+
+std::string Milliseconds(double seconds) {
   constexpr double kMilli = 1000;
-  PrintRow(what, Format("%.4g ms", kMilli * medians.ours),
-           Format("%.4g ms", kMilli * medians.theirs), medians.ours / medians.theirs, limit);
+  return Format("%.4g ms", kMilli * seconds);
 }
 
 }  // namespace Bench

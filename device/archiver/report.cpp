@@ -38,6 +38,11 @@ void Report::Compressing(const std::string& name) {
   }
 }
 
+void Report::Pace(size_t sources) {
+  percent_pause_ = sources * kPausePerSource;
+  next_percent_ = Clock::now() + percent_pause_;
+}
+
 void Report::Progress(uint64_t percent) {
   const Clock::time_point now = Clock::now();
   if (now >= next_percent_) {

@@ -23,7 +23,7 @@ class Report {
   void Progress(uint64_t percent);
   // To be told before the first progress: each one costs the caller a look at what it knows of the
   // job, which grows with the sources, so that of many come seldom.
-  void Pace(size_t sources) { percent_pause_ = sources * kPausePerSource; }
+  void Pace(size_t sources);
   // The archive stands under its final name.
   void Done();
   void Error(const std::string& reason);
@@ -37,7 +37,7 @@ class Report {
   void Percent(int percent);
 
   using Clock = std::chrono::steady_clock;
-  static constexpr std::chrono::microseconds kPausePerSource{20};
+  static constexpr std::chrono::microseconds kPausePerSource{50};
 
   const Cancel& cancel_;
   bool has_total_ = false;
