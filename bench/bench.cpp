@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <cmath>
 #include <fstream>
 #include <stdexcept>
 
@@ -134,17 +135,24 @@ Device::Outcome Workbench::Ask(const std::string& method, const std::string& tas
 }
 
 void Workbench::Finish(const std::string& task_id) {
-  constexpr std::chrono::seconds kPause(1);  // of a client that asks from time to time
+  // Of a client that asks from time to time, of a large job as seldom as "kavo-device compress".
+  constexpr std::chrono::milliseconds kPause(1000);
+  constexpr std::chrono::milliseconds kLongestPause(5000);
+  constexpr int kLeisure = 50;
   Device::Outcome outcome;
+  std::chrono::milliseconds pause = kPause;
   while (!outcome.data["finished"].asBool()) {
-    Device::Launcher::AwaitWorker(kPause);
-    outcome = Ask("status", task_id);
+    Device::Launcher::AwaitWorker(pause);
+    const double took = Seconds([&] { outcome = Ask("status", task_id); });
+    pause = std::clamp(kLeisure * std::chrono::milliseconds(std::lround(1000 * took)), kPause,
+                       kLongestPause);
     Require(outcome.code == 0 && !outcome.data.isMember("errors"), Device::ToText(outcome.data));
   }
 }
 
 double Workbench::Job(const Strings& sources, const std::string& format, const std::string& level) {
   const Device::Request request = Prepare(sources, format, level);
+  sync();  // what the run before has written is not written back during this one
   return Seconds([&] { Finish(Start(request)); });
 }
 
@@ -164,6 +172,7 @@ double Workbench::Bare(const fs::path& folder, const Strings& names, Strings swi
     arguments.push_back(each.data());
   }
   arguments.push_back(nullptr);
+  sync();
   return Seconds([&] {
     const pid_t pid = fork();
     if (pid == 0) {

@@ -21,10 +21,15 @@ namespace Device {
 
 namespace {
 
+using Clock = std::chrono::steady_clock;
+
 constexpr char kApi[] = "KAVO.Zantro.Compress";
 constexpr int kApiVersion = 3;
 constexpr std::chrono::milliseconds kFirstPause(10);
 constexpr std::chrono::milliseconds kLongestPause(250);
+// Of a large job: a pause this many times as long as the answer took, within a limit.
+constexpr int kLeisure = 50;
+constexpr std::chrono::milliseconds kLongestLeisure(5000);
 
 volatile std::sig_atomic_t is_interrupted = 0;
 
@@ -120,14 +125,16 @@ class Job {
         display.Clear();
         return Stop();
       }
+      const Clock::time_point asked = Clock::now();
       const Outcome outcome = AskAboutTask("status");
+      const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - asked);
       if (outcome.code != 0 || outcome.data["finished"].asBool()) {
         display.Clear();
         Launcher::Reap();
         return Report(outcome);
       }
       display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
-      Launcher::AwaitWorker(pause);
+      Launcher::AwaitWorker(std::clamp(kLeisure * took, pause, kLongestLeisure));
       pause = std::min(2 * pause, kLongestPause);
     }
   }
