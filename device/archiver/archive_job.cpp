@@ -25,6 +25,9 @@ namespace Archiver {
 namespace {
 
 constexpr mode_t kFileMode = 0666;  // the umask takes its share
+// Bytes. To hand a smaller file to another thread costs more than to pack it; measured on two cores
+// with 7-Zip 26.02, where the gain is a tenth at 100 bytes and gone at 500.
+constexpr std::uint64_t kTinyFile = 256;
 
 Device::FileDescriptor Open(const std::string& path, int flags) {
   Device::FileDescriptor fd(open(path.c_str(), flags | O_CLOEXEC, kFileMode));
@@ -141,16 +144,17 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
   const std::vector<std::string> listed = Sources(request);
   report.Pace(listed.size());
   const WorkPlace place = FindWorkPlace(listed, request.list_path);
-  const std::unordered_set<std::string> no_files = CheckSources(place, listed);
-  const std::vector<std::string> sources = WithoutNested(listed, no_files);
-  const std::vector<std::string> suspects =
-      Those(sources, [&](const std::string& source) { return no_files.count(source) != 0; });
+  const CheckedSources checked = CheckSources(place, listed);
+  const std::vector<std::string> sources = WithoutNested(listed, checked.no_files);
+  const std::vector<std::string> suspects = Those(
+      sources, [&](const std::string& source) { return checked.no_files.count(source) != 0; });
   const ArchiveState seen = LookAtArchive(request.archive);
   const WorkFolder work(request.archive);
 
   PackRun run;
   run.archive = work.Result();
   run.sources = DivideNames(sources);
+  run.one_thread = checked.no_files.empty() && checked.file_bytes / listed.size() < kTinyFile;
   if (seen.exists && page && HasNamesIn(*page, request.archive)) {
     CopyFile(request.archive, work.Result(), cancel);
     NamesToUtf8(*page, work.Result(), cancel);
