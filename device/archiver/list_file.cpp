@@ -91,7 +91,7 @@ NamesFor7z DivideNames(const std::vector<std::string>& names) {
   NamesFor7z result;
   for (const std::string& name : names) {
     if (IsUtf8(name) && name.find_first_of("\r\n") == std::string::npos) {
-      result.list += '"' + name + "\"\n";
+      result.list.append("\"").append(name).append("\"\n");
     } else {
       result.arguments.push_back(name);
     }

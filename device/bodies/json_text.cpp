@@ -1,11 +1,28 @@
 #include "device/bodies/json_text.h"
 
-#include <memory>
+#include <rapidjson/encodedstream.h>
+#include <rapidjson/error/en.h>
+#include <rapidjson/memorystream.h>
+#include <rapidjson/reader.h>
+#include <rapidjson/stringbuffer.h>
+#include <rapidjson/writer.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdint>
+#include <limits>
 #include <stdexcept>
+#include <utility>
+#include <vector>
 
 namespace Device {
 
 namespace {
+
+using rapidjson::SizeType;
+using Utf8 = rapidjson::UTF8<>;
+using Stream = rapidjson::EncodedInputStream<Utf8, rapidjson::MemoryStream>;
+using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
 
 constexpr char kHexDigits[] = "0123456789abcdefABCDEF";
 constexpr int kHexBase = 16;
@@ -15,66 +32,151 @@ constexpr unsigned long kFirstByteEscape = 0xDC80;
 constexpr unsigned long kLastByteEscape = 0xDCFF;
 constexpr unsigned long kFirstByte = 0x80;
 
-// The parser says "* Line 4, Column 1\n  Missing ...\n", once for each error. No regular
-// expression: what is missing may be quoted at any length.
-std::string FirstError(const std::string& errors) {
-  const std::size_t line = errors.find_first_of("0123456789");
-  const std::size_t column = errors.find_first_of("0123456789", errors.find(','));
-  const std::size_t end = errors.find('\n');
-  const std::size_t reason = errors.find_first_not_of(' ', end + 1);
-  return "line " + errors.substr(line, errors.find(',') - line) + ", column " +
-         errors.substr(column, end - column) + ": " +
-         errors.substr(reason, errors.find('\n', reason) - reason);
+// Makes a value of what the parser comes upon. Its functions answer whether to go on; why not
+// stands in `refusal`.
+class ValueBuilder : public rapidjson::BaseReaderHandler<Utf8, ValueBuilder> {
+ public:
+  ValueBuilder(const Stream& stream, int depth)
+      : stream_(stream), depth_(static_cast<std::size_t>(depth)) {}
+
+  bool Null() { return Add(Json::Value()); }
+  bool Bool(bool value) { return Add(value); }
+  bool Int(int value) { return Add(Json::Int64{value}); }
+  bool Uint(unsigned value) { return Add(Json::Int64{value}); }
+  bool Int64(std::int64_t value) { return Add(Json::Int64{value}); }
+  bool Uint64(std::uint64_t value) {
+    // As everywhere in that library: unsigned is what does not fit else.
+    const bool fits = value <= std::uint64_t{std::numeric_limits<std::int64_t>::max()};
+    return fits ? Int64(static_cast<std::int64_t>(value)) : Add(Json::UInt64{value});
+  }
+  bool Double(double value) { return Add(value); }
+  bool String(const char* text, SizeType length, bool /*is_copy*/) {
+    return Add(Json::Value(text, text + length));
+  }
+  bool Key(const char* text, SizeType length, bool /*is_copy*/) {
+    key_.assign(text, length);
+    if (open_.back()->isMember(key_)) {
+      refusal = "Duplicate key: '" + key_ + "'";
+    }
+    return refusal.empty();
+  }
+  bool StartObject() { return Open(Json::objectValue); }
+  bool StartArray() { return Open(Json::arrayValue); }
+  bool EndObject(SizeType /*members*/) { return Close(); }
+  bool EndArray(SizeType /*elements*/) { return Close(); }
+
+  Json::Value root;
+  std::string refusal;
+
+ private:
+  Json::Value& Place(Json::Value value) {
+    value.setOffsetStart(static_cast<std::ptrdiff_t>(stream_.Tell()));
+    if (open_.empty()) {
+      return root = std::move(value);
+    }
+    if (open_.back()->isArray()) {
+      return open_.back()->append(std::move(value));
+    }
+    return (*open_.back())[key_] = std::move(value);
+  }
+  bool Add(Json::Value value) {
+    Place(std::move(value));
+    return true;
+  }
+  bool Open(Json::ValueType type) {
+    if (open_.size() == depth_) {
+      refusal = "nested too deep";
+      return false;
+    }
+    open_.push_back(&Place(type));
+    return true;
+  }
+  bool Close() {
+    open_.pop_back();
+    return true;
+  }
+
+  const Stream& stream_;
+  std::size_t depth_;
+  std::vector<Json::Value*> open_;  // arrays and objects, each within the one before
+  std::string key_;
+};
+
+std::string PlaceIn(const std::string& text, std::size_t offset) {
+  const auto place = text.begin() + static_cast<std::ptrdiff_t>(std::min(offset, text.size()));
+  const auto line = std::count(text.begin(), place, '\n') + 1;
+  const std::size_t line_end = offset == 0 ? std::string::npos : text.rfind('\n', offset - 1);
+  return "line " + std::to_string(line) + ", column " + std::to_string(offset - line_end);
 }
 
-// Where so many arrays and objects are open for the first time.
-std::size_t LineOfDepth(const std::string& text, int depth) {
-  std::size_t line = 1;
-  bool is_quoted = false;
-  for (std::size_t at = 0; at < text.size() && depth > 0; ++at) {
-    const char each = text[at];
-    line += each == '\n' ? 1 : 0;
-    if (each == '"') {
-      is_quoted = !is_quoted;
-    } else if (is_quoted) {
-      at += each == '\\' ? 1 : 0;
-    } else if (each == '[' || each == '{') {
-      --depth;
-    } else if (each == ']' || each == '}') {
-      ++depth;
+void Write(const Json::Value& value, Writer& writer) {
+  switch (value.type()) {
+    case Json::nullValue:
+      writer.Null();
+      break;
+    case Json::booleanValue:
+      writer.Bool(value.asBool());
+      break;
+    case Json::intValue:
+      writer.Int64(value.asInt64());
+      break;
+    case Json::uintValue:
+      writer.Uint64(value.asUInt64());
+      break;
+    case Json::realValue:
+      std::isfinite(value.asDouble()) ? writer.Double(value.asDouble()) : writer.Null();
+      break;
+    case Json::stringValue: {
+      const char* begin = nullptr;
+      const char* end = nullptr;
+      value.getString(&begin, &end);
+      writer.String(begin, static_cast<SizeType>(end - begin));
+      break;
     }
+    case Json::arrayValue:
+      writer.StartArray();
+      for (const Json::Value& element : value) {
+        Write(element, writer);
+      }
+      writer.EndArray();
+      break;
+    case Json::objectValue:
+      writer.StartObject();
+      for (auto member = value.begin(); member != value.end(); ++member) {
+        const std::string name = member.name();
+        writer.Key(name.data(), static_cast<SizeType>(name.size()));
+        Write(*member, writer);
+      }
+      writer.EndObject();
+      break;
   }
-  return line;
 }
 
 }  // namespace
 
 std::string ToText(const Json::Value& value) {
-  Json::StreamWriterBuilder builder;
-  builder["indentation"] = "";
-  builder["emitUTF8"] = true;
-  return Json::writeString(builder, value);
+  rapidjson::StringBuffer buffer;
+  Writer writer(buffer);
+  Write(value, writer);
+  return {buffer.GetString(), buffer.GetSize()};
 }
 
 Json::Value ParseJson(const std::string& text, int depth) {
-  Json::CharReaderBuilder builder;
-  Json::CharReaderBuilder::strictMode(&builder.settings_);
-  builder["strictRoot"] = false;
-  builder["stackLimit"] = depth;
-  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
-  Json::Value value;
-  std::string errors;
-  bool is_parsed = false;
-  try {
-    is_parsed = reader->parse(text.data(), text.data() + text.size(), &value, &errors);
-  } catch (const Json::Exception&) {
-    throw std::runtime_error("line " + std::to_string(LineOfDepth(text, depth)) +
-                             ": nested too deep");
+  rapidjson::MemoryStream bytes(text.data(), text.size());
+  Stream stream(bytes);
+  ValueBuilder builder(stream, depth);
+  const rapidjson::ParseResult result =
+      rapidjson::Reader().Parse<rapidjson::kParseFullPrecisionFlag>(stream, builder);
+  if (!result) {
+    std::string reason = rapidjson::GetParseError_En(result.Code());
+    reason.pop_back();  // its full stop
+    throw std::runtime_error(PlaceIn(text, result.Offset()) + ": " +
+                             (builder.refusal.empty() ? reason : builder.refusal));
   }
-  if (!is_parsed) {
-    throw std::runtime_error(FirstError(errors));
+  if (stream.Tell() < text.size()) {
+    throw std::runtime_error(PlaceIn(text, stream.Tell()) + ": a zero byte");
   }
-  return value;
+  return std::move(builder.root);
 }
 
 std::string DecodeByteEscapes(std::string json) {

@@ -15,8 +15,9 @@ std::string ToText(const Json::Value& value);
 inline constexpr int kTextDepth = 1000;
 inline constexpr int kParamDepth = kTextDepth - 10;
 
-// Throws std::runtime_error, with line and reason, for a text that is no JSON. Comments, trailing
-// commas and repeated keys are refused.
+// Throws std::runtime_error, with line, column and reason, for a text that is no JSON. Comments,
+// trailing commas and repeated keys are refused. Of each value, getOffsetStart() tells a byte of
+// the text that stands in the line where the value begins.
 Json::Value ParseJson(const std::string& text, int depth = kTextDepth);
 
 // Takes the escapes \udc80 to \udcff, where they stand alone, for the bytes 0x80 to 0xFF, so that a

@@ -1,0 +1,65 @@
+// What the store keeps and requests bring must come back as it went out, byte by byte.
+#include "device/bodies/json_text.h"
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <limits>
+#include <stdexcept>
+#include <string>
+
+namespace {
+
+using Device::ParseJson;
+using Device::ToText;
+
+TEST(JsonTextTest, GoesOutAsItCameIn) {
+  for (const char* text :
+       {"null", "[]", "{}", "-9223372036854775808", "18446744073709551615", "0.1", "-1e300",
+        R"(["",true,[false,{"a":{},"b":[1,-1]}]])", R"("\u0000\u001F\b\f\n\r\t\"\\/")",
+        "\"\x80\xff\xed\xa0\x80 \xc3\xa9\x7f\"", R"({"":1,"k\u0000":2,"é":3})"}) {
+    EXPECT_EQ(ToText(ParseJson(text)), text);
+  }
+  EXPECT_EQ(ToText(ParseJson(" [ \"\\u00e9\\ud83d\\ude00\" , 1.0 ]\n")), "[\"é😀\",1.0]");
+}
+
+TEST(JsonTextTest, NumbersHaveTheTypesOfValuesMadeInTheProgram) {
+  EXPECT_EQ(ParseJson("5"), Json::Value(5));
+  EXPECT_EQ(ParseJson("3000000000"), Json::Value(Json::Int64{3000000000}));
+  EXPECT_EQ(ParseJson("9223372036854775807").type(), Json::intValue);
+  EXPECT_EQ(ParseJson("9223372036854775808").type(), Json::uintValue);
+  EXPECT_EQ(ToText(std::numeric_limits<double>::infinity()), "null");
+}
+
+TEST(JsonTextTest, ValuesKnowTheirLine) {
+  const std::string text = "\xEF\xBB\xBF{\"list\":\n[\n1]}";
+  const Json::Value list = ParseJson(text)["list"];
+  const auto line_of = [&](const Json::Value& value) {
+    return std::count(text.begin(), text.begin() + value.getOffsetStart(), '\n');
+  };
+  EXPECT_EQ(line_of(list), 1);
+  EXPECT_EQ(line_of(list[0]), 2);
+}
+
+TEST(JsonTextTest, WhatIsNoJsonIsRefusedWithItsPlace) {
+  struct Row {
+    std::string text;
+    const char* place;
+  };
+  for (const auto& [text, place] :
+       {Row{"", "line 1, column 1: "}, Row{"[1]\n 2", "line 2, column 2: "},
+        Row{"[1,\n]", "line 2, column 1: "}, Row{"[1] // one", "line 1, column 5: "},
+        Row{"{\"a\":1,\n\"a\":2}", "line 2, column 4: Duplicate key: 'a'"},
+        Row{"\"a\nb\"", "line 1, column 3: "}, Row{R"("\ud800")", "line 1, column 2: "},
+        Row{std::string("[1]\0]", 5), "line 1, column 4: "}, Row{"NaN", "line 1, column 1: "},
+        Row{"01", "line 1, column 2: "}, Row{"[[[]]]", "line 1, column 4: nested too deep"}}) {
+    try {
+      ParseJson(text, 2);
+      ADD_FAILURE() << text;
+    } catch (const std::runtime_error& error) {
+      EXPECT_EQ(std::string(error.what()).rfind(place, 0), 0U) << text << ": " << error.what();
+    }
+  }
+}
+
+}  // namespace
