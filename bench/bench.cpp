@@ -32,6 +32,10 @@ double Quantile(std::vector<double> values, double part) {
   return values[static_cast<std::size_t>(part * static_cast<double>(values.size()))];
 }
 
+Range MiddleHalf(const std::vector<double>& values) {
+  return {Quantile(values, kQuarter), Quantile(values, 1 - kQuarter)};
+}
+
 void GiveToUser(const fs::path& path) {
   Require(geteuid() != 0 || chown(path.c_str(), kUid, Device::kUsersGroup) == 0, "chown");
 }
@@ -45,19 +49,23 @@ double Seconds(const std::function<void()>& body) {
 }
 
 Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
-                int pairs) {
+                std::size_t pairs) {
   ours();
   theirs();
   std::vector<double> all_ours;
   std::vector<double> all_theirs;
   std::vector<double> ratios;
-  for (int pair = 0; pair < pairs; ++pair) {
+  std::vector<double> repeats;
+  for (std::size_t pair = 0; pair < pairs; ++pair) {
     all_ours.push_back(ours());
     all_theirs.push_back(theirs());
     ratios.push_back(all_ours.back() / all_theirs.back());
+    if (pair > 0) {
+      repeats.push_back(all_theirs[pair] / all_theirs[pair - 1]);
+    }
   }
   return {Quantile(all_ours, kHalf), Quantile(all_theirs, kHalf), Quantile(ratios, kHalf),
-          Quantile(ratios, kQuarter), Quantile(ratios, 1 - kQuarter)};
+          MiddleHalf(ratios), MiddleHalf(repeats)};
 }
 
 void Require(bool holds, const std::string& what) {
@@ -135,17 +143,14 @@ Device::Outcome Workbench::Ask(const std::string& method, const std::string& tas
 }
 
 void Workbench::Finish(const std::string& task_id) {
-  // Of a client that asks from time to time, of a large job as seldom as "kavo-device compress".
+  // Of a client that asks from time to time, as "kavo-device compress" does.
   constexpr std::chrono::milliseconds kPause(1000);
-  constexpr std::chrono::milliseconds kLongestPause(5000);
-  constexpr int kLeisure = 50;
   Device::Outcome outcome;
-  std::chrono::milliseconds pause = kPause;
+  std::chrono::milliseconds took(0);
   while (!outcome.data["finished"].asBool()) {
-    Device::Launcher::AwaitWorker(pause);
-    const double took = Seconds([&] { outcome = Ask("status", task_id); });
-    pause = std::clamp(kLeisure * std::chrono::milliseconds(std::lround(1000 * took)), kPause,
-                       kLongestPause);
+    Device::Launcher::AwaitWorker(kPause, took);
+    const double seconds = Seconds([&] { outcome = Ask("status", task_id); });
+    took = std::chrono::milliseconds(std::lround(1000 * seconds));
     Require(outcome.code == 0 && !outcome.data.isMember("errors"), Device::ToText(outcome.data));
   }
 }

@@ -20,7 +20,7 @@ using Strings = std::vector<std::string>;
 // Runs both sides by turns, A B A B, after a first run of each that does not count. Each side
 // returns the seconds it took.
 Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
-                int pairs);
+                std::size_t pairs);
 double Seconds(const std::function<void()>& body);
 
 // Throws std::runtime_error that says what does not hold.

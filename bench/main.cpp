@@ -22,7 +22,7 @@
 namespace Bench {
 namespace {
 
-constexpr int kPairs = 11;  // of what takes many seconds; more of the rest
+constexpr std::size_t kPairs = 11;  // of what takes many seconds; more of the rest
 constexpr std::size_t kMiB = std::size_t{1} << 20U;
 const Strings kZip = {"-tzip", "-mx6"};
 const Strings kStore = {"-tzip", "-mx0"};
@@ -140,7 +140,7 @@ double ForkAndRun(const fs::path& database, const char* sql) {
 }
 
 void Answers(Workbench& bench, const fs::path& folder) {
-  constexpr int kTries = 101;
+  constexpr std::size_t kTries = 101;
   const fs::path database = folder / "least.db";
   ForkAndRun(database,
              "PRAGMA journal_mode = WAL; CREATE TABLE rows (id INTEGER PRIMARY KEY, "

@@ -13,17 +13,22 @@ std::string Format(const char* format, double value) {
   return text;
 }
 
+std::string Text(const Range& range) {
+  return Format("%.2f", range.from) + " to " + Format("%.2f", range.to);
+}
+
 }  // namespace
 
 void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
-              double ratio, const std::string& limit, const std::string& spread) {
+              double ratio, const std::string& limit, const std::string& ratios,
+              const std::string& repeats) {
   std::cout << "| " << what << " | " << ours << " | " << theirs << " | " << Format("%.2f", ratio)
-            << " | " << spread << " | " << limit << " |" << std::endl;
+            << " | " << ratios << " | " << repeats << " | " << limit << " |" << std::endl;
 }
 
 void PrintRow(const std::string& what, const Medians& medians, const std::string& limit) {
   PrintRow(what, Milliseconds(medians.ours), Milliseconds(medians.theirs), medians.ratio, limit,
-           Format("%.2f", medians.lower_quarter) + " to " + Format("%.2f", medians.upper_quarter));
+           Text(medians.ratios), Text(medians.repeats));
 }
 
 std::string Milliseconds(double seconds) {

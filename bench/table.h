@@ -6,20 +6,25 @@
 
 namespace Bench {
 
+struct Range {
+  double from = 0;
+  double to = 0;
+};
+
 // Of pairs of runs, one of each side. What slows the machine for a while counts on both sides of a
 // pair's ratio.
 struct Medians {
   double ours = 0;  // seconds
   double theirs = 0;
-  double ratio = 0;          // the median of the pairs' ratios
-  double lower_quarter = 0;  // of these
-  double upper_quarter = 0;
+  double ratio = 0;  // the median of the pairs' ratios
+  Range ratios;      // the middle half of them
+  Range repeats;     // the middle half of theirs' ratios, one run to the one before: the noise
 };
 
-// Prints a row. `limit` is the ratio to reach; `spread` tells where the pairs' ratios lie, if
-// known.
+// Prints a row. `limit` is the ratio to reach; `ratios` and `repeats` are ranges, if known.
 void PrintRow(const std::string& what, const std::string& ours, const std::string& theirs,
-              double ratio, const std::string& limit, const std::string& spread = "");
+              double ratio, const std::string& limit, const std::string& ratios = "",
+              const std::string& repeats = "");
 void PrintRow(const std::string& what, const Medians& medians, const std::string& limit);
 
 std::string Milliseconds(double seconds);

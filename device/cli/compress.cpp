@@ -27,9 +27,6 @@ constexpr char kApi[] = "KAVO.Zantro.Compress";
 constexpr int kApiVersion = 3;
 constexpr std::chrono::milliseconds kFirstPause(10);
 constexpr std::chrono::milliseconds kLongestPause(250);
-// Of a large job: a pause this many times as long as the answer took, within a limit.
-constexpr int kLeisure = 50;
-constexpr std::chrono::milliseconds kLongestLeisure(5000);
 
 volatile std::sig_atomic_t is_interrupted = 0;
 
@@ -134,7 +131,7 @@ class Job {
         return Report(outcome);
       }
       display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
-      Launcher::AwaitWorker(std::clamp(kLeisure * took, pause, kLongestLeisure));
+      Launcher::AwaitWorker(pause, took);
       pause = std::min(2 * pause, kLongestPause);
     }
   }

@@ -7,6 +7,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <ctime>
@@ -155,8 +156,12 @@ bool Launcher::Reap() {
   return has_reaped;
 }
 
-void Launcher::AwaitWorker(std::chrono::milliseconds longest) {
+void Launcher::AwaitWorker(std::chrono::milliseconds pause, std::chrono::milliseconds answer_time) {
+  constexpr int kLeisure = 50;
+  constexpr std::chrono::milliseconds kLongestLeisure(5000);
   constexpr long kMilli = 1000;
+  const std::chrono::milliseconds longest =
+      std::clamp(kLeisure * answer_time, pause, kLongestLeisure);
   sigset_t child_ended;
   sigset_t saved;
   sigemptyset(&child_ended);
