@@ -51,7 +51,7 @@ double Seconds(const std::function<void()>& body) {
 Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
                 std::size_t pairs) {
   ours();
-  theirs();
+  double before = theirs();
   std::vector<double> all_ours;
   std::vector<double> all_theirs;
   std::vector<double> ratios;
@@ -59,10 +59,10 @@ Medians Compare(const std::function<double()>& ours, const std::function<double(
   for (std::size_t pair = 0; pair < pairs; ++pair) {
     all_ours.push_back(ours());
     all_theirs.push_back(theirs());
-    ratios.push_back(all_ours.back() / all_theirs.back());
-    if (pair > 0) {
-      repeats.push_back(all_theirs[pair] / all_theirs[pair - 1]);
-    }
+    const double after = all_theirs.back();
+    ratios.push_back(all_ours.back() / (kHalf * (before + after)));
+    repeats.push_back(after / before);
+    before = after;
   }
   return {Quantile(all_ours, kHalf), Quantile(all_theirs, kHalf), Quantile(ratios, kHalf),
           MiddleHalf(ratios), MiddleHalf(repeats)};

@@ -11,12 +11,12 @@ struct Range {
   double to = 0;
 };
 
-// Of pairs of runs, one of each side. What slows the machine for a while counts on both sides of a
-// pair's ratio.
+// Of runs by turns. Each of ours is compared with the mean of theirs before and after it, so that
+// what slows the machine for a while counts on both sides.
 struct Medians {
   double ours = 0;  // seconds
   double theirs = 0;
-  double ratio = 0;  // the median of the pairs' ratios
+  double ratio = 0;  // the median of the ratios
   Range ratios;      // the middle half of them
   Range repeats;     // the middle half of theirs' ratios, one run to the one before: the noise
 };

@@ -9,6 +9,7 @@
 #include <iterator>
 #include <memory>
 #include <set>
+#include <utility>
 
 #include "device/archiver/code_page.h"
 #include "device/archiver/failure.h"
@@ -141,11 +142,12 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
   CheckPassword(request);
   const bool recode = request.zip && !CodePage::IsUtf8(request.code_page);
   const auto page = recode ? std::make_unique<CodePage>(request.code_page) : nullptr;
-  const std::vector<std::string> listed = Sources(request);
+  std::vector<std::string> listed = Sources(request);
   report.Pace(listed.size());
   const WorkPlace place = FindWorkPlace(listed, request.list_path);
   const CheckedSources checked = CheckSources(place, listed);
-  const std::vector<std::string> sources = WithoutNested(listed, checked.no_files);
+  const bool are_tiny = checked.no_files.empty() && checked.file_bytes / listed.size() < kTinyFile;
+  const std::vector<std::string> sources = WithoutNested(std::move(listed), checked.no_files);
   const std::vector<std::string> suspects = Those(
       sources, [&](const std::string& source) { return checked.no_files.count(source) != 0; });
   const ArchiveState seen = LookAtArchive(request.archive);
@@ -154,7 +156,7 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
   PackRun run;
   run.archive = work.Result();
   run.sources = DivideNames(sources);
-  run.one_thread = checked.no_files.empty() && checked.file_bytes / listed.size() < kTinyFile;
+  run.one_thread = are_tiny;
   if (seen.exists && page && HasNamesIn(*page, request.archive)) {
     CopyFile(request.archive, work.Result(), cancel);
     NamesToUtf8(*page, work.Result(), cancel);

@@ -76,15 +76,15 @@ std::vector<std::string> ReadSources(const std::string& text, const std::string&
   return listed;
 }
 
-std::vector<std::string> WithoutNested(const std::vector<std::string>& sources,
+std::vector<std::string> WithoutNested(std::vector<std::string> sources,
                                        const std::unordered_set<std::string>& folders) {
-  std::vector<std::string> result;
-  for (const std::string& source : sources) {
-    if (folders.empty() || !HasAncestorIn(folders, source)) {
-      result.push_back(source);
-    }
+  if (!folders.empty()) {
+    const auto is_nested = [&](const std::string& source) {
+      return HasAncestorIn(folders, source);
+    };
+    sources.erase(std::remove_if(sources.begin(), sources.end(), is_nested), sources.end());
   }
-  return result;
+  return sources;
 }
 
 NamesFor7z DivideNames(const std::vector<std::string>& names) {

@@ -14,7 +14,7 @@ std::vector<std::string> ReadSources(const std::string& text, const std::string&
 
 // Drops sources that lie in others, for 7z refuses to meet a file twice. `folders` are those of the
 // sources that others can lie in.
-std::vector<std::string> WithoutNested(const std::vector<std::string>& sources,
+std::vector<std::string> WithoutNested(std::vector<std::string> sources,
                                        const std::unordered_set<std::string>& folders);
 
 // Names as 7z takes them literally under -spd.

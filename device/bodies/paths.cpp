@@ -160,6 +160,8 @@ ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const st
     resolved.error = FindShareFolder(device, user, resolved) ? 0 : kErrNotFound;
     resolved.user_path = "/" + resolved.share_name;
     resolved.real_path = resolved.share_real_path;
+    resolved.user_path.reserve(path.size());
+    resolved.real_path.reserve(resolved.real_path.size() + path.size());
     for (std::size_t part = 1; part < parts.size(); ++part) {
       resolved.user_path.append("/").append(parts[part]);
       resolved.real_path.append("/").append(parts[part]);
