@@ -45,7 +45,7 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<Utf8, ValueBuilder> {
   bool Uint(unsigned value) { return Add(Json::Int64{value}); }
   bool Int64(std::int64_t value) { return Add(Json::Int64{value}); }
   bool Uint64(std::uint64_t value) {
-    // As everywhere in that library: unsigned is what does not fit else.
+    // As in values that the program makes: unsigned only where it must be.
     const bool fits = value <= std::uint64_t{std::numeric_limits<std::int64_t>::max()};
     return fits ? Int64(static_cast<std::int64_t>(value)) : Add(Json::UInt64{value});
   }
