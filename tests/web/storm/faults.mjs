@@ -217,11 +217,14 @@ export async function storeIsDamaged() {
         () => false));
       // A worker may wait for data that went with the store, as long as it is to.
       await until(() => device.processes().length === 1, longest + 5);
-      const said = device.log.slice(logged).match(/is set aside as .*store\.db\.damaged-/g) ?? [];
+      const said = () =>
+        device.log.slice(logged).match(/is set aside as .*store\.db\.damaged-/g)?.length ?? 0;
       const isAside = statSync(file).ino !== inode;
-      require(said.length === (isAside ? 1 : 0) && (isAside || !isSeen),
-        `${name}: ${said.length} lines, ${isAside ? '' : 'not '}set aside`);
-      counts[name] = (counts[name] ?? 0) + said.length;
+      // A worker that sets it aside as its last act may be gone before its line is read.
+      await until(() => said() > 0 || !isAside).catch(() => {});
+      require(said() === (isAside ? 1 : 0) && (isAside || !isSeen),
+        `${name}: ${said()} lines, ${isAside ? '' : 'not '}set aside: ${device.log.slice(logged)}`);
+      counts[name] = (counts[name] ?? 0) + said();
     }
   }
   await isCalm();
