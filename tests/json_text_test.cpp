@@ -28,6 +28,8 @@ TEST(JsonTextTest, NumbersHaveTheTypesOfValuesMadeInTheProgram) {
   EXPECT_EQ(ParseJson("3000000000"), Json::Value(Json::Int64{3000000000}));
   EXPECT_EQ(ParseJson("9223372036854775807").type(), Json::intValue);
   EXPECT_EQ(ParseJson("9223372036854775808").type(), Json::uintValue);
+  EXPECT_EQ(ParseJson("184467440737095516159223372036854775808").asDouble(),
+            184467440737095516159223372036854775808.0);
   EXPECT_EQ(ToText(std::numeric_limits<double>::infinity()), "null");
 }
 
@@ -52,7 +54,8 @@ TEST(JsonTextTest, WhatIsNoJsonIsRefusedWithItsPlace) {
         Row{"{\"a\":1,\n\"a\":2}", "line 2, column 4: Duplicate key: 'a'"},
         Row{"\"a\nb\"", "line 1, column 3: "}, Row{R"("\ud800")", "line 1, column 2: "},
         Row{std::string("[1]\0]", 5), "line 1, column 4: "}, Row{"NaN", "line 1, column 1: "},
-        Row{"01", "line 1, column 2: "}, Row{"[[[]]]", "line 1, column 4: nested too deep"}}) {
+        Row{"01", "line 1, column 2: "}, Row{"[1,922337203685477581e308]", "line 1, column "},
+        Row{"-1e400", "line 1, column "}, Row{"[[[]]]", "line 1, column 4: nested too deep"}}) {
     try {
       ParseJson(text, 2);
       ADD_FAILURE() << text;

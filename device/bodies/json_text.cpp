@@ -8,10 +8,12 @@
 #include <rapidjson/writer.h>
 
 #include <algorithm>
+#include <charconv>
 #include <cmath>
 #include <cstdint>
-#include <limits>
+#include <optional>
 #include <stdexcept>
+#include <system_error>
 #include <utility>
 #include <vector>
 
@@ -32,6 +34,13 @@ constexpr unsigned long kFirstByteEscape = 0xDC80;
 constexpr unsigned long kLastByteEscape = 0xDCFF;
 constexpr unsigned long kFirstByte = 0x80;
 
+template <typename Number>
+std::optional<Number> NumberIn(const char* begin, const char* end) {
+  Number number{};
+  const auto [stop, error] = std::from_chars(begin, end, number);
+  return error == std::errc() && stop == end ? std::optional(number) : std::nullopt;
+}
+
 // Makes a value of what the parser comes upon. Its functions answer whether to go on; why not
 // stands in `refusal`.
 class ValueBuilder : public rapidjson::BaseReaderHandler<Utf8, ValueBuilder> {
@@ -41,15 +50,21 @@ class ValueBuilder : public rapidjson::BaseReaderHandler<Utf8, ValueBuilder> {
 
   bool Null() { return Add(Json::Value()); }
   bool Bool(bool value) { return Add(value); }
-  bool Int(int value) { return Add(Json::Int64{value}); }
-  bool Uint(unsigned value) { return Add(Json::Int64{value}); }
-  bool Int64(std::int64_t value) { return Add(Json::Int64{value}); }
-  bool Uint64(std::uint64_t value) {
+  bool RawNumber(const char* text, SizeType length, bool /*is_copy*/) {
+    const char* end = text + length;
     // As in values that the program makes: unsigned only where it must be.
-    const bool fits = value <= std::uint64_t{std::numeric_limits<std::int64_t>::max()};
-    return fits ? Int64(static_cast<std::int64_t>(value)) : Add(Json::UInt64{value});
+    if (const auto value = NumberIn<std::int64_t>(text, end)) {
+      return Add(Json::Int64{*value});
+    }
+    if (const auto value = NumberIn<std::uint64_t>(text, end)) {
+      return Add(Json::UInt64{*value});
+    }
+    if (const auto value = NumberIn<double>(text, end)) {
+      return Add(*value);
+    }
+    refusal = "number out of range";
+    return false;
   }
-  bool Double(double value) { return Add(value); }
   bool String(const char* text, SizeType length, bool /*is_copy*/) {
     return Add(Json::Value(text, text + length));
   }
@@ -165,8 +180,9 @@ Json::Value ParseJson(const std::string& text, int depth) {
   rapidjson::MemoryStream bytes(text.data(), text.size());
   Stream stream(bytes);
   ValueBuilder builder(stream, depth);
+  // The library's own reading of numbers is wrong for some of more than twenty digits.
   const rapidjson::ParseResult result =
-      rapidjson::Reader().Parse<rapidjson::kParseFullPrecisionFlag>(stream, builder);
+      rapidjson::Reader().Parse<rapidjson::kParseNumbersAsStringsFlag>(stream, builder);
   if (!result) {
     std::string reason = rapidjson::GetParseError_En(result.Code());
     reason.pop_back();  // its full stop
