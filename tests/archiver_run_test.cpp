@@ -1,4 +1,5 @@
 // The archiver as a program: what it packs, and what it leaves behind when it cannot.
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/prctl.h>
 #include <sys/stat.h>
@@ -8,6 +9,10 @@
 #include <algorithm>
 #include <chrono>
 #include <csignal>
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
 #include <filesystem>
 #include <memory>
 
@@ -121,6 +126,44 @@ TEST_F(ArchiverTest, KeepsEveryNameWhateverItHolds) {
     EXPECT_EQ(Unpacked(out / archive), expected);
     EXPECT_EQ(ReadFile(out / archive).substr(0, 2), page == nullptr ? "7z" : "PK");
   }
+}
+
+TEST_F(ArchiverTest, PacksNamedFilesOfEverySize) {
+  for (const size_t size : {1, 255, 256, 20000}) {
+    Strings sources;
+    Tree expected;
+    for (int number = 0; number < 64; ++number) {
+      const std::string name = std::to_string(size) + "-" + std::to_string(number);
+      const std::string text(size, static_cast<char>('0' + number));
+      WriteFile(share / name, text);
+      sources.push_back(name);
+      expected.insert(name + "=" + text);
+    }
+    const std::string archive = std::to_string(size);
+    Good(archive, sources, {"a", "", "", ""});
+    EXPECT_EQ(Unpacked(out / archive), expected);
+  }
+}
+
+TEST_F(ArchiverTest, StoresTimesInTheZoneThatHolds) {
+  constexpr std::time_t kTime = 1'700'000'000;  // 7z rounds odd seconds
+  const timespec times[] = {{kTime, 0}, {kTime, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, (share / "a").c_str(), times, 0), 0);
+  for (const char* zone : {static_cast<const char*>(nullptr), "UTC-9"}) {
+    zone == nullptr ? unsetenv("TZ") : setenv("TZ", zone, 1);
+    tzset();
+    std::tm local{};
+    localtime_r(&kTime, &local);
+    Good("a.zip", {"a"}, {"a", "", "", ""});
+    constexpr size_t kTimeOffset = 10;  // in the first entry's header
+    std::uint32_t stored = 0;
+    std::memcpy(&stored, ReadFile(out / "a.zip").data() + kTimeOffset, sizeof stored);
+    EXPECT_EQ(stored >> 11U & 31U, static_cast<unsigned>(local.tm_hour))
+        << (zone == nullptr ? "none" : zone);
+    EXPECT_EQ(stored >> 16U & 31U, static_cast<unsigned>(local.tm_mday))
+        << (zone == nullptr ? "none" : zone);
+  }
+  unsetenv("TZ");
 }
 
 TEST_F(ArchiverTest, UpdatesAsTheActionsSay) {
