@@ -31,8 +31,9 @@ Json::Value SplitText(const std::string& text, const std::string& separator) {
 // The array itself when every element is a text that can be a path, else an empty one.
 Json::Value OnlyTexts(Json::Value array) {
   for (const Json::Value& element : array) {
-    const std::string text = element.isString() ? element.asString() : "";
-    if (text.empty() || text.find('\0') != std::string::npos) {
+    const char* begin = nullptr;
+    const char* end = nullptr;
+    if (!element.getString(&begin, &end) || begin == end || std::find(begin, end, '\0') != end) {
       return {Json::arrayValue};
     }
   }
