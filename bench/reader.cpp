@@ -34,7 +34,7 @@ void Reader(benchmark::State& state) {
   std::string bytes = Lines();
   char* line = nullptr;
   std::size_t size = 0;
-  for (auto _ : state) {
+  for (auto _ : state) {  // NOLINT(clang-analyzer-deadcode.DeadStores)
     const std::unique_ptr<FILE, int (*)(FILE*)> output(fmemopen(bytes.data(), bytes.size(), "r"),
                                                        std::fclose);
     for (ssize_t length = 0; (length = getline(&line, &size, output.get())) != -1;) {
@@ -47,7 +47,7 @@ BENCHMARK(Reader)->Name(kReader);
 
 void Memchr(benchmark::State& state) {
   const std::string& bytes = Lines();
-  for (auto _ : state) {
+  for (auto _ : state) {  // NOLINT(clang-analyzer-deadcode.DeadStores)
     const char* const end = bytes.data() + bytes.size();
     for (const char* at = bytes.data(); at != end;) {
       const auto* const feed =

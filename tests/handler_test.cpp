@@ -116,6 +116,7 @@ extern "C" void syslog(int /*priority*/, const char* format, ...) {
   std::array<char, 256> line{};
   va_list arguments;
   va_start(arguments, format);
+  // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): it is not
   std::vsnprintf(line.data(), line.size(), format, arguments);
   va_end(arguments);
   last_line = std::strchr(line.data(), ' ') + 1;

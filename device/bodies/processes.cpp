@@ -126,7 +126,7 @@ FILE* StreamOf(FileDescriptor& output, const char* mode, pid_t pid) {
   FILE* const stream =
       fopencookie(reading.get(), mode, {ReadOutput, nullptr, nullptr, CloseOutput});
   if (stream != nullptr) {
-    reading.release();
+    static_cast<void>(reading.release());  // CloseOutput deletes it
   }
   return stream;
 }

@@ -39,7 +39,7 @@ Json::Value InfoOf(const TaskRow& row) {
 
 // The task manager's note has it too, and is small; the request's parameters can be large.
 Json::Value Destination(const TaskRow& row) {
-  const Json::Value title = InfoOf(row)["title"];
+  Json::Value title = InfoOf(row)["title"];
   if (title.isString()) {
     return title;
   }
