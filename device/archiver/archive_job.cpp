@@ -104,18 +104,20 @@ void Pack(const Request& request, PackRun run, const std::string& folder, const 
 
 // The special files are left out of the main run and then added from harmless copies of them, so
 // that links end as links and the rest as empty files, as they do when 7z meets them on its own.
-// `suspects` are the sources that can be special or have some below them.
+// `suspects` are the sources that can be special or have some below them; the run names all
+// sources.
 void PackWithSpecials(const Request& request, PackRun run, std::vector<std::string> left_out,
                       const std::vector<std::string>& sources,
                       const std::vector<std::string>& suspects, const WorkPlace& place,
                       const Cancel& cancel, Report& report) {
   const std::vector<std::string> specials = FindSpecials(place, suspects, request.exclude);
   const std::set<std::string> known(specials.begin(), specials.end());
-  const std::vector<std::string> others =
-      Those(sources, [&](const std::string& source) { return known.count(source) == 0; });
-  if (!others.empty()) {
+  if (!specials.empty()) {
+    run.sources = DivideNames(
+        Those(sources, [&](const std::string& source) { return known.count(source) == 0; }));
+  }
+  if (!run.sources.IsEmpty()) {
     left_out.insert(left_out.end(), specials.begin(), specials.end());
-    run.sources = DivideNames(others);
     run.left_out = DivideNames(left_out);
     run.follow_links = !place.shares.empty();
     run.left_out_links = known;

@@ -1,6 +1,7 @@
 #include "device/archiver/list_file.h"
 
 #include <algorithm>
+#include <memory_resource>
 #include <string_view>
 
 #include "device/archiver/failure.h"
@@ -61,7 +62,8 @@ std::vector<std::string> ReadSources(const std::string& text, const std::string&
   const auto lines = static_cast<size_t>(std::count(text.begin(), text.end(), '\n')) + 1;
   std::vector<std::string> listed;
   listed.reserve(lines);  // so that what `known` looks at stays in its place
-  std::unordered_set<std::string_view> known(lines);
+  std::pmr::monotonic_buffer_resource nodes;
+  std::pmr::unordered_set<std::string_view> known(lines, &nodes);
   ForEachPart(text, '\n', [&](std::string_view line) {
     if (!line.empty()) {
       listed.push_back(Normalize(line));
@@ -90,7 +92,8 @@ std::vector<std::string> WithoutNested(std::vector<std::string> sources,
 NamesFor7z DivideNames(const std::vector<std::string>& names) {
   NamesFor7z result;
   for (const std::string& name : names) {
-    if (IsUtf8(name) && name.find_first_of("\r\n") == std::string::npos) {
+    const auto holds = [&](char byte) { return name.find(byte) != std::string::npos; };
+    if (IsUtf8(name) && !holds('\r') && !holds('\n')) {
       result.list.append("\"").append(name).append("\"\n");
     } else {
       result.arguments.push_back(name);

@@ -19,6 +19,8 @@ std::vector<std::string> WithoutNested(std::vector<std::string> sources,
 
 // Names as 7z takes them literally under -spd.
 struct NamesFor7z {
+  bool IsEmpty() const { return list.empty() && arguments.empty(); }
+
   std::string list;                    // text of a list file
   std::vector<std::string> arguments;  // names that no list line can hold, for the command line
 };
