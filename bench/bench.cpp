@@ -1,14 +1,13 @@
 #include "bench/bench.h"
 
 #include <fcntl.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
 #include <cmath>
 #include <fstream>
-#include <stdexcept>
+#include <memory>
 
 #include "device/bodies/device.h"
 #include "device/bodies/json_text.h"
@@ -24,55 +23,11 @@ constexpr char kConfig[] = R"({"volumes": ["vol1"],
              {"name": "music", "volume": "vol1", "access": {"alice": "rw"}}]})";
 constexpr uid_t kUid = 65001;
 
-constexpr double kHalf = 0.5;
-constexpr double kQuarter = 0.25;
-
-double Quantile(std::vector<double> values, double part) {
-  std::sort(values.begin(), values.end());
-  return values[static_cast<std::size_t>(part * static_cast<double>(values.size()))];
-}
-
-Range MiddleHalf(const std::vector<double>& values) {
-  return {Quantile(values, kQuarter), Quantile(values, 1 - kQuarter)};
-}
-
 void GiveToUser(const fs::path& path) {
   Require(geteuid() != 0 || chown(path.c_str(), kUid, Device::kUsersGroup) == 0, "chown");
 }
 
 }  // namespace
-
-double Seconds(const std::function<void()>& body) {
-  const auto begin = std::chrono::steady_clock::now();
-  body();
-  return std::chrono::duration<double>(std::chrono::steady_clock::now() - begin).count();
-}
-
-Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
-                std::size_t pairs) {
-  ours();
-  double before = theirs();
-  std::vector<double> all_ours;
-  std::vector<double> all_theirs;
-  std::vector<double> ratios;
-  std::vector<double> repeats;
-  for (std::size_t pair = 0; pair < pairs; ++pair) {
-    all_ours.push_back(ours());
-    all_theirs.push_back(theirs());
-    const double after = all_theirs.back();
-    ratios.push_back(all_ours.back() / (kHalf * (before + after)));
-    repeats.push_back(after / before);
-    before = after;
-  }
-  return {Quantile(all_ours, kHalf), Quantile(all_theirs, kHalf), Quantile(ratios, kHalf),
-          MiddleHalf(ratios), MiddleHalf(repeats)};
-}
-
-void Require(bool holds, const std::string& what) {
-  if (!holds) {
-    throw std::runtime_error(what);
-  }
-}
 
 Workbench::Workbench(const fs::path& folder) : folder_(fs::absolute(folder)) {
   fs::remove_all(folder_);
@@ -104,9 +59,10 @@ Strings Workbench::AddFiles(const fs::path& folder, std::size_t count, std::size
   return names;
 }
 
-Device::Request Workbench::Prepare(const Strings& sources, const std::string& format,
-                                   const std::string& level) const {
-  fs::remove(Share("photo") / "out");
+void Workbench::RemoveArchive() const { fs::remove(Share("photo") / "out"); }
+
+Device::Request Workbench::RequestFor(const Strings& sources, const std::string& format,
+                                      const std::string& level) const {
   Json::Value list(Json::arrayValue);
   for (const std::string& source : sources) {
     list.append(source);
@@ -142,52 +98,77 @@ Device::Outcome Workbench::Ask(const std::string& method, const std::string& tas
   return launcher_->Call(request);
 }
 
-void Workbench::Finish(const std::string& task_id) {
-  // Of a client that asks from time to time, as "kavo-device compress" does.
-  constexpr std::chrono::milliseconds kPause(1000);
-  Device::Outcome outcome;
-  std::chrono::milliseconds took(0);
-  while (!outcome.data["finished"].asBool()) {
-    Device::Launcher::AwaitWorker(kPause, took);
-    const double seconds = Seconds([&] { outcome = Ask("status", task_id); });
-    took = std::chrono::milliseconds(std::lround(1000 * seconds));
+pid_t Workbench::Worker() {
+  const std::string id = std::to_string(getpid());
+  std::ifstream children("/proc/" + id + "/task/" + id + "/children");
+  pid_t worker = -1;
+  Require(static_cast<bool>(children >> worker), "no worker");
+  return worker;
+}
+
+Side Workbench::Job(const Strings& sources, const std::string& format, const std::string& level) {
+  const Device::Request request = RequestFor(sources, format, level);
+  struct Task {
+    std::string id;
+    bool is_finished = false;  // said once, when the task is no more
+  };
+  const auto task = std::make_shared<Task>();
+  const auto ask = [this, task] {
+    if (task->is_finished) {
+      return;
+    }
+    const Device::Outcome outcome = Ask("status", task->id);
     Require(outcome.code == 0 && !outcome.data.isMember("errors"), Device::ToText(outcome.data));
-  }
+    task->is_finished = outcome.data["finished"].asBool();
+  };
+  return {[this] { RemoveArchive(); },
+          [this, task, request] {
+            *task = Task{Start(request)};
+            return Worker();
+          },
+          [ask] {
+            // As a client does, "kavo-device compress" for one.
+            const double seconds = Seconds(ask);
+            return Device::Launcher::PauseBeforeAsking(
+                std::chrono::seconds(1), std::chrono::milliseconds(std::lround(1000 * seconds)));
+          },
+          [ask, task](int /*status*/) {
+            ask();
+            Require(task->is_finished, "the worker has ended before its task");
+          }};
 }
 
-double Workbench::Job(const Strings& sources, const std::string& format, const std::string& level) {
-  const Device::Request request = Prepare(sources, format, level);
-  sync();  // what the run before has written is not written back during this one
-  return Seconds([&] { Finish(Start(request)); });
-}
-
-double Workbench::Bare(const fs::path& folder, const Strings& names, Strings switches) {
-  const fs::path list = folder_ / "list";
-  const fs::path archive = folder_ / "bare.out";  // 7z adds an ending where there is none
-  std::ofstream text(list);
-  for (const std::string& name : names) {
-    text << name << '\n';
-  }
-  text.close();
-  fs::remove(archive);
+Side Workbench::Bare(const fs::path& folder, const Strings& names, Strings switches,
+                     const std::string& name) const {
+  const fs::path list = folder_ / (name + ".list");
+  const fs::path archive = folder_ / (name + ".out");  // 7z adds an ending where there is none
   switches.insert(switches.begin(), {"/usr/bin/7z", "a", "-spd", "-bso0", "-bsp0"});
   switches.insert(switches.end(), {archive.string(), "@" + list.string()});
-  std::vector<char*> arguments;
-  for (std::string& each : switches) {
-    arguments.push_back(each.data());
-  }
-  arguments.push_back(nullptr);
-  sync();
-  return Seconds([&] {
-    const pid_t pid = fork();
-    if (pid == 0) {
-      Require(chdir(folder.c_str()) == 0, "chdir");
-      execv(arguments[0], arguments.data());
-      _exit(1);
-    }
-    int status = 0;
-    Require(waitpid(pid, &status, 0) == pid && status == 0, "7z failed");
-  });
+  return {[=] {
+            std::ofstream text(list);
+            for (const std::string& each : names) {
+              text << each << '\n';
+            }
+            fs::remove(archive);
+          },
+          [=] {
+            std::vector<char*> arguments;
+            for (const std::string& each : switches) {
+              arguments.push_back(const_cast<char*>(each.c_str()));
+            }
+            arguments.push_back(nullptr);
+            const pid_t pid = fork();
+            if (pid == 0) {
+              setpgid(0, 0);
+              Require(chdir(folder.c_str()) == 0, "chdir");
+              execv(arguments[0], arguments.data());
+              _exit(1);
+            }
+            Require(pid > 0, "fork");
+            setpgid(pid, pid);
+            return pid;
+          },
+          nullptr, [](int status) { Require(status == 0, "7z failed"); }};
 }
 
 }  // namespace Bench

@@ -1,4 +1,4 @@
-// What the rows of the benchmark share: two sides run by turns, and a device with files to pack.
+// What the rows of the benchmark share: a device with files to pack, and the two ways to pack them.
 #ifndef BENCH_BENCH_H_
 #define BENCH_BENCH_H_
 
@@ -9,22 +9,13 @@
 #include <string>
 #include <vector>
 
-#include "bench/table.h"
+#include "bench/turns.h"
 #include "device/host/launcher.h"
 
 namespace Bench {
 
 namespace fs = std::filesystem;
 using Strings = std::vector<std::string>;
-
-// Runs both sides by turns, A B A B, after a first run of each that does not count. Each side
-// returns the seconds it took.
-Medians Compare(const std::function<double()>& ours, const std::function<double()>& theirs,
-                std::size_t pairs);
-double Seconds(const std::function<void()>& body);
-
-// Throws std::runtime_error that says what does not hold.
-void Require(bool holds, const std::string& what);
 
 // A device with the shared folders photo and music, and a user, alice. One in a process.
 class Workbench {
@@ -36,17 +27,21 @@ class Workbench {
   Strings AddFiles(const fs::path& folder, std::size_t count, std::size_t size,
                    bool is_sparse = false);
 
-  // The request to make /photo/out, which is not there then, of the sources.
-  Device::Request Prepare(const Strings& sources, const std::string& format,
-                          const std::string& level) const;
+  // The request to make /photo/out of the sources.
+  Device::Request RequestFor(const Strings& sources, const std::string& format,
+                             const std::string& level) const;
+  void RemoveArchive() const;
   // The task's id.
   std::string Start(const Device::Request& request);
+  // Of the task that was started, when no other process is this one's child.
+  static pid_t Worker();
   Device::Outcome Ask(const std::string& method, const std::string& task_id);
-  // Until "status" says finished. Throws when the job failed.
-  void Finish(const std::string& task_id);
-  double Job(const Strings& sources, const std::string& format, const std::string& level);
-  // The stock 7z with a list of names, in that folder.
-  double Bare(const fs::path& folder, const Strings& names, Strings switches);
+
+  // A job from "start" until "status" says finished.
+  Side Job(const Strings& sources, const std::string& format, const std::string& level);
+  // The stock 7z with a list of names, in that folder. `name` is of what it leaves.
+  Side Bare(const fs::path& folder, const Strings& names, Strings switches,
+            const std::string& name = "bare") const;
 
  private:
   const fs::path folder_;

@@ -22,7 +22,7 @@
 namespace Bench {
 namespace {
 
-constexpr std::size_t kPairs = 11;  // of what takes many seconds; more of the rest
+constexpr std::size_t kRounds = 11;  // of what takes seconds; more of the rest
 constexpr std::size_t kMiB = std::size_t{1} << 20U;
 const Strings kZip = {"-tzip", "-mx6"};
 const Strings kStore = {"-tzip", "-mx0"};
@@ -30,37 +30,42 @@ const Strings kSevenZip = {"-t7z", "-mx6"};
 
 void TinyFile(Workbench& bench) {
   bench.AddFiles(bench.Share("photo/tiny"), 1, 1024);
+  const Side ours = bench.Job({"/photo/tiny"}, "zip", "normal");
+  const Side theirs = bench.Bare(bench.Share("photo"), {"tiny"}, kZip);
   PrintRow("one file of 1 KiB, until \"status\" says finished",
-           Compare([&] { return bench.Job({"/photo/tiny"}, "zip", "normal"); },
-                   [&] { return bench.Bare(bench.Share("photo"), {"tiny"}, kZip); }, 3 * kPairs),
+           Compare([&] { return RunAlone(ours); }, [&] { return RunAlone(theirs); }, 3 * kRounds),
            "2.5");
+}
+
+Medians CompareJob(Workbench& bench, const Side& job, const fs::path& folder, const Strings& names,
+                   const Strings& switches) {
+  return CompareSideBySide(job, bench.Bare(folder, names, switches),
+                           bench.Bare(folder, names, switches, "again"), kRounds);
 }
 
 void Album(Workbench& bench) {
   bench.AddFiles(bench.Share("photo/album"), 200, 3 * kMiB);
   PrintRow("200 incompressible files of 3 MiB, zip",
-           Compare([&] { return bench.Job({"/photo/album"}, "zip", "normal"); },
-                   [&] { return bench.Bare(bench.Share("photo"), {"album"}, kZip); }, 2 * kPairs),
+           CompareJob(bench, bench.Job({"/photo/album"}, "zip", "normal"), bench.Share("photo"),
+                      {"album"}, kZip),
            "1.02");
 }
 
 void Tree(Workbench& bench) {
   bench.AddFiles(bench.Share("photo/tree"), 20000, 200);
   for (const auto& [format, switches] : {std::pair("zip", kZip), std::pair("7z", kSevenZip)}) {
-    PrintRow(
-        std::string("20,000 small files, ") + format,
-        Compare([&, name = format] { return bench.Job({"/photo/tree"}, name, "normal"); },
-                [&, with = switches] { return bench.Bare(bench.Share("photo"), {"tree"}, with); },
-                3 * kPairs),
-        "1.03");
+    PrintRow(std::string("20,000 small files, ") + format,
+             CompareJob(bench, bench.Job({"/photo/tree"}, format, "normal"), bench.Share("photo"),
+                        {"tree"}, switches),
+             "1.03");
   }
 }
 
 void LargeFile(Workbench& bench) {
   bench.AddFiles(bench.Share("photo/large"), 1, 2048 * kMiB, true);
   PrintRow("one file of 2 GiB, \"store\"",
-           Compare([&] { return bench.Job({"/photo/large"}, "zip", "store"); },
-                   [&] { return bench.Bare(bench.Share("photo"), {"large"}, kStore); }, 5 * kPairs),
+           CompareJob(bench, bench.Job({"/photo/large"}, "zip", "store"), bench.Share("photo"),
+                      {"large"}, kStore),
            "1.02");
 }
 
@@ -74,14 +79,8 @@ void TwoShares(Workbench& bench) {
   Strings with = kZip;
   with.push_back("-l");
   PrintRow("two shared folders, 10,000 small files each",
-           Compare(
-               [&] {
-                 return bench.Job({"/photo/half", "/music/half"}, "zip", "normal");
-               },
-               [&] {
-                 return bench.Bare(stage, {"photo/half", "music/half"}, with);
-               },
-               3 * kPairs),
+           CompareJob(bench, bench.Job({"/photo/half", "/music/half"}, "zip", "normal"), stage,
+                      {"photo/half", "music/half"}, with),
            "1.05");
 }
 
@@ -93,8 +92,7 @@ Medians CompareSources(Workbench& bench, const std::string& folder, std::size_t 
   for (const std::string& name : names) {
     sources.push_back("/photo/" + folder + "/" + name);
   }
-  return Compare([&] { return bench.Job(sources, "zip", "normal"); },
-                 [&] { return bench.Bare(place, names, kZip); }, kPairs);
+  return CompareJob(bench, bench.Job(sources, "zip", "normal"), place, names, kZip);
 }
 
 // With the exponent of the cost's growth between the first and the last number.
@@ -150,7 +148,8 @@ void Answers(Workbench& bench, const fs::path& folder) {
            Compare(
                [&] {
                  std::string id;
-                 const Device::Request request = bench.Prepare({"/photo/endless"}, "7z", "best");
+                 bench.RemoveArchive();
+                 const Device::Request request = bench.RequestFor({"/photo/endless"}, "7z", "best");
                  const double seconds = Seconds([&] { id = bench.Start(request); });
                  bench.Ask("stop", id);
                  return seconds;
@@ -162,7 +161,7 @@ void Answers(Workbench& bench, const fs::path& folder) {
                },
                kTries),
            "3");
-  const std::string id = bench.Start(bench.Prepare({"/photo/endless"}, "7z", "best"));
+  const std::string id = bench.Start(bench.RequestFor({"/photo/endless"}, "7z", "best"));
   PrintRow(
       "\"status\"",
       Compare(
@@ -202,21 +201,8 @@ void WorkerMemory(Workbench& bench) {
     bytes_of_paths += static_cast<double>(many.back().size());
   }
   for (const Strings& sources : {Strings{"/photo/endless"}, many}) {
-    const std::string id = bench.Start(bench.Prepare(sources, "zip", "best"));
-    pid_t worker = -1;
-    for (const auto& entry : fs::directory_iterator("/proc")) {
-      std::ifstream stat(entry.path() / "stat");
-      std::string pid;
-      std::string name;
-      std::string state;
-      pid_t parent = 0;
-      pid_t group = 0;
-      if (stat >> pid >> name >> state >> parent >> group && std::to_string(group) == pid &&
-          parent == getpid()) {
-        worker = group;
-      }
-    }
-    Require(worker > 0, "no worker");
+    const std::string id = bench.Start(bench.RequestFor(sources, "zip", "best"));
+    const pid_t worker = Workbench::Worker();
     // With its sources checked and listed, it starts the archiver.
     while (bench.Ask("status", id).code == 0 && !HasArchiver(worker)) {
       poll(nullptr, 0, 1);
@@ -230,6 +216,8 @@ void WorkerMemory(Workbench& bench) {
     PrintRow(is_many ? "memory of a worker with 100,000 sources" : "memory of a worker", ours.str(),
              theirs.str(), PrivateBytes(worker) / limit, "1");
     bench.Ask("stop", id);
+    while (waitpid(-1, nullptr, 0) > 0) {  // the worker and its archiver
+    }
   }
 }
 

@@ -11,14 +11,12 @@ struct Range {
   double to = 0;
 };
 
-// Of runs by turns. Each of ours is compared with the mean of theirs before and after it, so that
-// what slows the machine for a while counts on both sides.
 struct Medians {
   double ours = 0;  // seconds
   double theirs = 0;
   double ratio = 0;  // the median of the ratios
   Range ratios;      // the middle half of them
-  Range repeats;     // the middle half of theirs' ratios, one run to the one before: the noise
+  Range repeats;     // the middle half of theirs' ratios to theirs: the noise
 };
 
 // Prints a row. `limit` is the ratio to reach; `ratios` and `repeats` are ranges, if known.

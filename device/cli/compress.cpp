@@ -131,7 +131,7 @@ class Job {
         return Report(outcome);
       }
       display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
-      Launcher::AwaitWorker(pause, took);
+      Launcher::AwaitWorker(Launcher::PauseBeforeAsking(pause, took));
       pause = std::min(2 * pause, kLongestPause);
     }
   }

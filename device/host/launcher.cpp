@@ -156,12 +156,8 @@ bool Launcher::Reap() {
   return has_reaped;
 }
 
-void Launcher::AwaitWorker(std::chrono::milliseconds pause, std::chrono::milliseconds answer_time) {
-  constexpr int kLeisure = 50;
-  constexpr std::chrono::milliseconds kLongestLeisure(5000);
+void Launcher::AwaitWorker(std::chrono::milliseconds pause) {
   constexpr long kMilli = 1000;
-  const std::chrono::milliseconds longest =
-      std::clamp(kLeisure * answer_time, pause, kLongestLeisure);
   sigset_t child_ended;
   sigset_t saved;
   sigemptyset(&child_ended);
@@ -169,12 +165,19 @@ void Launcher::AwaitWorker(std::chrono::milliseconds pause, std::chrono::millise
   // Held back, the signal of one that ends from now on is not missed.
   sigprocmask(SIG_BLOCK, &child_ended, &saved);
   if (!Reap()) {
-    const timespec time = {static_cast<std::time_t>(longest.count() / kMilli),
-                           static_cast<long>(longest.count() % kMilli) * kMilli * kMilli};
+    const timespec time = {static_cast<std::time_t>(pause.count() / kMilli),
+                           static_cast<long>(pause.count() % kMilli) * kMilli * kMilli};
     sigtimedwait(&child_ended, nullptr, &time);
     Reap();
   }
   sigprocmask(SIG_SETMASK, &saved, nullptr);
+}
+
+std::chrono::milliseconds Launcher::PauseBeforeAsking(std::chrono::milliseconds pause,
+                                                      std::chrono::milliseconds answer_time) {
+  constexpr int kLeisure = 50;
+  constexpr std::chrono::milliseconds kLongestLeisure(5000);
+  return std::clamp(kLeisure * answer_time, pause, kLongestLeisure);
 }
 
 }  // namespace Device

@@ -59,10 +59,13 @@ class Launcher {
   // Takes leave of workers that have ended. False when none has.
   static bool Reap();
 
-  // The same, but waits for one, for `pause` at the most; a signal ends the waiting too. For who
-  // asks about a task from time to time: when the last answer took long, as that of a large job
-  // does, the pause is 50 times as long as it took, up to 5 s.
-  static void AwaitWorker(std::chrono::milliseconds pause, std::chrono::milliseconds answer_time);
+  // The same, but waits for one, for `pause` at the most; a signal ends the waiting too.
+  static void AwaitWorker(std::chrono::milliseconds pause);
+
+  // For who asks about a task from time to time: `pause`, or, when the last answer took long, as
+  // that of a large job does, 50 times as long as it took, up to 5 s.
+  static std::chrono::milliseconds PauseBeforeAsking(std::chrono::milliseconds pause,
+                                                     std::chrono::milliseconds answer_time);
 
  private:
   // Null, and the host's error code in `code`, when no row serves the request.
