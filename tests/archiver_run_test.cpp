@@ -16,10 +16,6 @@
 #include <filesystem>
 #include <memory>
 
-#include "device/archiver/cancel.h"
-#include "device/archiver/failure.h"
-#include "device/archiver/report.h"
-#include "device/archiver/stock_7z.h"
 #include "tests/emulation.h"
 #include "tests/unpacked.h"
 
@@ -364,45 +360,6 @@ TEST_F(ArchiverTest, HidesThePasswordFromOtherUsers) {
     EXPECT_EQ(command.find("geheim"), std::string::npos) << command;
   }
   EXPECT_EQ(processes, 3);  // supervisor, job, stock 7z
-}
-
-// What 7z says on standard error, a heading, the cause and the object on lines of their own.
-TEST(Run7z, TellsCauseAndObjectInOneLine) {
-  const struct {
-    const char *script, *line;
-  } rows[] = {
-      {"/nonexistent/7z", "cannot start '/nonexistent/7z': No such file or directory"},
-      {"kill -9 $$", "7z was killed by signal 9"},
-      {"exit 2", "7z failed with status 2"},
-      {"echo 'ERROR: oops' >&2", "7z failed with status 0: oops"},
-      {R"(printf '\n\nSystem ERROR:\nerrno=28 : No space left\n' >&2; exit 2)",
-       "7z failed with status 2: No space left"},
-      {R"(printf '\nWARNING: errno=13 : Permission den' >&2; exit 1)",
-       "7z failed with status 1: Permission den"},
-      {R"(printf 'Error:\ncannot open file\n/v/x\nerrno=36 : Long\n\n\nSystem ERROR:\n' >&2
-          printf 'errno=36 : Long\n' >&2; exit 2)",
-       "7z failed with status 2: cannot open file; /v/x; Long"},
-      {R"(printf 'WARNING: errno=2 : Gone\nleft out\n' >&2; exit 2)", "7z failed with status 2"},
-      {R"(printf 'WARNING: errno=2 : Gone\nleft out\nWARNING: errno=2 : Lost\na\n' >&2; exit 1)",
-       "not everything can be packed: Lost; a"},
-      // At a warning 7z is not waited for.
-      {R"(printf 'WARNING: errno=2 : No\nError: File name too long\033[m\n' >&2; exec sleep 60)",
-       "not everything can be packed: No; File_name_too_long?[m"}};
-  for (const auto& row : rows) {
-    const Archiver::Cancel cancel(STDOUT_FILENO);
-    Archiver::Report report(cancel);
-    Archiver::Child7z child;
-    child.program = *row.script == '/' ? row.script : "/bin/sh";
-    child.arguments = {"-c", row.script};
-    child.folder = "/";
-    child.left_out = {"left out"};
-    try {
-      Archiver::Run7z(child, cancel, report);
-      ADD_FAILURE() << "succeeded: " << row.script;
-    } catch (const Archiver::Failure& failure) {
-      EXPECT_STREQ(failure.what(), row.line);
-    }
-  }
 }
 
 }  // namespace
