@@ -33,6 +33,25 @@ Range MiddleHalf(const std::vector<double>& values) {
   return {Quantile(values, kQuarter), Quantile(values, 1 - kQuarter)};
 }
 
+struct Samples {
+  void Add(double our, double their, double their_repeat) {
+    ours.push_back(our);
+    theirs.push_back(their);
+    ratios.push_back(our / their);
+    repeats.push_back(their_repeat);
+  }
+
+  Medians Summary() const {
+    return {Quantile(ours, kHalf), Quantile(theirs, kHalf), Quantile(ratios, kHalf),
+            MiddleHalf(ratios), MiddleHalf(repeats)};
+  }
+
+  std::vector<double> ours;
+  std::vector<double> theirs;  // what each of ours is compared with
+  std::vector<double> ratios;
+  std::vector<double> repeats;  // theirs to theirs
+};
+
 // A side at work. It moves on only in its turns.
 class Run {
  public:
@@ -94,31 +113,21 @@ Medians Compare(const std::function<double()>& ours, const std::function<double(
                 std::size_t pairs) {
   ours();
   double before = theirs();
-  std::vector<double> all_ours;
-  std::vector<double> all_theirs;
-  std::vector<double> ratios;
-  std::vector<double> repeats;
+  Samples samples;
   for (std::size_t pair = 0; pair < pairs; ++pair) {
-    all_ours.push_back(ours());
-    all_theirs.push_back(theirs());
-    const double after = all_theirs.back();
-    ratios.push_back(all_ours.back() / (kHalf * (before + after)));
-    repeats.push_back(after / before);
+    const double our = ours();
+    const double after = theirs();
+    samples.Add(our, kHalf * (before + after), after / before);
     before = after;
   }
-  return {Quantile(all_ours, kHalf), Quantile(all_theirs, kHalf), Quantile(ratios, kHalf),
-          MiddleHalf(ratios), MiddleHalf(repeats)};
+  return samples.Summary();
 }
 
 Medians CompareSideBySide(const Side& ours, const Side& theirs, const Side& theirs_again,
                           std::size_t rounds) {
-  const std::array<const Side*, 3> sides = {&ours, &theirs, &theirs_again};
-  std::vector<double> all_ours;
-  std::vector<double> all_theirs;
-  std::vector<double> ratios;
-  std::vector<double> repeats;
+  Samples samples;
   for (std::size_t round = 0; round < rounds; ++round) {
-    for (const Side* side : sides) {
+    for (const Side* side : {&ours, &theirs, &theirs_again}) {
       side->prepare();
     }
     sync();  // what the round before has written is not written back during this one
@@ -136,13 +145,10 @@ Medians CompareSideBySide(const Side& ours, const Side& theirs, const Side& thei
         }
       }
     }
-    all_ours.push_back(runs[0].Took());
-    all_theirs.push_back(kHalf * (runs[1].Took() + runs[2].Took()));
-    ratios.push_back(all_ours.back() / all_theirs.back());
-    repeats.push_back(runs[2].Took() / runs[1].Took());
+    samples.Add(runs[0].Took(), kHalf * (runs[1].Took() + runs[2].Took()),
+                runs[2].Took() / runs[1].Took());
   }
-  return {Quantile(all_ours, kHalf), Quantile(all_theirs, kHalf), Quantile(ratios, kHalf),
-          MiddleHalf(ratios), MiddleHalf(repeats)};
+  return samples.Summary();
 }
 
 double RunAlone(const Side& side) {

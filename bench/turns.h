@@ -30,8 +30,10 @@ Medians Compare(const std::function<double()>& ours, const std::function<double(
 
 // For work of a second or more, in the course of which the machine's own speed changes: runs ours,
 // theirs and theirs once more side by side, each held still while another moves on, by turns of a
-// small part of a second. Only the time in which a side moved on counts. Ours is compared with the
-// mean of theirs; that both of theirs differ shows the noise.
+// small part of a second. Only the time in which a side moved on counts; clocks and the kernel's
+// own writing go on while a side is held, so that a wait for a timer shows only in part: compare
+// short work, too, whose sides run alone. Ours is compared with the mean of theirs; how far the two
+// of theirs differ is the noise.
 Medians CompareSideBySide(const Side& ours, const Side& theirs, const Side& theirs_again,
                           std::size_t rounds);
 
