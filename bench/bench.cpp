@@ -9,9 +9,9 @@
 #include <fstream>
 #include <memory>
 
-#include "device/bodies/device.h"
-#include "device/bodies/json_text.h"
+#include "device/base/json_text.h"
 #include "device/host/sessions.h"
+#include "device/model/device.h"
 
 namespace Bench {
 

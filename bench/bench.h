@@ -1,6 +1,5 @@
 // What the rows of the benchmark share: a device with files to pack, and the two ways to pack them.
-#ifndef BENCH_BENCH_H_
-#define BENCH_BENCH_H_
+#pragma once
 
 #include <filesystem>
 #include <functional>
@@ -51,5 +50,3 @@ class Workbench {
 };
 
 }  // namespace Bench
-
-#endif  // BENCH_BENCH_H_

@@ -16,7 +16,7 @@
 #include <sstream>
 
 #include "bench/bench.h"
-#include "device/bodies/device.h"
+#include "device/model/device.h"
 #include "platform/klib/system.h"
 
 namespace Bench {

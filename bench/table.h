@@ -1,6 +1,5 @@
 // The table that the benchmark prints, in Markdown.
-#ifndef BENCH_TABLE_H_
-#define BENCH_TABLE_H_
+#pragma once
 
 #include <string>
 
@@ -28,5 +27,3 @@ void PrintRow(const std::string& what, const Medians& medians, const std::string
 std::string Milliseconds(double seconds);
 
 }  // namespace Bench
-
-#endif  // BENCH_TABLE_H_

@@ -11,7 +11,7 @@
 #include <stdexcept>
 #include <vector>
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Bench {
 

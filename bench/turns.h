@@ -1,6 +1,5 @@
 // Compares two ways to do the same work, run by turns.
-#ifndef BENCH_TURNS_H_
-#define BENCH_TURNS_H_
+#pragma once
 
 #include <sys/types.h>
 
@@ -45,5 +44,3 @@ double Seconds(const std::function<void()>& body);
 void Require(bool holds, const std::string& what);
 
 }  // namespace Bench
-
-#endif  // BENCH_TURNS_H_

@@ -1,7 +1,6 @@
 // The handler of the web API "KAVO.Zantro.Compress": packs files and folders of shared folders into
 // one archive, in a background worker. One file for each method and for each step of the worker.
-#ifndef COMPRESS_KAVO_ZANTRO_COMPRESS_H_
-#define COMPRESS_KAVO_ZANTRO_COMPRESS_H_
+#pragma once
 
 #include <json/json.h>
 #include <sys/types.h>
@@ -118,5 +117,3 @@ class ZantroCompressHandler final : public FileWebAPI {
 };
 
 }  // namespace Zantro
-
-#endif  // COMPRESS_KAVO_ZANTRO_COMPRESS_H_

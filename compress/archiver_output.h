@@ -1,6 +1,5 @@
 // The lines that the archiver prints, and what they mean. No I/O.
-#ifndef COMPRESS_ARCHIVER_OUTPUT_H_
-#define COMPRESS_ARCHIVER_OUTPUT_H_
+#pragma once
 
 #include <cstdint>
 #include <string>
@@ -27,5 +26,3 @@ struct ArchiverEvent {
 ArchiverEvent ParseArchiverLine(std::string_view line);
 
 }  // namespace Zantro
-
-#endif  // COMPRESS_ARCHIVER_OUTPUT_H_

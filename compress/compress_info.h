@@ -1,7 +1,6 @@
 // The record of one compress job: what the worker's steps learn about the request, passed by
 // reference from step to step. Each step fills the fields it owns and reads those of earlier steps.
-#ifndef COMPRESS_COMPRESS_INFO_H_
-#define COMPRESS_COMPRESS_INFO_H_
+#pragma once
 
 #include <string>
 #include <vector>
@@ -29,5 +28,3 @@ struct _tag_CompressInfo_ {    // NOLINT: the device's name
 };
 
 }  // namespace Zantro
-
-#endif  // COMPRESS_COMPRESS_INFO_H_

@@ -1,7 +1,6 @@
 // The web API error codes that this API sets itself; those of the file manager's library are passed
 // on as they come.
-#ifndef COMPRESS_ERROR_CODES_H_
-#define COMPRESS_ERROR_CODES_H_
+#pragma once
 
 namespace Zantro {
 
@@ -20,5 +19,3 @@ enum ErrorCode : int {
 };
 
 }  // namespace Zantro
-
-#endif  // COMPRESS_ERROR_CODES_H_

@@ -1,7 +1,6 @@
 // One line of the list that tells the archiver what to pack: "." and the entry's name, which begins
 // with "/". No I/O.
-#ifndef COMPRESS_LIST_LINE_H_
-#define COMPRESS_LIST_LINE_H_
+#pragma once
 
 #include <cstddef>
 #include <cstdio>
@@ -36,5 +35,3 @@ class ListLine {
 };
 
 }  // namespace Zantro
-
-#endif  // COMPRESS_LIST_LINE_H_

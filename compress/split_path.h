@@ -1,6 +1,5 @@
 // A path taken apart by basename and dirname.
-#ifndef COMPRESS_SPLIT_PATH_H_
-#define COMPRESS_SPLIT_PATH_H_
+#pragma once
 
 #include <libgen.h>
 
@@ -39,5 +38,3 @@ class SplitPath {
 };
 
 }  // namespace Zantro
-
-#endif  // COMPRESS_SPLIT_PATH_H_

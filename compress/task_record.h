@@ -1,6 +1,5 @@
 // The task record: what "start", the worker, "status" and "stop" share through the task manager.
-#ifndef COMPRESS_TASK_RECORD_H_
-#define COMPRESS_TASK_RECORD_H_
+#pragma once
 
 #include <cstdint>
 #include <string>
@@ -49,5 +48,3 @@ inline constexpr int kDataWaitSeconds = 60;
 void WriteTaskProgress(const std::string& file, float progress, std::uint64_t total_size);
 
 }  // namespace Zantro
-
-#endif  // COMPRESS_TASK_RECORD_H_

@@ -7,7 +7,7 @@
 #include <regex>
 #include <set>
 
-#include "device/bodies/operations.h"
+#include "device/platform/operations.h"
 #include "tests/device_fixture.h"
 
 // Null without the leak checker.

@@ -5,8 +5,8 @@
 #include <csignal>
 #include <filesystem>
 
-#include "device/bodies/config.h"
-#include "device/bodies/json_text.h"
+#include "device/base/json_text.h"
+#include "device/model/config.h"
 #include "tests/device_fixture.h"
 
 namespace {

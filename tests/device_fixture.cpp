@@ -16,9 +16,9 @@
 #include <memory>
 #include <regex>
 
-#include "device/bodies/json_text.h"
-#include "device/bodies/operations.h"
+#include "device/base/json_text.h"
 #include "device/host/sessions.h"
+#include "device/platform/operations.h"
 #include "tests/emulation.h"
 #include "tests/libc_calls.h"
 

@@ -1,6 +1,5 @@
 // A device of its own for each test, in a temporary folder, with the built module loaded.
-#ifndef TESTS_DEVICE_FIXTURE_H_
-#define TESTS_DEVICE_FIXTURE_H_
+#pragma once
 
 #include <gtest/gtest.h>
 #include <json/json.h>
@@ -11,8 +10,8 @@
 #include <string>
 #include <vector>
 
-#include "device/bodies/device.h"
 #include "device/host/launcher.h"
+#include "device/model/device.h"
 #include "tests/programs.h"
 #include "tests/table.h"
 
@@ -89,5 +88,3 @@ class DeviceTest : public testing::Test {
   const std::string device_ = temp_.Path() + "/device";
   std::optional<Device::Launcher> launcher_;
 };
-
-#endif  // TESTS_DEVICE_FIXTURE_H_

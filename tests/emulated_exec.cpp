@@ -10,7 +10,7 @@
 #include <string>
 #include <vector>
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 #include "tests/emulation.h"
 
 namespace {

@@ -1,6 +1,5 @@
 // Whether the tests run under an emulator of user programs, and what they make of it.
-#ifndef TESTS_EMULATION_H_
-#define TESTS_EMULATION_H_
+#pragma once
 
 #include <filesystem>
 
@@ -10,5 +9,3 @@ inline const bool kIsEmulated = std::filesystem::read_symlink("/proc/thread-self
 
 // How many times longer than usual things may take.
 inline const int kSlowness = kIsEmulated ? 5 : 1;
-
-#endif  // TESTS_EMULATION_H_

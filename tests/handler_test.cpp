@@ -11,9 +11,9 @@
 #include <functional>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "device/bodies/json_text.h"
-#include "device/bodies/operations.h"
-#include "device/host/request_state.h"
+#include "device/base/json_text.h"
+#include "device/platform/kavo/request_state.h"
+#include "device/platform/operations.h"
 #include "tests/programs.h"
 
 namespace {

@@ -4,7 +4,7 @@
 
 #include <filesystem>
 
-#include "device/bodies/operations.h"
+#include "device/platform/operations.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
 #include "tests/unpacked.h"

@@ -1,5 +1,5 @@
 // What the store keeps and requests bring must come back as it went out, byte by byte.
-#include "device/bodies/json_text.h"
+#include "device/base/json_text.h"
 
 #include <gtest/gtest.h>
 

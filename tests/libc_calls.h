@@ -1,7 +1,6 @@
 // What the module asks of libc: seen in the trace, between the platform's operations, and made to
 // fail. Calls of other code in the process are left alone.
-#ifndef TESTS_LIBC_CALLS_H_
-#define TESTS_LIBC_CALLS_H_
+#pragma once
 
 #include <string>
 
@@ -27,5 +26,3 @@ void SetLibcFault(const LibcFault& fault);
 
 // The list files and staging folders made since the folder was set that are still there.
 Strings StagedPaths();
-
-#endif  // TESTS_LIBC_CALLS_H_

@@ -1,6 +1,5 @@
 // Files, folders and programs of a test's own.
-#ifndef TESTS_PROGRAMS_H_
-#define TESTS_PROGRAMS_H_
+#pragma once
 
 #include <sys/types.h>
 
@@ -61,5 +60,3 @@ struct Ran {
   std::string err;
 };
 Ran RunProgram(const Strings& arguments, const std::string& folder = "/");
-
-#endif  // TESTS_PROGRAMS_H_

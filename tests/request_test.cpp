@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <filesystem>
 
-#include "device/bodies/json_text.h"
-#include "device/bodies/operations.h"
-#include "device/bodies/task_store.h"
+#include "device/base/json_text.h"
+#include "device/platform/operations.h"
+#include "device/tasks/task_store.h"
 #include "tests/device_fixture.h"
 
 namespace {

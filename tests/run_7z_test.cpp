@@ -1,7 +1,7 @@
 // What the module hands to the archiver and makes of its lines, with a program in its place that
 // prints them. Runs that fail stand in tests/tables/failed_jobs.
-#include "device/bodies/json_text.h"
-#include "device/bodies/operations.h"
+#include "device/base/json_text.h"
+#include "device/platform/operations.h"
 #include "tests/device_fixture.h"
 
 namespace {

@@ -2,8 +2,8 @@
 // stand in tests/sequences. Failures are tested against their beginnings.
 #include <gmock/gmock.h>
 
-#include "device/bodies/device.h"
-#include "device/bodies/operations.h"
+#include "device/model/device.h"
+#include "device/platform/operations.h"
 #include "tests/device_fixture.h"
 
 namespace {

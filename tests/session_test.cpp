@@ -2,8 +2,8 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include "device/bodies/errors.h"
 #include "device/host/sessions.h"
+#include "device/platform/lumo/errors.h"
 #include "platform/lumo/file_manager.h"
 #include "tests/device_fixture.h"
 

@@ -8,9 +8,9 @@
 #include <csignal>
 #include <filesystem>
 
-#include "device/bodies/json_text.h"
-#include "device/bodies/task_store.h"
-#include "device/bodies/workers.h"
+#include "device/base/json_text.h"
+#include "device/tasks/task_store.h"
+#include "device/tasks/workers.h"
 #include "tests/device_fixture.h"
 #include "tests/emulation.h"
 #include "tests/libc_calls.h"

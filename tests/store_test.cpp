@@ -4,8 +4,8 @@
 #include <filesystem>
 #include <map>
 
-#include "device/bodies/json_text.h"
-#include "device/bodies/task_store.h"
+#include "device/base/json_text.h"
+#include "device/tasks/task_store.h"
 #include "tests/device_fixture.h"
 
 namespace {

@@ -1,7 +1,6 @@
 // Tables of cases in tests/tables: a row is a line with its name and lines of "key: value"; a key
 // may stand several times; an empty line ends the row. In values \n is a line feed and \s a blank.
-#ifndef TESTS_TABLE_H_
-#define TESTS_TABLE_H_
+#pragma once
 
 #include <gtest/gtest.h>
 
@@ -29,5 +28,3 @@ std::vector<TableRow> ReadTable(const std::string& name);
 #define INSTANTIATE_TABLE(fixture, table)                                        \
   INSTANTIATE_TEST_SUITE_P(Table, fixture, testing::ValuesIn(ReadTable(#table)), \
                            [](const auto& row) { return row.param.name; })
-
-#endif  // TESTS_TABLE_H_

@@ -1,6 +1,5 @@
 // What an archive holds.
-#ifndef TESTS_UNPACKED_H_
-#define TESTS_UNPACKED_H_
+#pragma once
 
 #include <gtest/gtest.h>
 
@@ -31,5 +30,3 @@ inline Tree Unpacked(const std::string& archive) {
   }
   return tree;
 }
-
-#endif  // TESTS_UNPACKED_H_

@@ -6,8 +6,8 @@
 #include <algorithm>
 #include <sstream>
 
-#include "device/bodies/json_text.h"
-#include "device/bodies/operations.h"
+#include "device/base/json_text.h"
+#include "device/platform/operations.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
 

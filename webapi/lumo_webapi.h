@@ -1,8 +1,7 @@
 // The base of every web API handler of the file manager: one object serves one request. It takes on
 // the signed-in user's identity, lets the derived handler do its work and hands exactly one
 // outcome, an error code with a JSON value, to the host.
-#ifndef WEBAPI_LUMO_WEBAPI_H_
-#define WEBAPI_LUMO_WEBAPI_H_
+#pragma once
 
 #include <json/json.h>
 
@@ -60,5 +59,3 @@ class FileWebAPI {
 };
 
 }  // namespace Zantro
-
-#endif  // WEBAPI_LUMO_WEBAPI_H_

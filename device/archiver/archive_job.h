@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_ARCHIVE_JOB_H_
-#define DEVICE_ARCHIVER_ARCHIVE_JOB_H_
+#pragma once
 
 #include "device/archiver/cancel.h"
 #include "device/archiver/command_line.h"
@@ -12,5 +11,3 @@ namespace Archiver {
 void PackArchive(const Request& request, const Cancel& cancel, Report& report);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_ARCHIVE_JOB_H_

@@ -1,7 +1,6 @@
-#ifndef DEVICE_ARCHIVER_CANCEL_H_
-#define DEVICE_ARCHIVER_CANCEL_H_
+#pragma once
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Archiver {
 
@@ -24,5 +23,3 @@ class Cancel {
 };
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_CANCEL_H_

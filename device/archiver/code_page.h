@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_CODE_PAGE_H_
-#define DEVICE_ARCHIVER_CODE_PAGE_H_
+#pragma once
 
 #include <iconv.h>
 
@@ -30,5 +29,3 @@ class CodePage {
 };
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_CODE_PAGE_H_

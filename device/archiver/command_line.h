@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_COMMAND_LINE_H_
-#define DEVICE_ARCHIVER_COMMAND_LINE_H_
+#pragma once
 
 #include <string>
 #include <vector>
@@ -27,5 +26,3 @@ Request ParseCommandLine(const std::vector<std::string>& arguments);
 void HidePassword(int argc, char** argv);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_COMMAND_LINE_H_

@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_ERROR_TEXT_H_
-#define DEVICE_ARCHIVER_ERROR_TEXT_H_
+#pragma once
 
 #include <set>
 #include <string>
@@ -29,5 +28,3 @@ class ErrorText {
 };
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_ERROR_TEXT_H_

@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_FAILURE_H_
-#define DEVICE_ARCHIVER_FAILURE_H_
+#pragma once
 
 #include <exception>
 #include <stdexcept>
@@ -34,5 +33,3 @@ std::string Printable(const std::string& text);
 std::string NameInError(const std::string& name);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_FAILURE_H_

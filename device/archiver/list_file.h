@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_LIST_FILE_H_
-#define DEVICE_ARCHIVER_LIST_FILE_H_
+#pragma once
 
 #include <string>
 #include <unordered_set>
@@ -31,5 +30,3 @@ NamesFor7z DivideNames(const std::vector<std::string>& names);
 bool IsUtf8(const std::string& text);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_LIST_FILE_H_

@@ -1,12 +1,11 @@
-#ifndef DEVICE_ARCHIVER_OUTPUT_FILE_H_
-#define DEVICE_ARCHIVER_OUTPUT_FILE_H_
+#pragma once
 
 #include <sys/types.h>
 
 #include <ctime>
 #include <string>
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Archiver {
 
@@ -52,5 +51,3 @@ class WorkFolder {
 };
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_OUTPUT_FILE_H_

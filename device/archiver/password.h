@@ -1,8 +1,7 @@
-#ifndef DEVICE_ARCHIVER_PASSWORD_H_
-#define DEVICE_ARCHIVER_PASSWORD_H_
+#pragma once
 
 #include "device/archiver/command_line.h"
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Archiver {
 
@@ -16,5 +15,3 @@ Device::FileDescriptor PasswordInput(const Request& request);
 Device::FileDescriptor UnnamedFile(const std::string& text);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_PASSWORD_H_

@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_PROGRESS_H_
-#define DEVICE_ARCHIVER_PROGRESS_H_
+#pragma once
 
 #include <cstdint>
 #include <string>
@@ -33,5 +32,3 @@ class OutputParser {
 };
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_PROGRESS_H_

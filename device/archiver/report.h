@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_REPORT_H_
-#define DEVICE_ARCHIVER_REPORT_H_
+#pragma once
 
 #include <chrono>
 #include <cstdint>
@@ -48,5 +47,3 @@ class Report {
 };
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_REPORT_H_

@@ -14,7 +14,7 @@
 #include <utility>
 
 #include "device/archiver/failure.h"
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Archiver {
 

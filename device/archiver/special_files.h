@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_SPECIAL_FILES_H_
-#define DEVICE_ARCHIVER_SPECIAL_FILES_H_
+#pragma once
 
 #include <string>
 #include <vector>
@@ -31,5 +30,3 @@ class SpecialsMirror {
 };
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_SPECIAL_FILES_H_

@@ -15,7 +15,7 @@
 #include "device/archiver/error_text.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/progress.h"
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Archiver {
 

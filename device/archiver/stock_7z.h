@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_STOCK_7Z_H_
-#define DEVICE_ARCHIVER_STOCK_7Z_H_
+#pragma once
 
 #include <set>
 #include <string>
@@ -27,5 +26,3 @@ struct Child7z {
 void Run7z(const Child7z& child, const Cancel& cancel, Report& report);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_STOCK_7Z_H_

@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_SWITCHES_H_
-#define DEVICE_ARCHIVER_SWITCHES_H_
+#pragma once
 
 #include <set>
 #include <string>
@@ -30,5 +29,3 @@ std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& ru
 bool IsExcluded(const Request& request, const std::string& path);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_SWITCHES_H_

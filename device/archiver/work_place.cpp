@@ -10,7 +10,7 @@
 #include <string_view>
 
 #include "device/archiver/failure.h"
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Archiver {
 namespace {

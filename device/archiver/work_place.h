@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_WORK_PLACE_H_
-#define DEVICE_ARCHIVER_WORK_PLACE_H_
+#pragma once
 
 #include <cstdint>
 #include <map>
@@ -36,5 +35,3 @@ CheckedSources CheckSources(const WorkPlace& place, const std::vector<std::strin
 std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& path);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_WORK_PLACE_H_

@@ -1,5 +1,4 @@
-#ifndef DEVICE_ARCHIVER_ZIP_NAMES_H_
-#define DEVICE_ARCHIVER_ZIP_NAMES_H_
+#pragma once
 
 #include <string>
 
@@ -19,5 +18,3 @@ void NamesToUtf8(const CodePage& page, const std::string& archive, const Cancel&
 void NamesToCodePage(const CodePage& page, const std::string& archive, const Cancel& cancel);
 
 }  // namespace Archiver
-
-#endif  // DEVICE_ARCHIVER_ZIP_NAMES_H_

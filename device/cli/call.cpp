@@ -2,11 +2,11 @@
 #include <iostream>
 #include <stdexcept>
 
-#include "device/bodies/device.h"
-#include "device/bodies/json_text.h"
+#include "device/base/json_text.h"
 #include "device/cli/commands.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
+#include "device/model/device.h"
 
 namespace Device {
 

@@ -1,7 +1,6 @@
 // The commands of kavo-device. Each returns the exit status; what is wrong with the device or the
 // command line itself is thrown as std::runtime_error.
-#ifndef DEVICE_CLI_COMMANDS_H_
-#define DEVICE_CLI_COMMANDS_H_
+#pragma once
 
 #include <string>
 #include <vector>
@@ -50,5 +49,3 @@ int TasksCommand(const std::string& folder, const std::string& user);
 int NotificationsCommand(const std::string& folder, const std::string& user);
 
 }  // namespace Device
-
-#endif  // DEVICE_CLI_COMMANDS_H_

@@ -8,14 +8,14 @@
 #include <iostream>
 #include <stdexcept>
 
-#include "device/bodies/device.h"
-#include "device/bodies/errors.h"
-#include "device/bodies/json_text.h"
-#include "device/bodies/text_file.h"
+#include "device/base/json_text.h"
+#include "device/base/text_file.h"
 #include "device/cli/commands.h"
 #include "device/cli/progress_display.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
+#include "device/model/device.h"
+#include "device/platform/lumo/errors.h"
 
 namespace Device {
 

@@ -11,10 +11,10 @@
 #include <random>
 #include <stdexcept>
 
-#include "device/bodies/config.h"
-#include "device/bodies/device.h"
-#include "device/bodies/text_file.h"
+#include "device/base/text_file.h"
 #include "device/cli/commands.h"
+#include "device/model/config.h"
+#include "device/model/device.h"
 
 namespace Device {
 

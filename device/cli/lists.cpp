@@ -8,10 +8,10 @@
 #include <iostream>
 #include <stdexcept>
 
-#include "device/bodies/device.h"
-#include "device/bodies/task_store.h"
-#include "device/bodies/task_view.h"
 #include "device/cli/commands.h"
+#include "device/model/device.h"
+#include "device/tasks/task_store.h"
+#include "device/tasks/task_view.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {

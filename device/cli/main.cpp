@@ -7,8 +7,8 @@
 #include <exception>
 #include <iostream>
 
-#include "device/bodies/operations.h"
 #include "device/cli/commands.h"
+#include "device/platform/operations.h"
 
 namespace {
 

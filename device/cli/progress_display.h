@@ -1,6 +1,5 @@
 // A job's progress on standard output: a bar on a terminal, a line per change elsewhere.
-#ifndef DEVICE_CLI_PROGRESS_DISPLAY_H_
-#define DEVICE_CLI_PROGRESS_DISPLAY_H_
+#pragma once
 
 namespace Device {
 
@@ -19,5 +18,3 @@ class ProgressDisplay {
 };
 
 }  // namespace Device
-
-#endif  // DEVICE_CLI_PROGRESS_DISPLAY_H_

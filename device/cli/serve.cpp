@@ -1,7 +1,7 @@
 // "serve": the device over HTTP.
-#include "device/bodies/device.h"
 #include "device/cli/commands.h"
 #include "device/host/web_host.h"
+#include "device/model/device.h"
 
 namespace Device {
 

@@ -1,13 +1,12 @@
 // What the front end asks of the launcher: short messages over a socket of sequenced packets, each
 // with the end of a stream on which the answer is expected.
-#ifndef DEVICE_HOST_CONTROL_H_
-#define DEVICE_HOST_CONTROL_H_
+#pragma once
 
 #include <cstddef>
 #include <optional>
 #include <string>
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 
 namespace Device {
 
@@ -42,5 +41,3 @@ bool SendControl(int socket, ControlKind kind, const std::string& text, int exch
 std::optional<ControlMessage> ReceiveControl(int socket);
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_CONTROL_H_

@@ -10,9 +10,9 @@
 #include <map>
 #include <memory>
 
-#include "device/bodies/device.h"
-#include "device/bodies/errors.h"
-#include "device/bodies/paths.h"
+#include "device/model/device.h"
+#include "device/platform/lumo/errors.h"
+#include "device/platform/lumo/paths.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {

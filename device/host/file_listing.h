@@ -1,6 +1,5 @@
 // The folders of a user's shared folders, as the user sees them.
-#ifndef DEVICE_HOST_FILE_LISTING_H_
-#define DEVICE_HOST_FILE_LISTING_H_
+#pragma once
 
 #include <json/json.h>
 
@@ -18,5 +17,3 @@ struct Listing {
 Listing ListFolder(const std::string& user, const std::string& path);
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_FILE_LISTING_H_

@@ -1,6 +1,5 @@
 // The HTTP statuses that the device answers with.
-#ifndef DEVICE_HOST_HTTP_STATUS_H_
-#define DEVICE_HOST_HTTP_STATUS_H_
+#pragma once
 
 namespace Device {
 
@@ -19,5 +18,3 @@ enum HttpStatus : int {
 };
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_HTTP_STATUS_H_

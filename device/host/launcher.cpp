@@ -14,12 +14,12 @@
 #include <optional>
 #include <stdexcept>
 
-#include "device/bodies/device.h"
-#include "device/bodies/errors.h"
-#include "device/bodies/json_text.h"
-#include "device/bodies/task_store.h"
-#include "device/host/frame.h"
-#include "device/host/request_state.h"
+#include "device/base/frame.h"
+#include "device/base/json_text.h"
+#include "device/model/device.h"
+#include "device/platform/kavo/request_state.h"
+#include "device/platform/lumo/errors.h"
+#include "device/tasks/task_store.h"
 
 namespace Device {
 

@@ -1,7 +1,6 @@
 // The web API host: loads the module once and runs each request in a process of its own, so that
 // one that crashes costs that request alone.
-#ifndef DEVICE_HOST_LAUNCHER_H_
-#define DEVICE_HOST_LAUNCHER_H_
+#pragma once
 
 #include <json/json.h>
 
@@ -76,5 +75,3 @@ class Launcher {
 };
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_LAUNCHER_H_

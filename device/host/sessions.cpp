@@ -5,8 +5,8 @@
 #include <algorithm>
 #include <memory>
 
-#include "device/bodies/device.h"
-#include "device/bodies/random_id.h"
+#include "device/base/random_id.h"
+#include "device/model/device.h"
 
 namespace Device {
 

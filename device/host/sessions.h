@@ -1,7 +1,6 @@
 // Who is signed in. The sessions of the device live in the launcher; processes forked from it see
 // those that were there, and the end of each.
-#ifndef DEVICE_HOST_SESSIONS_H_
-#define DEVICE_HOST_SESSIONS_H_
+#pragma once
 
 #include <chrono>
 #include <map>
@@ -41,5 +40,3 @@ class SignInGate {
 };
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_SESSIONS_H_

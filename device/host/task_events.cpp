@@ -6,12 +6,12 @@
 #include <map>
 #include <vector>
 
-#include "device/bodies/json_text.h"
-#include "device/bodies/task_store.h"
-#include "device/bodies/task_view.h"
-#include "device/bodies/workers.h"
-#include "device/host/frame.h"
+#include "device/base/frame.h"
+#include "device/base/json_text.h"
 #include "device/host/sessions.h"
+#include "device/tasks/task_store.h"
+#include "device/tasks/task_view.h"
+#include "device/tasks/workers.h"
 
 namespace Device {
 

@@ -1,6 +1,5 @@
 // The stream of what happens to a user's tasks.
-#ifndef DEVICE_HOST_TASK_EVENTS_H_
-#define DEVICE_HOST_TASK_EVENTS_H_
+#pragma once
 
 #include <string>
 
@@ -12,5 +11,3 @@ namespace Device {
 void SendTaskEvents(int stream, const std::string& user, const std::string& session_id);
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_TASK_EVENTS_H_

@@ -15,12 +15,12 @@
 #include <iostream>
 #include <stdexcept>
 
-#include "device/bodies/device.h"
-#include "device/bodies/json_text.h"
-#include "device/bodies/task_store.h"
-#include "device/bodies/task_view.h"
+#include "device/base/json_text.h"
 #include "device/host/http_status.h"
 #include "device/host/web_request.h"
+#include "device/model/device.h"
+#include "device/tasks/task_store.h"
+#include "device/tasks/task_view.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {

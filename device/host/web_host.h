@@ -1,7 +1,6 @@
 // The launcher of a device that is reached over HTTP: one thread, which starts the front end, forks
 // a process for each request, keeps the sessions, and takes leave of every process that ends.
-#ifndef DEVICE_HOST_WEB_HOST_H_
-#define DEVICE_HOST_WEB_HOST_H_
+#pragma once
 
 #include <sys/types.h>
 
@@ -11,7 +10,7 @@
 #include <set>
 #include <string>
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 #include "device/host/control.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
@@ -80,5 +79,3 @@ class WebHost {
 };
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_WEB_HOST_H_

@@ -4,17 +4,17 @@
 
 #include <stdexcept>
 
-#include "device/bodies/device.h"
-#include "device/bodies/errors.h"
-#include "device/bodies/json_text.h"
-#include "device/bodies/task_store.h"
-#include "device/bodies/task_view.h"
+#include "device/base/frame.h"
+#include "device/base/json_text.h"
 #include "device/host/control.h"
 #include "device/host/file_listing.h"
-#include "device/host/frame.h"
 #include "device/host/http_status.h"
 #include "device/host/sessions.h"
 #include "device/host/task_events.h"
+#include "device/model/device.h"
+#include "device/platform/lumo/errors.h"
+#include "device/tasks/task_store.h"
+#include "device/tasks/task_view.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {

@@ -1,8 +1,7 @@
 // The process of one request that came over HTTP.
-#ifndef DEVICE_HOST_WEB_REQUEST_H_
-#define DEVICE_HOST_WEB_REQUEST_H_
+#pragma once
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 #include "device/host/launcher.h"
 
 namespace Device {
@@ -20,5 +19,3 @@ bool Answer(int exchange, int status, const Json::Value& body);
 bool Refuse(int exchange, int status, const std::string& reason);
 
 }  // namespace Device
-
-#endif  // DEVICE_HOST_WEB_REQUEST_H_

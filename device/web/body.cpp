@@ -4,7 +4,7 @@
 #include <cstdlib>
 #include <stdexcept>
 
-#include "device/bodies/json_text.h"
+#include "device/base/json_text.h"
 
 namespace Web {
 

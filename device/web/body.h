@@ -1,6 +1,5 @@
 // The bodies of HTTP requests and answers. No I/O.
-#ifndef DEVICE_WEB_BODY_H_
-#define DEVICE_WEB_BODY_H_
+#pragma once
 
 #include <json/json.h>
 
@@ -25,5 +24,3 @@ std::string TextField(const Json::Value& body, const std::string& name);
 std::string BodyText(const Json::Value& value);
 
 }  // namespace Web
-
-#endif  // DEVICE_WEB_BODY_H_

@@ -1,6 +1,5 @@
 // A thread for each connection, so that slow clients hold up nobody else.
-#ifndef DEVICE_WEB_CONNECTION_THREADS_H_
-#define DEVICE_WEB_CONNECTION_THREADS_H_
+#pragma once
 
 #include <httplib.h>
 
@@ -28,5 +27,3 @@ class ConnectionThreads : public httplib::TaskQueue {
 };
 
 }  // namespace Web
-
-#endif  // DEVICE_WEB_CONNECTION_THREADS_H_

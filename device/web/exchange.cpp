@@ -4,8 +4,8 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include "device/bodies/json_text.h"
-#include "device/host/frame.h"
+#include "device/base/frame.h"
+#include "device/base/json_text.h"
 #include "device/host/http_status.h"
 
 namespace Web {

@@ -1,13 +1,12 @@
 // One exchange of the front end with the launcher.
-#ifndef DEVICE_WEB_EXCHANGE_H_
-#define DEVICE_WEB_EXCHANGE_H_
+#pragma once
 
 #include <json/json.h>
 
 #include <optional>
 #include <string>
 
-#include "device/bodies/file_descriptor.h"
+#include "device/base/file_descriptor.h"
 #include "device/host/control.h"
 
 namespace Web {
@@ -36,5 +35,3 @@ class Exchange {
 };
 
 }  // namespace Web
-
-#endif  // DEVICE_WEB_EXCHANGE_H_

@@ -7,7 +7,7 @@
 #include <chrono>
 #include <stdexcept>
 
-#include "device/bodies/json_text.h"
+#include "device/base/json_text.h"
 #include "device/host/http_status.h"
 #include "device/web/body.h"
 #include "device/web/connection_threads.h"

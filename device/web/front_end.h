@@ -1,7 +1,6 @@
 // The HTTP routes. A route turns a request into a frame for the launcher and its answer into a
 // response; it knows neither users nor files.
-#ifndef DEVICE_WEB_FRONT_END_H_
-#define DEVICE_WEB_FRONT_END_H_
+#pragma once
 
 #include <httplib.h>
 
@@ -46,5 +45,3 @@ class FrontEnd {
 };
 
 }  // namespace Web
-
-#endif  // DEVICE_WEB_FRONT_END_H_

@@ -3,7 +3,7 @@
 #include <filesystem>
 #include <stdexcept>
 
-#include "device/bodies/text_file.h"
+#include "device/base/text_file.h"
 
 namespace Web {
 

@@ -1,6 +1,5 @@
 // The page's files, read once.
-#ifndef DEVICE_WEB_PAGE_FILES_H_
-#define DEVICE_WEB_PAGE_FILES_H_
+#pragma once
 
 #include <map>
 #include <string>
@@ -17,5 +16,3 @@ struct PageFile {
 std::map<std::string, PageFile> ReadPageFiles(int folder);
 
 }  // namespace Web
-
-#endif  // DEVICE_WEB_PAGE_FILES_H_

@@ -1,6 +1,5 @@
 // How many event streams each session has open.
-#ifndef DEVICE_WEB_STREAM_COUNT_H_
-#define DEVICE_WEB_STREAM_COUNT_H_
+#pragma once
 
 #include <cstddef>
 #include <map>
@@ -25,5 +24,3 @@ class StreamCount {
 };
 
 }  // namespace Web
-
-#endif  // DEVICE_WEB_STREAM_COUNT_H_

@@ -1,7 +1,6 @@
 // The web API host: the decoded request it hands to a module and the response it takes back.
 // All texts are UTF-8 unless the client sent other bytes; the host passes those on unchanged.
-#ifndef PLATFORM_KAVO_API_HOST_H_
-#define PLATFORM_KAVO_API_HOST_H_
+#pragma once
 
 #include <json/json.h>
 
@@ -46,5 +45,3 @@ class APIResponse {
 };
 
 }  // namespace KAVO
-
-#endif  // PLATFORM_KAVO_API_HOST_H_

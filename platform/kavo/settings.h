@@ -1,6 +1,5 @@
 // The settings store: what users have set for themselves on the device's desktop.
-#ifndef PLATFORM_KAVO_SETTINGS_H_
-#define PLATFORM_KAVO_SETTINGS_H_
+#pragma once
 
 #include <json/json.h>
 
@@ -22,5 +21,3 @@ class KavoSettings {
  private:
   State* state_;
 };
-
-#endif  // PLATFORM_KAVO_SETTINGS_H_

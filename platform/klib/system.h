@@ -2,8 +2,7 @@
 //
 // Its error channel: an operation that fails says so in its result and leaves an error number with
 // the place where it arose for KLIBCErrGet, KLIBCErrorGetFile and KLIBCErrorGetLine.
-#ifndef PLATFORM_KLIB_SYSTEM_H_
-#define PLATFORM_KLIB_SYSTEM_H_
+#pragma once
 
 #include <sys/types.h>
 
@@ -52,5 +51,3 @@ int KLIBKavoIndexAdd(const char* path, int scope);
 int KAVOFSAclChmod(const char* path, int descriptor, mode_t mode);
 
 }  // extern "C"
-
-#endif  // PLATFORM_KLIB_SYSTEM_H_

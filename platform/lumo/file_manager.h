@@ -4,8 +4,7 @@
 // for LumoLibGetErr, unless its comment says otherwise. Paths are bytes as the file system has
 // them. "User path" means the path as users see it, rooted at a shared folder (/photo/trip);
 // "full path" means the path on the volume.
-#ifndef PLATFORM_LUMO_FILE_MANAGER_H_
-#define PLATFORM_LUMO_FILE_MANAGER_H_
+#pragma once
 
 #include <json/json.h>
 #include <sys/types.h>
@@ -113,5 +112,3 @@ namespace WebUtils {
 // argument, false here, asks to replace blanks too.
 std::string EncodeHtml(const std::string& text, bool encode_blanks);
 }  // namespace WebUtils
-
-#endif  // PLATFORM_LUMO_FILE_MANAGER_H_

@@ -1,7 +1,6 @@
 // The task manager: background tasks that outlive the request that made them. Each task belongs to
 // one user and is kept in a store which all processes of the device share.
-#ifndef PLATFORM_VESK_TASK_MANAGER_H_
-#define PLATFORM_VESK_TASK_MANAGER_H_
+#pragma once
 
 #include <json/json.h>
 
@@ -110,5 +109,3 @@ void CleanTimeOutTasks(const char* user);
 // Non-zero when it no longer runs, zero when it could not be ended or `pid` is not one of the
 // user's workers.
 int DoKill(int pid);
-
-#endif  // PLATFORM_VESK_TASK_MANAGER_H_

@@ -3,7 +3,7 @@
 #include <cstdio>
 #include <set>
 
-#include "device/bodies/config.h"
+#include "device/model/config.h"
 #include "tests/fuzz/targets.h"
 
 void FuzzDeviceConfig(const std::string& input) {

@@ -7,11 +7,11 @@
 #include <climits>
 #include <set>
 
-#include "device/bodies/device.h"
-#include "device/bodies/json_text.h"
-#include "device/bodies/operations.h"
-#include "device/bodies/task_store.h"
-#include "device/host/request_state.h"
+#include "device/base/json_text.h"
+#include "device/model/device.h"
+#include "device/platform/kavo/request_state.h"
+#include "device/platform/operations.h"
+#include "device/tasks/task_store.h"
 #include "tests/fuzz/targets.h"
 
 extern "C" void* GetAPITable();

@@ -7,7 +7,7 @@
 #include "compress/split_path.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/list_file.h"
-#include "device/bodies/paths.h"
+#include "device/platform/lumo/paths.h"
 #include "platform/lumo/file_manager.h"
 #include "tests/fuzz/targets.h"
 

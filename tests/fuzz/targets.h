@@ -1,7 +1,6 @@
 // What a fuzzer, and the suite over tests/corpus, feed with any bytes. Each target throws when a
 // property does not hold, and lets out whatever the code under it should not have thrown.
-#ifndef TESTS_FUZZ_TARGETS_H_
-#define TESTS_FUZZ_TARGETS_H_
+#pragma once
 
 #include <sstream>
 #include <stdexcept>
@@ -45,5 +44,3 @@ inline Strings SplitAt(char separator, const std::string& text) {
   }
   return parts;
 }
-
-#endif  // TESTS_FUZZ_TARGETS_H_

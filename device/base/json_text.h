@@ -1,0 +1,26 @@
+// JSON values to one line of text and back. Texts keep their bytes, also those that are not UTF-8.
+#pragma once
+
+#include <json/json.h>
+
+#include <string>
+
+namespace Device {
+
+std::string ToText(const Json::Value& value);
+
+// How deep arrays and objects may lie in each other: in a text, and in a parameter, which tasks and
+// trace lines hold within objects of their own.
+inline constexpr int kTextDepth = 1000;
+inline constexpr int kParamDepth = kTextDepth - 10;
+
+// Throws std::runtime_error, with line, column and reason, for a text that is no JSON. Comments,
+// trailing commas and repeated keys are refused. Of each value, getOffsetStart() tells a byte of
+// the text that stands in the line where the value begins.
+Json::Value ParseJson(const std::string& text, int depth = kTextDepth);
+
+// Takes the escapes \udc80 to \udcff, where they stand alone, for the bytes 0x80 to 0xFF, so that a
+// JSON text in UTF-8 can hold any file name.
+std::string DecodeByteEscapes(std::string json);
+
+}  // namespace Device

@@ -1,0 +1,226 @@
+#include "device/model/config.h"
+
+#include <json/json.h>
+
+#include <algorithm>
+#include <functional>
+#include <limits>
+#include <stdexcept>
+
+#include "device/base/json_text.h"
+
+namespace Device {
+
+namespace {
+
+constexpr const char* kReservedShares[] = {"home", "homes"};          // every user's own, and all
+constexpr const char* kReservedVolumes[] = {"users", "device.json"};  // beside the volumes
+
+template <std::size_t kCount>
+bool IsOneOf(const std::string& name, const char* const (&names)[kCount]) {
+  return std::find(std::begin(names), std::end(names), name) != std::end(names);
+}
+
+// Reads members of JSON objects and says on which line of the text something is wrong.
+class ConfigReader {
+ public:
+  explicit ConfigReader(const std::string& text) : text_(text) {}
+
+  using MemberReaders = std::map<std::string, std::function<void(const Json::Value&)>>;
+
+  // Every member must have a reader and every reader its member, but those that are optional.
+  void ReadObject(const Json::Value& object, const std::string& what, const MemberReaders& required,
+                  const MemberReaders& optional) const {
+    if (!object.isObject()) {
+      Fail(object, what + " is not an object");
+    }
+    for (const std::string& key : object.getMemberNames()) {
+      const Json::Value& member = object[key];
+      if (const auto found = required.find(key); found != required.end()) {
+        found->second(member);
+      } else if (const auto other = optional.find(key); other != optional.end()) {
+        other->second(member);
+      } else {
+        Fail(member, std::string("unknown key '").append(key).append("'"));
+      }
+    }
+    for (const auto& [key, reader] : required) {
+      if (!object.isMember(key)) {
+        Fail(object, what + " lacks '" + key + "'");
+      }
+    }
+  }
+
+  void ReadArray(const Json::Value& array, const std::string& what,
+                 const std::function<void(const Json::Value&)>& reader) const {
+    if (!array.isArray()) {
+      Fail(array, "'" + what + "' is not an array");
+    }
+    for (const Json::Value& element : array) {
+      reader(element);
+    }
+  }
+
+  std::string Text(const Json::Value& value) const {
+    if (!value.isString()) {
+      Fail(value, "expected a text");
+    }
+    return value.asString();
+  }
+
+  bool Bool(const Json::Value& value) const {
+    if (!value.isBool()) {
+      Fail(value, "expected true or false");
+    }
+    return value.asBool();
+  }
+
+  // A name that can be a folder's.
+  std::string Name(const Json::Value& value) const {
+    constexpr std::size_t kNameMax = 64;
+    std::string name = Text(value);
+    const bool is_plain = std::all_of(name.begin(), name.end(), [](char each) {
+      return static_cast<unsigned char>(each) > ' ' && each != '/';
+    });
+    if (name.empty() || name.size() > kNameMax || name[0] == '.' || name[0] == '@' || !is_plain) {
+      Fail(value, "'" + name + "' is not a valid name");
+    }
+    return name;
+  }
+
+  [[noreturn]] void Fail(const Json::Value& value, const std::string& reason) const {
+    const auto end = text_.begin() +
+                     std::min<std::ptrdiff_t>(value.getOffsetStart(), std::ptrdiff_t(text_.size()));
+    throw std::runtime_error("line " + std::to_string(std::count(text_.begin(), end, '\n') + 1) +
+                             ": " + reason);
+  }
+
+ private:
+  const std::string& text_;
+};
+
+uid_t ReadUid(const ConfigReader& reader, const Json::Value& value) {
+  if (!value.isUInt() || value.asUInt() == 0 ||
+      value.asUInt() == std::numeric_limits<std::uint32_t>::max()) {
+    reader.Fail(value, "'uid' is not a number above 0");
+  }
+  return value.asUInt();
+}
+
+User ReadUser(const ConfigReader& reader, const Json::Value& value) {
+  User user;
+  reader.ReadObject(
+      value, "user",
+      {{"name", [&](const Json::Value& each) { user.name = reader.Name(each); }},
+       {"uid", [&](const Json::Value& each) { user.uid = ReadUid(reader, each); }},
+       {"home", [&](const Json::Value& each) { user.home = reader.Name(each); }}},
+      {{"admin", [&](const Json::Value& each) { user.admin = reader.Bool(each); }},
+       {"codepage", [&](const Json::Value& each) { user.codepage = reader.Text(each); }},
+       {"password", [&](const Json::Value& each) { user.password = reader.Text(each); }}});
+  return user;
+}
+
+Access ReadAccess(const ConfigReader& reader, const Json::Value& value) {
+  static const std::map<std::string, Access> kWords = {
+      {"rw", Access::kReadWrite}, {"ro", Access::kReadOnly}, {"list-denied", Access::kListDenied}};
+  const auto found = kWords.find(reader.Text(value));
+  if (found == kWords.end()) {
+    reader.Fail(value, "access is one of 'rw', 'ro', 'list-denied'");
+  }
+  return found->second;
+}
+
+Share ReadShare(const ConfigReader& reader, const Json::Value& value, const Config& config) {
+  Share share;
+  const auto read_access = [&](const Json::Value& access) {
+    if (!access.isObject()) {
+      reader.Fail(access, "'access' is not an object");
+    }
+    for (const std::string& user : access.getMemberNames()) {
+      if (config.FindUser(user) == nullptr) {
+        reader.Fail(access[user], "no user '" + user + "'");
+      }
+      share.access[user] = ReadAccess(reader, access[user]);
+    }
+  };
+  reader.ReadObject(
+      value, "shared folder",
+      {{"name", [&](const Json::Value& each) { share.name = reader.Name(each); }},
+       {"volume", [&](const Json::Value& each) { share.volume = reader.Name(each); }},
+       {"access", read_access}},
+      {{"encrypted", [&](const Json::Value& each) { share.encrypted = reader.Bool(each); }},
+       {"read_only", [&](const Json::Value& each) { share.read_only = reader.Bool(each); }}});
+  return share;
+}
+
+void CheckVolume(const ConfigReader& reader, const Json::Value& where, const Config& config,
+                 const std::string& volume) {
+  if (std::find(config.volumes.begin(), config.volumes.end(), volume) == config.volumes.end()) {
+    reader.Fail(where, "no volume '" + volume + "'");
+  }
+}
+
+void AddVolume(const ConfigReader& reader, const Json::Value& value, Config& config) {
+  std::string name = reader.Name(value);
+  if (IsOneOf(name, kReservedVolumes) ||
+      std::find(config.volumes.begin(), config.volumes.end(), name) != config.volumes.end()) {
+    reader.Fail(value, std::string("the name '").append(name).append("' is taken"));
+  }
+  config.volumes.push_back(std::move(name));
+}
+
+void AddUser(const ConfigReader& reader, const Json::Value& value, Config& config) {
+  User user = ReadUser(reader, value);
+  CheckVolume(reader, value, config, user.home);
+  for (const User& other : config.users) {
+    if (other.name == user.name || other.uid == user.uid) {
+      reader.Fail(value, "user '" + user.name + "' has the name or uid of another");
+    }
+  }
+  config.users.push_back(std::move(user));
+}
+
+void AddShare(const ConfigReader& reader, const Json::Value& value, Config& config) {
+  Share share = ReadShare(reader, value, config);
+  CheckVolume(reader, value, config, share.volume);
+  if (config.FindShare(share.name) != nullptr || IsOneOf(share.name, kReservedShares)) {
+    reader.Fail(value, "the name '" + share.name + "' is taken");
+  }
+  config.shares.push_back(std::move(share));
+}
+
+template <typename T>
+const T* FindByName(const std::vector<T>& all, const std::string& name) {
+  const auto found =
+      std::find_if(all.begin(), all.end(), [&](const T& each) { return each.name == name; });
+  return found == all.end() ? nullptr : &*found;
+}
+
+}  // namespace
+
+const User* Config::FindUser(const std::string& name) const { return FindByName(users, name); }
+const Share* Config::FindShare(const std::string& name) const { return FindByName(shares, name); }
+
+Config ParseConfig(const std::string& text) {
+  const Json::Value root = ParseJson(text);
+  const ConfigReader reader(text);
+  Config config;
+  Json::Value users;
+  Json::Value shares;
+  const auto read_volumes = [&](const Json::Value& volumes) {
+    reader.ReadArray(volumes, "volumes",
+                     [&](const Json::Value& each) { AddVolume(reader, each, config); });
+  };
+  // Users name volumes, shared folders name both: in that order, wherever they stand in the text.
+  reader.ReadObject(root, "the device",
+                    {{"volumes", read_volumes},
+                     {"users", [&](const Json::Value& each) { users = each; }},
+                     {"shares", [&](const Json::Value& each) { shares = each; }}},
+                    {});
+  reader.ReadArray(users, "users", [&](const Json::Value& each) { AddUser(reader, each, config); });
+  reader.ReadArray(shares, "shares",
+                   [&](const Json::Value& each) { AddShare(reader, each, config); });
+  return config;
+}
+
+}  // namespace Device

@@ -1,0 +1,94 @@
+#include "device/model/device.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <filesystem>
+#include <iostream>
+#include <memory>
+#include <stdexcept>
+
+#include "device/base/text_file.h"
+#include "device/model/reachable.h"
+
+namespace Device {
+
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr char kArchiverName[] = "kavo-7z";
+constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
+
+std::unique_ptr<OpenDevice>& Instance() {
+  static std::unique_ptr<OpenDevice> device;
+  return device;
+}
+
+// What the device needs beside its executable is opened at once: later there may be no way to walk
+// there.
+FileDescriptor OpenBesideExecutable(const char* name, int flags) {
+  const fs::path path = fs::read_symlink("/proc/self/exe").parent_path() / name;
+  FileDescriptor file(open(path.c_str(), flags | O_CLOEXEC));
+  if (!file) {
+    throw std::runtime_error(path.string() + ": " + std::strerror(errno));
+  }
+  return file;
+}
+
+Config ReadConfig(const fs::path& root) {
+  const std::string text = ReadTextFile((root / kConfigFile).string());
+  try {
+    return ParseConfig(text);
+  } catch (const std::exception& error) {
+    throw std::runtime_error(std::string(kConfigFile) + ": " + error.what());
+  }
+}
+
+std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
+  auto device = std::make_unique<OpenDevice>();
+  std::error_code error;
+  device->root = fs::canonical(folder, error).string();
+  if (error) {
+    throw std::runtime_error(error.message());
+  }
+  device->config = ReadConfig(device->root);
+  for (const std::string& volume : device->config.volumes) {
+    if (!fs::is_directory(device->VolumePath(volume))) {
+      throw std::runtime_error("volume '" + volume + "': no such folder");
+    }
+    device->real_volumes.push_back(fs::canonical(device->VolumePath(volume)).string());
+  }
+  device->archiver = OpenBesideExecutable(kArchiverName, O_PATH);
+  device->module = OpenBesideExecutable(kModuleName, O_RDONLY);
+  device->switches_identity = geteuid() == 0;
+  if (device->switches_identity) {
+    MakeReachable(device->root);
+  } else {
+    std::cerr << "kavo-device: not root: every user of the device is you\n";
+  }
+  return device;
+}
+
+}  // namespace
+
+OpenDevice& Open(const std::string& folder) {
+  try {
+    Instance() = OpenFolder(folder);
+  } catch (const std::exception& error) {
+    throw std::runtime_error("cannot open device '" + folder + "': " + error.what());
+  }
+  return *Instance();
+}
+
+OpenDevice& TheDevice() {
+  if (Instance() == nullptr) {
+    throw std::logic_error("no device is open");
+  }
+  return *Instance();
+}
+
+}  // namespace Device

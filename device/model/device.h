@@ -1,0 +1,56 @@
+// The device that this process and those forked from it belong to: its folder, its configuration,
+// and the user whose identity the process has.
+//
+// In the folder: device.json; a folder for each volume; in a volume its shared folders and, under
+// "homes", the users' homes; under "users" a folder for each user, that only that user can enter,
+// with the store of tasks.
+#pragma once
+
+#include <map>
+#include <string>
+#include <vector>
+
+#include "device/base/file_descriptor.h"
+#include "device/host/session.h"
+#include "device/model/config.h"
+
+namespace Device {
+
+// Groups of the device's users. High numbers, so that they are nobody's on a workstation.
+inline constexpr gid_t kUsersGroup = 65100;
+inline constexpr gid_t kAdminsGroup = 65101;
+
+inline constexpr char kConfigFile[] = "device.json";
+inline constexpr char kHomeShare[] = "home";
+
+struct OpenDevice {
+  std::string root;  // absolute, links resolved
+  Config config;
+  std::vector<std::string> real_volumes;  // their folders, links resolved
+  bool switches_identity = false;         // false: not root, all users are the caller
+  FileDescriptor archiver;                // the program that runs in place of /usr/bin/7z
+  FileDescriptor module;                  // the shared library that serves the requests
+
+  std::map<std::string, Session> sessions;  // by session id
+  std::string current_user;  // whose identity this process has; empty: the device's own
+  bool is_followed = false;  // the client of this request watches the task to its end
+  FileDescriptor outcome;    // where a request process writes its outcome; no worker may hold it
+
+  std::string VolumePath(const std::string& volume) const { return root + "/" + volume; }
+  std::string HomePath(const User& user) const {
+    return VolumePath(user.home) + "/homes/" + user.name;
+  }
+  std::string StateFolder(const std::string& user) const { return root + "/users/" + user; }
+};
+
+// Opens the device in a folder, once in a process, before anything below platform/ is called.
+// Throws std::runtime_error that names the device and the reason.
+OpenDevice& Open(const std::string& folder);
+// The device that is open.
+OpenDevice& TheDevice();
+
+// Makes a device in a folder that is not there yet, or empty, from the text of a device.json.
+// Throws std::runtime_error.
+void Make(const std::string& folder, const std::string& config_text);
+
+}  // namespace Device

@@ -1,0 +1,82 @@
+// Groups, file attributes, the file index, and the error channel of the system library.
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include <cerrno>
+
+#include "device/model/device.h"
+#include "device/platform/klib/klib_error.h"
+#include "device/platform/operations.h"
+#include "device/tasks/task_store.h"
+#include "platform/klib/system.h"
+
+namespace Device {
+
+namespace {
+
+struct KlibError {
+  int error_number = 0;
+  const char* file = "";
+  int line = 0;
+};
+KlibError klib_error;
+
+constexpr int kByPath = -1;
+
+int IsAdmin(const char* name) {
+  const User* const user = TheDevice().config.FindUser(name);
+  if (user == nullptr) {
+    KLIB_ERROR(ENOENT);
+    return -1;
+  }
+  return user->admin ? 1 : 0;
+}
+
+int AddToIndex(const char* path) {
+  try {
+    StoreOf(TheDevice().current_user).AddToIndex(path);
+    return 0;
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "file index: %s", error.what());
+    KLIB_ERROR(EIO);
+    return -1;
+  }
+}
+
+}  // namespace
+
+void SetKlibError(int error_number, const char* file, int line) {
+  klib_error = {error_number, file, line};
+}
+
+}  // namespace Device
+
+using Device::Operation;
+
+int KLIBCErrGet() {
+  return Operation("KLIBCErrGet").Run([] { return Device::klib_error.error_number; });
+}
+
+const char* KLIBCErrorGetFile() {
+  return Operation("KLIBCErrorGetFile").Run([] { return Device::klib_error.file; });
+}
+
+int KLIBCErrorGetLine() {
+  return Operation("KLIBCErrorGetLine").Run([] { return Device::klib_error.line; });
+}
+
+int KLIBGroupIsAdminGroupMem(const char* user, int reserved) {
+  return Operation("KLIBGroupIsAdminGroupMem", user, reserved).Run([&] {
+    return Device::IsAdmin(user);
+  });
+}
+
+int KLIBKavoIndexAdd(const char* path, int scope) {
+  return Operation("KLIBKavoIndexAdd", path, scope).Run([&] { return Device::AddToIndex(path); });
+}
+
+int KAVOFSAclChmod(const char* path, int descriptor, mode_t mode) {
+  return Operation("KAVOFSAclChmod", path, descriptor, mode).Run([&] {
+    return descriptor == Device::kByPath ? chmod(path, mode) : fchmod(descriptor, mode);
+  });
+}

@@ -1,0 +1,313 @@
+#include "device/platform/lumo/paths.h"
+
+#include <fcntl.h>
+#include <linux/openat2.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <chrono>
+#include <climits>
+#include <cstdlib>
+#include <cstring>
+#include <memory>
+#include <string_view>
+#include <utility>
+
+#include "device/base/file_descriptor.h"
+#include "device/platform/lumo/errors.h"
+#include "device/platform/operations.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+namespace {
+
+constexpr std::size_t kNameMax = 255;  // bytes
+constexpr std::size_t kEncryptedNameMax = 143;
+
+// The path's parts. False when ".." leads above the first of them, the shared folder.
+bool SplitPath(std::string_view path, std::vector<std::string_view>& parts) {
+  std::size_t begin = 0;
+  while (begin < path.size()) {
+    const std::size_t end = std::min(path.find('/', begin), path.size());
+    const std::string_view part = path.substr(begin, end - begin);
+    begin = end + 1;
+    if (part == "..") {
+      if (parts.size() <= 1) {
+        return false;
+      }
+      parts.pop_back();
+    } else if (!part.empty() && part != ".") {
+      parts.push_back(part);
+    }
+  }
+  return true;
+}
+
+// Fills in the shared folder's fields. False when there is none of that name, or no such user.
+bool FindShareFolder(const OpenDevice& device, const std::string& user, ResolvedPath& resolved) {
+  if (resolved.share_name == kHomeShare) {
+    const User* const owner = device.config.FindUser(user);
+    if (owner == nullptr) {
+      return false;
+    }
+    resolved.volume_path = device.VolumePath(owner->home);
+    resolved.share_real_path = device.HomePath(*owner);
+    return true;
+  }
+  resolved.share = device.config.FindShare(resolved.share_name);
+  if (resolved.share == nullptr) {
+    return false;
+  }
+  resolved.volume_path = device.VolumePath(resolved.share->volume);
+  resolved.share_real_path = resolved.volume_path + "/" + resolved.share->name;
+  return true;
+}
+
+// Where the path leads when links are followed; of one that does not exist, its nearest parent that
+// does. Empty, with errno set, when that cannot be told.
+std::string FollowLinks(std::string path) {
+  for (;;) {
+    const std::unique_ptr<char, void (*)(void*)> followed(realpath(path.c_str(), nullptr),
+                                                          std::free);
+    if (followed != nullptr) {
+      return followed.get();
+    }
+    if (errno != ENOENT || path.size() <= 1) {
+      return {};
+    }
+    path.resize(std::max<std::size_t>(path.rfind('/'), 1));
+  }
+}
+
+bool IsOnVolumes(const std::string& path) {
+  const std::vector<std::string>& volumes = TheDevice().real_volumes;
+  return std::any_of(volumes.begin(), volumes.end(),
+                     [&](const std::string& volume) { return IsWithin(path, volume); });
+}
+
+// True of a file or folder that is there and has no link on the way to it: what its path says is
+// where it lies. One call of the kernel's, where following takes one for each part of the path.
+// False where the kernel does not know it.
+bool HasNoLinks(const std::string& path) {
+  open_how how{};
+  how.flags = O_PATH | O_CLOEXEC;
+  how.resolve = RESOLVE_NO_SYMLINKS;
+  return static_cast<bool>(FileDescriptor(
+      static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof how))));
+}
+
+// The same of one file after another in one folder: the folder's answer holds for the next ones for
+// a moment, within which the caller could as well have asked for all of them; of each, one look at
+// the file itself is left, which costs half.
+bool IsInFolderWithoutLinks(const std::string& path) {
+  using Clock = std::chrono::steady_clock;
+  constexpr auto kMoment = std::chrono::milliseconds(10);
+  thread_local std::string folder;
+  thread_local Clock::time_point until;
+  const std::size_t slash = path.rfind('/');
+  const Clock::time_point now = Clock::now();
+  if (now >= until || path.compare(0, slash, folder) != 0) {
+    folder.assign(path, 0, slash);
+    until = HasNoLinks(folder + "/") ? now + kMoment : Clock::time_point();
+  }
+  struct stat info {};
+  return now < until && lstat(path.c_str(), &info) == 0 && !S_ISLNK(info.st_mode);
+}
+
+// True of an absolute path without ".", ".." and doubled slashes: with no links on the way, it is
+// what following it would give. Names that begin with a dot are left to following.
+bool IsPlain(const std::string& path) {
+  return path[0] == '/' && path.find("/.") == std::string::npos &&
+         path.find("//") == std::string::npos;
+}
+
+int CheckPath(const char* path) {
+  const std::string followed =
+      IsPlain(path) && IsInFolderWithoutLinks(path) ? path : FollowLinks(path);
+  if (followed.empty()) {
+    SetLastErrno(errno);
+    return -1;
+  }
+  if (!IsOnVolumes(followed)) {
+    SetLastError(kErrOutsideShare);
+    return -1;
+  }
+  return 0;
+}
+
+int CheckFileName(const std::string& directory, const std::string& name) {
+  if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos) {
+    SetLastError(kErrBadName);
+    return -1;
+  }
+  const Share* const share = ShareOfRealPath(TheDevice(), directory);
+  const bool is_encrypted = share != nullptr && share->encrypted;
+  if (name.size() > (is_encrypted ? kEncryptedNameMax : kNameMax)) {
+    SetLastError(is_encrypted ? kErrNameTooLongCrypt : kErrNameTooLong);
+    return -1;
+  }
+  return 0;
+}
+
+// The common leading part of two folders that end in "/".
+std::string CommonFolder(const std::string& one, const std::string& other) {
+  std::size_t end = 0;
+  for (std::size_t at = 0; at < std::min(one.size(), other.size()) && one[at] == other[at]; ++at) {
+    if (one[at] == '/') {
+      end = at + 1;
+    }
+  }
+  return one.substr(0, end);
+}
+
+}  // namespace
+
+ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const std::string& path) {
+  ResolvedPath resolved;
+  std::vector<std::string_view> parts;
+  if (path.empty() || path[0] != '/' || path.find('\0') != std::string::npos) {
+    resolved.error = kErrBadName;
+  } else if (path.size() >= PATH_MAX) {
+    resolved.error = kErrNameTooLong;
+  } else if (!SplitPath(path, parts)) {
+    resolved.error = kErrOutsideShare;
+  } else if (parts.empty()) {
+    resolved.error = kErrNotFound;
+  } else {
+    resolved.share_name = parts.front();
+    resolved.error = FindShareFolder(device, user, resolved) ? 0 : kErrNotFound;
+    resolved.user_path = "/" + resolved.share_name;
+    resolved.real_path = resolved.share_real_path;
+    resolved.user_path.reserve(path.size());
+    resolved.real_path.reserve(resolved.real_path.size() + path.size());
+    for (std::size_t part = 1; part < parts.size(); ++part) {
+      resolved.user_path.append("/").append(parts[part]);
+      resolved.real_path.append("/").append(parts[part]);
+    }
+    if (resolved.error == 0 && resolved.real_path.size() >= PATH_MAX) {
+      resolved.error = kErrNameTooLong;
+    }
+  }
+  return resolved;
+}
+
+Access AccessOf(const ResolvedPath& path, const std::string& user) {
+  if (path.share == nullptr) {
+    return Access::kReadWrite;  // the user's own home
+  }
+  const auto found = path.share->access.find(user);
+  return found == path.share->access.end() ? Access::kNone : found->second;
+}
+
+bool IsWithin(const std::string& path, const std::string& folder) {
+  return path.compare(0, folder.size(), folder) == 0 &&
+         (path.size() == folder.size() || path[folder.size()] == '/');
+}
+
+const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_path) {
+  for (const Share& share : device.config.shares) {
+    if (IsWithin(real_path, device.VolumePath(share.volume) + "/" + share.name)) {
+      return &share;
+    }
+  }
+  return nullptr;
+}
+
+}  // namespace Device
+
+using Device::Operation;
+
+int PathInfoFactory::create(const char* user, const std::string& path, PathInfo& out) {
+  Operation operation("PathInfoFactory::create", user, path);
+  operation.Output("share_path", out.share_path)
+      .Output("real_path", out.real_path)
+      .Output("share_name", out.share_name)
+      .Output("volume_path", out.volume_path)
+      .Output("share_real_path", out.share_real_path);
+  return operation.Run([&] {
+    Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), user, path);
+    if (resolved.error == 0 && Device::AccessOf(resolved, user) == Device::Access::kNone) {
+      resolved.error = Device::kErrNoPrivilege;  // the user does not even see the shared folder
+    }
+    if (resolved.error != 0) {
+      Device::SetLastError(resolved.error);
+      return 0;
+    }
+    out.aux_1 = resolved.user_path.substr(1 + resolved.share_name.size());
+    out.share_path = std::move(resolved.user_path);
+    out.real_path = std::move(resolved.real_path);
+    out.share_name = std::move(resolved.share_name);
+    out.volume_path = std::move(resolved.volume_path);
+    out.share_real_path = std::move(resolved.share_real_path);
+    out.aux_6 = user;
+    return 1;
+  });
+}
+
+int LumoFullPathGet(const char* path, std::string* full_path, std::string* home_test_path,
+                    std::string* aux_1, std::string* aux_2, const std::string* user,
+                    const char* charset) {
+  return Operation("LumoFullPathGet", path, *user, charset)
+      .Output("full_path", *full_path)
+      .Run([&] {
+        const Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), *user, path);
+        if (resolved.error != 0) {
+          Device::SetLastError(resolved.error);
+          return 0;
+        }
+        *full_path = resolved.real_path;
+        *home_test_path = resolved.real_path;
+        *aux_1 = resolved.share_name;
+        *aux_2 = resolved.volume_path;
+        return 1;
+      });
+}
+
+int IsDirUserHome(const std::string& path, const char* reserved) {
+  return Operation("IsDirUserHome", path, reserved).Run([&] {
+    const Device::OpenDevice& device = Device::TheDevice();
+    const Device::User* const user = device.config.FindUser(device.current_user);
+    return user != nullptr && Device::IsWithin(path, device.HomePath(*user)) ? 1 : 0;
+  });
+}
+
+int LumoCheckPath(const char* path, bool option_1, int flags, std::string* out, bool option_2,
+                  bool option_3, const char* reserved) {
+  return Operation("LumoCheckPath", path, option_1, flags, out, option_2, option_3, reserved)
+      .Run([&] { return Device::CheckPath(path); });
+}
+
+int LumoCheckFileName(const char* directory, const char* name) {
+  return Operation("LumoCheckFileName", directory, name).Run([&] {
+    return Device::CheckFileName(directory, name);
+  });
+}
+
+std::string FindCommonParent(std::vector<std::string> directories) {
+  return Operation("FindCommonParent", directories).Run([&] {
+    std::string parent = directories.empty() ? "/" : directories.front();
+    for (const std::string& directory : directories) {
+      parent = Device::CommonFolder(parent, directory);
+    }
+    return parent;
+  });
+}
+
+int VolumePathParse(const char* volume_path, VolumeInfo* out) {
+  return Operation("VolumePathParse", volume_path).Run([&] {
+    const Device::OpenDevice& device = Device::TheDevice();
+    std::uint32_t index = 0;
+    for (const std::string& volume : device.config.volumes) {
+      if (device.VolumePath(volume) == volume_path) {
+        *out = {{index, 0}};
+        return 0;
+      }
+      ++index;
+    }
+    Device::SetLastError(Device::kErrNotFound);
+    return -1;
+  });
+}

@@ -1,0 +1,33 @@
+// User paths resolved by text.
+#pragma once
+
+#include <string>
+
+#include "device/model/device.h"
+
+namespace Device {
+
+struct ResolvedPath {
+  int error = 0;          // a LibraryError; the rest counts when it is 0
+  std::string user_path;  // without ".", ".." and doubled slashes
+  std::string real_path;  // full path
+  std::string share_name;
+  std::string share_real_path;
+  std::string volume_path;
+  const Share* share = nullptr;  // null for a home
+};
+
+// Resolves the path as that user sees it. ".." may not lead out of the shared folder. Nothing need
+// exist.
+ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const std::string& path);
+
+// What the user may do on the shared folder that the path was resolved to.
+Access AccessOf(const ResolvedPath& path, const std::string& user);
+
+// The shared folder that a full path lies in, null when it is in none.
+const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_path);
+
+// True if `path` is `folder` or lies below it. Both are full paths without a slash at the end.
+bool IsWithin(const std::string& path, const std::string& folder);
+
+}  // namespace Device

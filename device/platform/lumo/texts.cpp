@@ -1,0 +1,137 @@
+// Splitting and encoding texts.
+#include <algorithm>
+#include <cctype>
+#include <cstring>
+#include <utility>
+
+#include "device/base/json_text.h"
+#include "device/platform/operations.h"
+#include "platform/klib/system.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+namespace {
+
+constexpr int kFirstVersionWithArrays = 2;
+
+Json::Value SplitText(const std::string& text, const std::string& separator) {
+  Json::Value pieces(Json::arrayValue);
+  std::size_t begin = 0;
+  while (begin <= text.size()) {
+    const std::size_t end = std::min(text.find(separator, begin), text.size());
+    if (end > begin) {
+      pieces.append(text.substr(begin, end - begin));
+    }
+    begin = end + separator.size();
+  }
+  return pieces;
+}
+
+// The array itself when every element is a text that can be a path, else an empty one.
+Json::Value OnlyTexts(Json::Value array) {
+  for (const Json::Value& element : array) {
+    const char* begin = nullptr;
+    const char* end = nullptr;
+    if (!element.getString(&begin, &end) || begin == end || std::find(begin, end, '\0') != end) {
+      return {Json::arrayValue};
+    }
+  }
+  return array;
+}
+
+Json::Value Explode(const Json::Value& value, const std::string& separator, int version) {
+  if (value.isArray()) {
+    return OnlyTexts(value);
+  }
+  if (!value.isString()) {
+    return {Json::arrayValue};
+  }
+  const std::string text = value.asString();
+  if (version >= kFirstVersionWithArrays && !text.empty() && text[0] == '[') {
+    try {
+      Json::Value array = ParseJson(DecodeByteEscapes(text));
+      return array.isArray() ? OnlyTexts(std::move(array)) : Json::Value(Json::arrayValue);
+    } catch (const std::exception&) {
+      return {Json::arrayValue};  // begins like an array and is none
+    }
+  }
+  return OnlyTexts(SplitText(text, separator));
+}
+
+std::string EncodeHtml(const std::string& text, bool encode_blanks) {
+  std::string encoded;
+  for (const char each : text) {
+    switch (each) {
+      case '&':
+        encoded += "&amp;";
+        break;
+      case '<':
+        encoded += "&lt;";
+        break;
+      case '>':
+        encoded += "&gt;";
+        break;
+      case '"':
+        encoded += "&quot;";
+        break;
+      case '\'':
+        encoded += "&#39;";
+        break;
+      case ' ':
+        encoded += encode_blanks ? "&nbsp;" : " ";
+        break;
+      default:
+        encoded += each;
+    }
+  }
+  return encoded;
+}
+
+// Each character that means something to a shell behind a backslash; a line feed, which a backslash
+// would take away, in single quotes. At the most three bytes for one.
+std::string QuoteForShell(const std::string& text) {
+  constexpr char kPlain[] = "%+,-./:=@_";
+  std::string quoted;
+  for (const char each : text) {
+    if (each == '\n') {
+      quoted += "'\n'";
+      continue;
+    }
+    const auto byte = static_cast<unsigned char>(each);
+    if (byte < 0x80 && std::isalnum(byte) == 0 && std::strchr(kPlain, each) == nullptr) {
+      quoted += '\\';
+    }
+    quoted += each;
+  }
+  return quoted;
+}
+
+}  // namespace
+}  // namespace Device
+
+using Device::Operation;
+
+Json::Value StringExplodeEx(const Json::Value& value, const std::string& separator, int version,
+                            bool reserved) {
+  return Operation("StringExplodeEx", value, separator, version, reserved).Run([&] {
+    return Device::Explode(value, separator, version);
+  });
+}
+
+std::string WebUtils::EncodeHtml(const std::string& text, bool encode_blanks) {
+  return Operation("WebUtils::EncodeHtml", text, encode_blanks).Run([&] {
+    return Device::EncodeHtml(text, encode_blanks);
+  });
+}
+
+int KLIBCEncShParam(const char* text, char* buffer, size_t size) {
+  return Operation("KLIBCEncShParam", text, size).Run([&] {
+    const std::string quoted = Device::QuoteForShell(text);
+    if (quoted.size() >= size) {
+      return -1;
+    }
+    std::copy_n(quoted.c_str(), quoted.size() + 1, buffer);
+    return static_cast<int>(quoted.size());
+  });
+}

@@ -1,0 +1,161 @@
+#include "device/tasks/database.h"
+
+#include <sys/stat.h>
+#include <syslog.h>
+
+#include <cerrno>
+#include <cstdio>
+#include <ctime>
+#include <stdexcept>
+#include <utility>
+
+namespace Device {
+
+namespace {
+
+constexpr int kBusyTimeoutMs = 30000;  // longer than any transaction of another process
+
+ino_t FileOf(const std::string& path) {
+  struct stat status {};
+  return stat(path.c_str(), &status) == 0 ? status.st_ino : 0;
+}
+
+}  // namespace
+
+Database::Database(std::string path, const char* schema, int version)
+    : path_(std::move(path)), database_(nullptr, sqlite3_close) {
+  Open();
+  try {
+    MakeSchema(schema, version);
+  } catch (const std::runtime_error&) {
+    if (FileOf(path_) == file_) {
+      throw;
+    }
+    // It was set aside.
+    Open();
+    MakeSchema(schema, version);
+  }
+}
+
+void Database::Open() {
+  sqlite3* database = nullptr;
+  const int result = sqlite3_open_v2(path_.c_str(), &database,
+                                     SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr);
+  database_.reset(database);
+  Check(result);
+  sqlite3_busy_timeout(database, kBusyTimeoutMs);
+  // Requests come and go: each one that is alone for a moment would write everything back and wait
+  // for the disk. The log is written back when it has grown to so many pages that reading it again,
+  // which the next request that is alone does, begins to cost.
+  sqlite3_db_config(database, SQLITE_DBCONFIG_NO_CKPT_ON_CLOSE, 1, nullptr);
+  file_ = FileOf(path_);
+}
+
+void Database::MakeSchema(const char* schema, int version) {
+  const auto execute = [&](const std::string& sql) {
+    Check(sqlite3_exec(database_.get(), sql.c_str(), nullptr, nullptr, nullptr));
+  };
+  const auto number = [&](const char* sql) {
+    Statement query(*this, sql);
+    return query.Step() ? query.Number(0) : 0;
+  };
+  constexpr char kVersion[] = "PRAGMA user_version";
+  execute("PRAGMA synchronous = NORMAL; PRAGMA wal_autocheckpoint = 200");
+  if (number(kVersion) == version) {
+    return;
+  }
+  execute("PRAGMA journal_mode = WAL");
+  InTransaction(true, [&] {
+    if (number(kVersion) == version) {
+      return;  // another process was faster
+    }
+    if (number("SELECT count(*) FROM sqlite_master") != 0) {
+      SetAside("it has another schema");
+      throw std::runtime_error("task store '" + path_ + "' has another schema");
+    }
+    execute(schema);
+    execute(kVersion + (" = " + std::to_string(version)));
+  });
+}
+
+void Database::Check(int result) {
+  if (result == SQLITE_OK) {
+    return;
+  }
+  const std::string reason = sqlite3_errmsg(database_.get());
+  if (result == SQLITE_CORRUPT || result == SQLITE_NOTADB) {
+    SetAside(reason);
+  }
+  throw std::runtime_error("task store '" + path_ + "': " + reason);
+}
+
+void Database::SetAside(const std::string& reason) {
+  // Another process may have done so already, and begun anew.
+  if (file_ == 0 || FileOf(path_) != file_) {
+    return;
+  }
+  const std::string aside = path_ + ".damaged-" + std::to_string(std::time(nullptr));
+  for (const char* part : {"-wal", "-shm", ""}) {
+    const std::string from = path_ + part;
+    if (std::rename(from.c_str(), (aside + part).c_str()) != 0 && errno != ENOENT) {
+      syslog(LOG_ERR, "task store '%s' cannot be set aside: %m", from.c_str());
+      return;
+    }
+  }
+  syslog(LOG_ERR, "task store '%s' is set aside as '%s': %s", path_.c_str(), aside.c_str(),
+         reason.c_str());
+}
+
+void Database::InTransaction(bool for_writing, const std::function<void()>& body) {
+  Statement(*this, for_writing ? "BEGIN IMMEDIATE" : "BEGIN").Step();
+  try {
+    body();
+    Statement(*this, "COMMIT").Step();
+  } catch (...) {
+    sqlite3_exec(database_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
+    throw;
+  }
+}
+
+Database::Statement::Statement(Database& database, const char* sql)
+    : database_(database), statement_(nullptr, sqlite3_finalize) {
+  sqlite3_stmt* statement = nullptr;
+  const int result = sqlite3_prepare_v2(database_.database_.get(), sql, -1, &statement, nullptr);
+  if (result == SQLITE_ERROR) {  // the statements are right: the schema's own text is damaged
+    database_.SetAside(sqlite3_errmsg(database_.database_.get()));
+  }
+  database_.Check(result);
+  statement_.reset(statement);
+}
+
+Database::Statement& Database::Statement::Bind(const std::string& text) {
+  database_.Check(sqlite3_bind_text(statement_.get(), ++bound_, text.data(),
+                                    static_cast<int>(text.size()), SQLITE_TRANSIENT));
+  return *this;
+}
+
+Database::Statement& Database::Statement::Bind(std::int64_t number) {
+  database_.Check(sqlite3_bind_int64(statement_.get(), ++bound_, number));
+  return *this;
+}
+
+Database::Statement& Database::Statement::BindNull() {
+  database_.Check(sqlite3_bind_null(statement_.get(), ++bound_));
+  return *this;
+}
+
+bool Database::Statement::Step() {
+  const int result = sqlite3_step(statement_.get());
+  if (result != SQLITE_ROW && result != SQLITE_DONE) {
+    database_.Check(result);
+  }
+  return result == SQLITE_ROW;
+}
+
+std::string Database::Statement::Text(int column) const {
+  const auto* const text =
+      reinterpret_cast<const char*>(sqlite3_column_text(statement_.get(), column));
+  return {text, static_cast<std::size_t>(sqlite3_column_bytes(statement_.get(), column))};
+}
+
+}  // namespace Device

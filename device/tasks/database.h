@@ -1,0 +1,62 @@
+// An SQLite database in WAL mode, which processes share. A connection belongs to one process: none
+// may cross a fork.
+#pragma once
+
+#include <sqlite3.h>
+#include <sys/types.h>
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+
+namespace Device {
+
+// Every operation throws std::runtime_error, with the database's own reason, when it fails. A file
+// that turns out to be none, damaged, or of another schema is set aside beside itself, said in one
+// line of the log; the next to open it begins anew.
+class Database {
+ public:
+  // `version` is the schema's, above 0.
+  Database(std::string path, const char* schema, int version);
+
+  // One prepared statement, run to its end or reset when it goes out of scope.
+  class Statement;
+
+  // Runs the body between BEGIN, or BEGIN IMMEDIATE when it is going to write, and COMMIT. What it
+  // throws undoes its changes and passes on.
+  void InTransaction(bool for_writing, const std::function<void()>& body);
+
+ private:
+  void Open();
+  void MakeSchema(const char* schema, int version);
+  void Check(int result);
+  void SetAside(const std::string& reason);
+
+  const std::string path_;
+  ino_t file_ = 0;
+  std::unique_ptr<sqlite3, int (*)(sqlite3*)> database_;
+};
+
+class Database::Statement {
+ public:
+  Statement(Database& database, const char* sql);
+
+  Statement& Bind(const std::string& text);
+  Statement& Bind(std::int64_t number);
+  Statement& BindNull();
+  // True when there is a row.
+  bool Step();
+  std::string Text(int column) const;
+  std::int64_t Number(int column) const { return sqlite3_column_int64(statement_.get(), column); }
+  bool IsNull(int column) const {
+    return sqlite3_column_type(statement_.get(), column) == SQLITE_NULL;
+  }
+
+ private:
+  Database& database_;
+  std::unique_ptr<sqlite3_stmt, int (*)(sqlite3_stmt*)> statement_;
+  int bound_ = 0;
+};
+
+}  // namespace Device

@@ -1,0 +1,301 @@
+#include "device/tasks/task_store.h"
+
+#include <algorithm>
+#include <ctime>
+#include <stdexcept>
+#include <utility>
+
+#include "device/base/json_text.h"
+#include "device/model/device.h"
+
+namespace Device {
+
+using Statement = Database::Statement;
+
+namespace {
+
+constexpr int kSchemaVersion = 2;  // one more with each change of the schema
+
+constexpr char kSchema[] = R"(
+CREATE TABLE tasks (
+  id TEXT PRIMARY KEY, finished INTEGER NOT NULL, updated INTEGER NOT NULL,
+  version INTEGER NOT NULL) WITHOUT ROWID;
+-- Of each property a row without a member: its value, or "{}" for an object. Of each member of an
+-- object a row, whose value is null when it is gone. So a change of one member costs that member.
+CREATE TABLE members (
+  task TEXT NOT NULL, name TEXT NOT NULL, member TEXT NOT NULL, value TEXT,
+  version INTEGER NOT NULL, PRIMARY KEY (task, name, member));
+CREATE TABLE workers (
+  pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL, stopped INTEGER NOT NULL,
+  ended INTEGER NOT NULL);
+CREATE TABLE notifications (
+  time INTEGER NOT NULL, app TEXT NOT NULL, task TEXT NOT NULL, title TEXT NOT NULL,
+  message TEXT NOT NULL, arguments TEXT NOT NULL);
+CREATE TABLE file_index (path TEXT PRIMARY KEY, time INTEGER NOT NULL) WITHOUT ROWID;
+)";
+
+constexpr bool kForReading = false;
+constexpr bool kForWriting = true;
+constexpr char kWhole[] = "";      // in place of a member's name
+constexpr char kMemberMark = '.';  // before it
+
+}  // namespace
+
+TaskStore::TaskStore(const std::string& user)
+    : database_(TheDevice().StateFolder(user) + "/store.db", kSchema, kSchemaVersion) {}
+
+void TaskStore::AddTask(TaskRow& row) {
+  const std::map<std::string, StoredValue> properties = std::exchange(row.properties, {});
+  database_.InTransaction(kForWriting, [&] {
+    row.updated = std::time(nullptr);
+    row.version = 1;
+    Statement(database_, "INSERT INTO tasks VALUES (?, 0, ?, ?)")
+        .Bind(row.id)
+        .Bind(row.updated)
+        .Bind(row.version)
+        .Step();
+    for (const auto& [name, value] : properties) {
+      WriteProperty(row, name, value);
+    }
+  });
+}
+
+void TaskStore::WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
+                            const std::string* text) {
+  Statement insert(database_, "INSERT OR REPLACE INTO members VALUES (?, ?, ?, ?, ?)");
+  insert.Bind(row.id).Bind(name).Bind(member);
+  if (text == nullptr) {
+    insert.BindNull();
+  } else {
+    insert.Bind(*text);
+  }
+  insert.Bind(row.version).Step();
+}
+
+void TaskStore::WriteProperty(TaskRow& row, const std::string& name, StoredValue value) {
+  const bool is_new = row.properties.count(name) == 0;
+  StoredValue& known = row.properties[name];
+  if (is_new || known.text != value.text) {
+    WriteMember(row, name, kWhole, &value.text);
+  }
+  for (const auto& [member, text] : known.members) {
+    if (!value.HasMember(member)) {
+      WriteMember(row, name, kMemberMark + member, nullptr);
+    }
+  }
+  for (const auto& [member, text] : value.members) {
+    const auto found = known.members.find(member);
+    if (found == known.members.end() || found->second != text) {
+      WriteMember(row, name, kMemberMark + member, &text);
+    }
+  }
+  known = std::move(value);
+}
+
+bool TaskStore::ReadChanges(TaskRow& row) {
+  Statement task(database_, "SELECT finished, updated, version FROM tasks WHERE id = ?");
+  if (!task.Bind(row.id).Step()) {
+    return false;
+  }
+  Statement changes(database_,
+                    "SELECT name, member, value FROM members WHERE task = ? AND version > ? "
+                    "ORDER BY name, member");
+  changes.Bind(row.id).Bind(row.version);
+  while (changes.Step()) {
+    StoredValue& property = row.properties[changes.Text(0)];
+    const std::string member = changes.Text(1);
+    if (member == kWhole) {
+      property.text = changes.Text(2);
+      property.members.clear();
+    } else if (const std::string key = member.substr(sizeof kMemberMark); changes.IsNull(2)) {
+      property.members.erase(key);
+    } else {
+      property.members[key] = changes.Text(2);
+    }
+  }
+  row.finished = task.Number(0) != 0;
+  row.updated = task.Number(1);
+  row.version = task.Number(2);
+  return true;
+}
+
+bool TaskStore::RefreshTask(TaskRow& row) {
+  bool is_found = false;
+  database_.InTransaction(kForReading, [&] { is_found = ReadChanges(row); });
+  return is_found;
+}
+
+std::optional<TaskRow> TaskStore::FindTask(const std::string& id) {
+  TaskRow row;
+  row.id = id;
+  return RefreshTask(row) ? std::optional<TaskRow>(std::move(row)) : std::nullopt;
+}
+
+void TaskStore::RefreshTasks(std::map<std::string, TaskRow>& rows) {
+  database_.InTransaction(kForReading, [&] {
+    std::map<std::string, TaskRow> known = std::exchange(rows, {});
+    Statement select(database_, "SELECT id FROM tasks");
+    while (select.Step()) {
+      const std::string id = select.Text(0);
+      TaskRow& row = rows[id];
+      row = std::move(known[id]);
+      row.id = id;
+      ReadChanges(row);
+    }
+  });
+}
+
+std::vector<TaskRow> TaskStore::AllTasks() {
+  std::map<std::string, TaskRow> rows;
+  RefreshTasks(rows);
+  std::vector<TaskRow> all;
+  all.reserve(rows.size());
+  for (auto& [id, row] : rows) {
+    all.push_back(std::move(row));
+  }
+  std::stable_sort(all.begin(), all.end(), [](const TaskRow& one, const TaskRow& other) {
+    return one.updated < other.updated;
+  });
+  return all;
+}
+
+bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> properties,
+                           bool finished) {
+  bool is_found = false;
+  database_.InTransaction(kForWriting, [&] {
+    is_found = ReadChanges(row);
+    if (!is_found) {
+      return;
+    }
+    ++row.version;
+    row.finished = row.finished || finished;
+    row.updated = std::time(nullptr);
+    Statement(database_, "UPDATE tasks SET finished = ?, updated = ?, version = ? WHERE id = ?")
+        .Bind(row.finished ? 1 : 0)
+        .Bind(row.updated)
+        .Bind(row.version)
+        .Bind(row.id)
+        .Step();
+    for (auto& [name, value] : properties) {
+      WriteProperty(row, name, std::move(value));
+    }
+  });
+  return is_found;
+}
+
+void TaskStore::RemoveTask(const std::string& id, pid_t worker) {
+  database_.InTransaction(kForWriting, [&] {
+    RemoveWorker(worker);
+    Statement(database_, "DELETE FROM members WHERE task = ?").Bind(id).Step();
+    Statement(database_, "DELETE FROM tasks WHERE id = ?").Bind(id).Step();
+  });
+}
+
+void TaskStore::AddWorker(pid_t pid, std::uint64_t start_time) {
+  Statement(database_, "INSERT OR REPLACE INTO workers VALUES (?, ?, 0, 0)")
+      .Bind(std::int64_t{pid})
+      .Bind(static_cast<std::int64_t>(start_time))
+      .Step();
+}
+
+std::optional<WorkerRow> TaskStore::FindWorker(pid_t pid) {
+  Statement select(database_, "SELECT start_time, stopped, ended FROM workers WHERE pid = ?");
+  if (!select.Bind(std::int64_t{pid}).Step()) {
+    return std::nullopt;
+  }
+  return WorkerRow{static_cast<std::uint64_t>(select.Number(0)), select.Number(1),
+                   select.Number(2) != 0};
+}
+
+void TaskStore::NoteStop(pid_t pid) {
+  Statement(database_, "UPDATE workers SET stopped = ? WHERE pid = ?")
+      .Bind(std::time(nullptr))
+      .Bind(std::int64_t{pid})
+      .Step();
+}
+
+void TaskStore::NoteEnd(pid_t pid) {
+  Statement(database_, "UPDATE workers SET ended = 1 WHERE pid = ?").Bind(std::int64_t{pid}).Step();
+}
+
+std::vector<pid_t> TaskStore::AllWorkers() {
+  std::vector<pid_t> workers;
+  Statement select(database_, "SELECT pid FROM workers");
+  while (select.Step()) {
+    workers.push_back(static_cast<pid_t>(select.Number(0)));
+  }
+  return workers;
+}
+
+void TaskStore::RemoveWorker(pid_t pid) {
+  Statement(database_, "DELETE FROM workers WHERE pid = ?").Bind(std::int64_t{pid}).Step();
+}
+
+void TaskStore::AddNotification(const NotificationRow& row) {
+  Json::Value arguments(Json::arrayValue);
+  for (const std::string& argument : row.arguments) {
+    arguments.append(argument);
+  }
+  Statement(database_, "INSERT INTO notifications VALUES (?, ?, ?, ?, ?, ?)")
+      .Bind(row.time)
+      .Bind(row.app)
+      .Bind(row.task)
+      .Bind(row.title)
+      .Bind(row.message)
+      .Bind(ToText(arguments))
+      .Step();
+}
+
+std::vector<NotificationRow> TaskStore::NotificationsAfter(std::int64_t number) {
+  std::vector<NotificationRow> rows;
+  Statement select(database_,
+                   "SELECT rowid, time, app, task, title, message, arguments FROM notifications "
+                   "WHERE rowid > ? ORDER BY rowid");
+  select.Bind(number);
+  while (select.Step()) {
+    NotificationRow row;
+    row.number = select.Number(0);
+    row.time = select.Number(1);
+    row.app = select.Text(2);
+    row.task = select.Text(3);
+    row.title = select.Text(4);
+    row.message = select.Text(5);
+    for (const Json::Value& argument : ParseJson(select.Text(6))) {
+      row.arguments.push_back(argument.asString());
+    }
+    rows.push_back(std::move(row));
+  }
+  return rows;
+}
+
+std::int64_t TaskStore::LastNotification() {
+  Statement select(database_, "SELECT ifnull(max(rowid), 0) FROM notifications");
+  return select.Step() ? select.Number(0) : 0;
+}
+
+std::int64_t TaskStore::Version() {
+  Statement select(database_, "PRAGMA data_version");
+  return select.Step() ? select.Number(0) : 0;
+}
+
+void TaskStore::AddToIndex(const std::string& path) {
+  Statement(database_, "INSERT OR REPLACE INTO file_index VALUES (?, ?)")
+      .Bind(path)
+      .Bind(std::time(nullptr))
+      .Step();
+}
+
+namespace {
+std::map<std::string, TaskStore>& Stores() {
+  static std::map<std::string, TaskStore> stores;
+  return stores;
+}
+}  // namespace
+
+TaskStore& StoreOf(const std::string& user) {
+  return Stores().try_emplace(user, user).first->second;
+}
+
+void CloseStores() { Stores().clear(); }
+
+}  // namespace Device

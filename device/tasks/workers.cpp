@@ -1,0 +1,227 @@
+#include "device/tasks/workers.h"
+
+#include <dirent.h>
+#include <poll.h>
+#include <sched.h>
+#include <sys/syscall.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cctype>
+#include <cerrno>
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <ctime>
+#include <fstream>
+#include <iterator>
+#include <memory>
+#include <optional>
+#include <sstream>
+#include <stdexcept>
+
+#include "device/base/file_descriptor.h"
+#include "device/tasks/task_store.h"
+
+namespace Device {
+
+namespace {
+
+using Clock = std::chrono::steady_clock;
+
+constexpr std::size_t kJobsAtOnce = 4;  // of a user, that need not yield
+constexpr std::chrono::seconds kGrace(5);
+constexpr std::chrono::milliseconds kGroupPoll(5);
+
+struct ProcessStat {
+  char state = 0;  // as in /proc/PID/stat: 'Z' for a zombie
+  pid_t group = 0;
+  std::uint64_t start_time = 0;  // ticks since boot
+};
+
+std::optional<ProcessStat> ReadStat(pid_t pid) {
+  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
+  std::string text;
+  if (!std::getline(file, text, '\0')) {
+    return std::nullopt;
+  }
+  // The second field, the program's name, may hold blanks and brackets.
+  std::istringstream fields(text.substr(std::min(text.rfind(')'), text.size() - 1) + 1));
+  constexpr int kFieldsBetween = 16;  // from session to the one before start_time
+  ProcessStat stat;
+  pid_t parent = 0;
+  fields >> stat.state >> parent >> stat.group;
+  std::string skipped;
+  for (int field = 0; field < kFieldsBetween; ++field) {
+    fields >> skipped;
+  }
+  fields >> stat.start_time;
+  return fields ? std::optional<ProcessStat>(stat) : std::nullopt;
+}
+
+bool HasEnded(const ProcessStat& stat) { return stat.state == 'Z' || stat.state == 'X'; }
+
+// The entries of /proc, or of a process's folder "task", that are numbers.
+std::vector<pid_t> IdsIn(const std::string& folder) {
+  std::vector<pid_t> ids;
+  const std::unique_ptr<DIR, int (*)(DIR*)> entries(opendir(folder.c_str()), closedir);
+  while (const dirent* const entry = entries ? readdir(entries.get()) : nullptr) {
+    if (std::isdigit(static_cast<unsigned char>(entry->d_name[0])) != 0) {
+      ids.push_back(std::atoi(entry->d_name));
+    }
+  }
+  return ids;
+}
+
+std::vector<pid_t> LivingProcesses(const std::set<pid_t>& groups) {
+  std::vector<pid_t> living;
+  for (const pid_t pid : IdsIn("/proc")) {
+    const std::optional<ProcessStat> stat = ReadStat(pid);
+    if (stat && groups.count(stat->group) != 0 && !HasEnded(*stat)) {
+      living.push_back(pid);
+    }
+  }
+  return living;
+}
+
+// The policy for all threads there. A failure costs time, no more.
+void Schedule(const std::set<pid_t>& groups, int policy) {
+  const sched_param none{};
+  for (const pid_t pid : LivingProcesses(groups)) {
+    for (const pid_t thread : IdsIn("/proc/" + std::to_string(pid) + "/task")) {
+      sched_setscheduler(thread, policy, &none);
+    }
+  }
+}
+
+bool WaitForGroup(pid_t group, Clock::time_point deadline) {
+  while (!LivingProcesses({group}).empty()) {
+    if (Clock::now() >= deadline) {
+      return false;
+    }
+    poll(nullptr, 0, static_cast<int>(kGroupPoll.count()));
+  }
+  return true;
+}
+
+bool IsAlive(pid_t pid, const WorkerRow& worker) {
+  const std::optional<ProcessStat> stat = ReadStat(pid);
+  return stat && stat->start_time == worker.start_time && !HasEnded(*stat);
+}
+
+bool IsBeingStopped(const WorkerRow& worker) {
+  // From the first signal to the task's removal; a request that died meanwhile removes nothing.
+  constexpr std::time_t kLongest = 30;
+  const std::time_t age = std::time(nullptr) - worker.stopped;
+  return age >= 0 && age < kLongest;  // below when the clock was set back since
+}
+
+void WaitForProcess(const FileDescriptor& process, Clock::time_point deadline) {
+  const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(deadline - Clock::now());
+  pollfd ended = {process.Get(), POLLIN, 0};
+  poll(&ended, 1, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
+}
+
+bool IsYielding(pid_t worker) { return sched_getscheduler(worker) == SCHED_IDLE; }
+
+// Answers come before the packing of a crowd. All its jobs yield, so that none waits for the
+// others.
+void YieldIfCrowded(const std::string& user, pid_t newest) {
+  std::set<pid_t> jobs;
+  for (const pid_t worker : StoreOf(user).AllWorkers()) {
+    if (IsWorkerAlive(user, worker)) {
+      jobs.insert(worker);
+    }
+  }
+  if (jobs.size() <= kJobsAtOnce) {
+    return;
+  }
+  // It may not lead its group yet; what it starts will yield like itself.
+  const sched_param none{};
+  sched_setscheduler(newest, SCHED_IDLE, &none);
+  std::set<pid_t> pressing;
+  std::copy_if(jobs.begin(), jobs.end(), std::inserter(pressing, pressing.end()),
+               [](pid_t worker) { return !IsYielding(worker); });
+  if (!pressing.empty()) {
+    Schedule(pressing, SCHED_IDLE);
+  }
+}
+
+}  // namespace
+
+void RegisterWorker(const std::string& user, pid_t pid) {
+  const std::optional<ProcessStat> stat = ReadStat(pid);
+  if (!stat) {
+    throw std::runtime_error("no process " + std::to_string(pid));
+  }
+  StoreOf(user).AddWorker(pid, stat->start_time);
+  YieldIfCrowded(user, pid);
+}
+
+bool IsWorkerAlive(const std::string& user, pid_t pid) {
+  const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
+  return worker && IsAlive(pid, *worker);
+}
+
+bool IsBeingStopped(const std::string& user, pid_t pid) {
+  const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
+  return worker && IsBeingStopped(*worker);
+}
+
+bool HasDied(const std::string& user, pid_t pid) {
+  const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
+  return worker && !IsAlive(pid, *worker) && !IsBeingStopped(*worker) && !worker->has_come_to_end;
+}
+
+bool EndWorker(const std::string& user, pid_t pid) {
+  if (!StoreOf(user).FindWorker(pid)) {
+    return false;
+  }
+  // The descriptor holds on to the process that has the id now; whether that is the worker is asked
+  // after, so that no other can slip in between.
+  const FileDescriptor process(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
+  // Where there are no such descriptors, under emulators, the id itself must do.
+  const bool has_descriptor = static_cast<bool>(process);
+  const int error = has_descriptor ? 0 : errno;
+  if (error != 0 && error != ESRCH && error != ENOSYS) {
+    return false;
+  }
+  if (error == ESRCH || !IsWorkerAlive(user, pid)) {
+    return true;  // it has ended already, and an archiver that nobody reads from ends by itself
+  }
+  try {  // a store without room keeps no job from being stopped
+    StoreOf(user).NoteStop(pid);
+  } catch (const std::exception& no_room) {
+    syslog(LOG_ERR, "stop: %s", no_room.what());
+  }
+  if (IsYielding(pid)) {
+    Schedule({pid}, SCHED_OTHER);
+  }
+  const Clock::time_point deadline = Clock::now() + kGrace;
+  const bool is_told = has_descriptor
+                           ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0
+                           : kill(pid, SIGTERM) == 0;
+  if (!is_told) {
+    return errno == ESRCH;  // it has ended in this moment
+  }
+  if (has_descriptor) {
+    WaitForProcess(process, deadline);
+  }
+  if (WaitForGroup(pid, deadline)) {
+    return true;
+  }
+  kill(-pid, SIGKILL);
+  return WaitForGroup(pid, Clock::now() + kGrace);
+}
+
+void ForgetEndedWorkers(const std::string& user, const std::vector<pid_t>& workers,
+                        const std::set<pid_t>& kept) {
+  for (const pid_t pid : workers) {
+    if (kept.count(pid) == 0 && !IsWorkerAlive(user, pid)) {
+      StoreOf(user).RemoveWorker(pid);
+    }
+  }
+}
+
+}  // namespace Device

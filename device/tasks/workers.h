@@ -1,0 +1,35 @@
+// Worker processes of a user: known by process id and start time, so that one that has taken over a
+// process id is never taken for a worker.
+#pragma once
+
+#include <sys/types.h>
+
+#include <set>
+#include <string>
+#include <vector>
+
+namespace Device {
+
+// Enters a process that has just been forked. From a user's fifth at work on, all of that user's
+// get, with what they have started, the time that nobody else wants. Throws std::runtime_error.
+void RegisterWorker(const std::string& user, pid_t pid);
+
+// True if the process is a worker of the user's and has not ended; a zombie has.
+bool IsWorkerAlive(const std::string& user, pid_t pid);
+
+// True if "stop" is ending the worker: its task is going to be removed.
+bool IsBeingStopped(const std::string& user, pid_t pid);
+
+// True of a worker that was killed, or that ended before its end: it has stored no outcome and
+// never will.
+bool HasDied(const std::string& user, pid_t pid);
+
+// Ends a worker of the user's and all that runs in its process group: asks first, and insists after
+// a grace of 5 s. False when it is none, or could not be ended.
+bool EndWorker(const std::string& user, pid_t pid);
+
+// Forgets those of the workers that have ended, but those to be kept.
+void ForgetEndedWorkers(const std::string& user, const std::vector<pid_t>& workers,
+                        const std::set<pid_t>& kept);
+
+}  // namespace Device
