@@ -1,6 +1,6 @@
 #include "compress/KAVO.Zantro.Compress.h"
 
-#include "compress/error_codes.h"
+#include "platform/kavo/error_codes.h"
 
 Vesk::Task* pTask = nullptr;
 
@@ -22,7 +22,7 @@ void ZantroCompressHandler::Process() {
   } else if (method == "stop") {
     LumoCancelHandler();
   } else {
-    SetError(kErrBadParameter);
+    SetError(KAVO::kErrBadParameter);
   }
 }
 

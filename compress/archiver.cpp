@@ -13,8 +13,8 @@
 #include <new>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "compress/error_codes.h"
 #include "compress/task_record.h"
+#include "platform/kavo/error_codes.h"
 #include "platform/klib/system.h"
 #include "platform/lumo/file_manager.h"
 
@@ -85,9 +85,9 @@ int NameTooLongCode(const std::string& dest_path) {
   if (LumoLibCheckEncryptShare(dest_path, &is_encrypted) == 0) {
     syslog(LOG_ERR, "%s:%d Failed to get share info for %s", kLogSource, __LINE__,
            dest_path.c_str());
-    return kErrNameTooLong;
+    return KAVO::kErrNameTooLong;
   }
-  return is_encrypted ? kErrNameTooLongCrypt : kErrNameTooLong;
+  return is_encrypted ? KAVO::kErrNameTooLongEncrypted : KAVO::kErrNameTooLong;
 }
 
 // A line buffer as getline grows it.
@@ -114,7 +114,7 @@ bool ZantroCompressHandler::LumoCompressFiles(const _tag_CompressInfo_& info, co
     output.reset(KLIBCPopenv(kArchiverProgram, "r", arguments.Get(), 0));
     if (output == nullptr) {
       syslog(LOG_ERR, "%s:%d KLIBCPopenv failed", kLogSource, __LINE__);
-      SetErrItem(info.dest_path, kErrGeneral);
+      SetErrItem(info.dest_path, KAVO::kErrGeneral);
     } else if (FollowArchiver(info, output.get())) {
       SetArchiveMode(archive_path);
       succeeded = true;
@@ -145,7 +145,7 @@ bool ZantroCompressHandler::PrepareArchiver(const _tag_CompressInfo_& info, cons
   if (VolumePathParse(archive.volume_path.c_str(), &volume) < 0) {
     syslog(LOG_ERR, "%s:%d Failed to get volume info, %s", kLogSource, __LINE__,
            archive.volume_path.c_str());
-    SetErrItem(archive.volume_path, kErrGeneral);
+    SetErrItem(archive.volume_path, KAVO::kErrGeneral);
     return false;
   }
   if (chdir(info.work_dir.c_str()) == -1) {
@@ -192,16 +192,16 @@ void ZantroCompressHandler::RecordArchiverError(ArchiverError error, const char*
                                                 const std::string& dest_path) {
   switch (error) {
     case ArchiverError::kNoSpace:
-      return SetErrItem(dest_path, kErrNoSpace);
+      return SetErrItem(dest_path, KAVO::kErrNoSpace);
     case ArchiverError::kQuota:
-      return SetErrItem(dest_path, kErrQuota);
+      return SetErrItem(dest_path, KAVO::kErrQuota);
     case ArchiverError::kReadOnly:
-      return SetErrItem(dest_path, kErrReadOnly);
+      return SetErrItem(dest_path, KAVO::kErrReadOnly);
     case ArchiverError::kNameTooLong:
       return SetErrItem(dest_path, NameTooLongCode(dest_path));
     case ArchiverError::kUnknown:
       syslog(LOG_ERR, "%s:%d %s", kLogSource, __LINE__, line);
-      return SetErrItem(dest_path, kErrGeneral);
+      return SetErrItem(dest_path, KAVO::kErrGeneral);
   }
 }
 
@@ -226,10 +226,10 @@ void ZantroCompressHandler::SetArchiveOwner(const char* archive_path, const char
     const int line = KLIBCErrorGetLine();
     syslog(LOG_ERR, "%s:%d KLIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]", kLogSource,
            __LINE__, user, error, file, line);
-    SetErrItem(dest_path, kErrTask);
+    SetErrItem(dest_path, KAVO::kErrSystem);
   } else if (is_admin == 1 && LumoLibChown2Admin(archive_path, user) != 0) {
     syslog(LOG_ERR, "%s:%d LumoLibChown2Admin fail", kLogSource, __LINE__);
-    SetErrItem(dest_path, kErrTask);
+    SetErrItem(dest_path, KAVO::kErrSystem);
   }
 }
 

@@ -5,8 +5,8 @@
 #include <cerrno>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "compress/error_codes.h"
 #include "compress/split_path.h"
+#include "platform/kavo/error_codes.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Zantro {
@@ -61,7 +61,7 @@ bool ZantroCompressHandler::CheckDestShare(const char* dest, const char* user,
     return false;
   }
   if (level != kPrivilegeWrite || (flags & kFlagWriteSuspended) != 0) {
-    SetErrItem(dest, kErrNoPrivilege);  // no line of its own, deliberately
+    SetErrItem(dest, KAVO::kErrNoPrivilege);  // no line of its own, deliberately
     return false;
   }
   return true;
@@ -118,7 +118,7 @@ bool ZantroCompressHandler::CheckSource(const PathInfo& source,
                                 source.share_path.c_str()) == 0) {
       syslog(LOG_ERR, "%s:%d No share privilege to list path %s", kLogSource, __LINE__,
              source.share_path.c_str());
-      SetErrItem(source.share_path, kErrNoPrivilege);
+      SetErrItem(source.share_path, KAVO::kErrNoPrivilege);
       return true;
     }
   }

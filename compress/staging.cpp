@@ -16,8 +16,8 @@
 #include <string>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "compress/error_codes.h"
 #include "compress/list_line.h"
+#include "platform/kavo/error_codes.h"
 #include "platform/klib/system.h"
 #include "platform/lumo/file_manager.h"
 
@@ -88,7 +88,7 @@ bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std:
   const FileDescriptor list(mkstemp(list_file));
   if (list.Get() == -1) {
     syslog(LOG_ERR, "%s:%d Failed to mkstemp %s", kLogSource, __LINE__, kTempTemplate);
-    SetErrItem(info.dest_path, kErrGeneral);
+    SetErrItem(info.dest_path, KAVO::kErrGeneral);
     return false;
   }
   for (const PathInfo& source : info.path_infos) {
@@ -101,7 +101,7 @@ bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std:
     }
     if (!WriteLine(list.Get(), line)) {
       syslog(LOG_ERR, "%s:%d Failed to write %s to tempzip", kLogSource, __LINE__, line.Text());
-      SetErrItem(info.dest_path, kErrGeneral);
+      SetErrItem(info.dest_path, KAVO::kErrGeneral);
       return false;
     }
   }
@@ -113,7 +113,7 @@ bool ZantroCompressHandler::GenerateZipListWithShare(_tag_CompressInfo_& info) {
   std::string directory = kTempTemplate;
   if (mkdtemp(directory.data()) == nullptr) {
     syslog(LOG_ERR, "%s:%d Failed to create a temp directory.", kLogSource, __LINE__);
-    SetErrItem(info.dest_path, kErrGeneral);
+    SetErrItem(info.dest_path, KAVO::kErrGeneral);
     return false;
   }
   char list_file[] = "lumozipXXXXXX";
@@ -130,13 +130,13 @@ bool ZantroCompressHandler::FillStagingDirectory(const _tag_CompressInfo_& info,
                                                  const char* directory, char* list_file) {
   if (chdir(directory) != 0) {
     syslog(LOG_ERR, "%s:%d Failed to chdir %s.", kLogSource, __LINE__, directory);
-    SetErrItem(info.dest_path, kErrGeneral);
+    SetErrItem(info.dest_path, KAVO::kErrGeneral);
     return false;
   }
   const FileDescriptor list(mkstemp(list_file));
   if (list.Get() < 0) {
     syslog(LOG_ERR, "%s:%d Failed to create a temp file.", kLogSource, __LINE__);
-    SetErrItem(info.dest_path, kErrGeneral);
+    SetErrItem(info.dest_path, KAVO::kErrGeneral);
     return false;
   }
   for (const PathInfo& source : info.path_infos) {
@@ -150,7 +150,7 @@ bool ZantroCompressHandler::FillStagingDirectory(const _tag_CompressInfo_& info,
     }
     if (!WriteLine(list.Get(), line)) {
       syslog(LOG_ERR, "%s:%d Failed to write tempzip", kLogSource, __LINE__);
-      SetErrItem(info.dest_path, kErrGeneral);
+      SetErrItem(info.dest_path, KAVO::kErrGeneral);
       return false;
     }
   }
@@ -175,7 +175,7 @@ bool ZantroCompressHandler::LinkShare(const PathInfo& source) {
 void ZantroCompressHandler::RefuseSource(const PathInfo& source) {
   syslog(LOG_ERR, "%s:%d Name is too long for tempzip or holds a line feed: %s", kLogSource,
          __LINE__, source.share_path.c_str());
-  SetErrItem(source.share_path, kErrGeneral);
+  SetErrItem(source.share_path, KAVO::kErrGeneral);
 }
 
 }  // namespace Zantro

@@ -7,8 +7,8 @@
 #include <cstring>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "compress/error_codes.h"
 #include "compress/task_record.h"
+#include "platform/kavo/error_codes.h"
 #include "platform/kavo/settings.h"
 #include "platform/klib/system.h"
 #include "platform/lumo/file_manager.h"
@@ -42,7 +42,7 @@ void ZantroCompressHandler::LumoCompressHandler() {
   if (worker < 0) {
     pTask->remove();
     syslog(LOG_ERR, "%s:%d Failed to fork().", kLogSource, __LINE__);
-    SetError(kErrGeneral);
+    SetError(KAVO::kErrGeneral);
     return;
   }
   if (worker == 0) {
@@ -54,14 +54,14 @@ void ZantroCompressHandler::LumoCompressHandler() {
 bool ZantroCompressHandler::ReadStartParameters(KavoSettings& settings, StartParameters& start) {
   if (!request->HasParam(kParamPath) || !request->HasParam(kParamDest)) {
     syslog(LOG_ERR, "%s:%d Bad parameter", kLogSource, __LINE__);
-    SetError(kErrBadParameter);
+    SetError(KAVO::kErrBadParameter);
     return false;
   }
   start.codepage = SettleCodepage(settings);
   const Json::Value source_list = ExplodeParam(kParamPath, "");
   if (source_list.empty()) {
     syslog(LOG_ERR, "%s:%d Bad parameter: no input source file", kLogSource, __LINE__);
-    SetError(kErrBadParameter);
+    SetError(KAVO::kErrBadParameter);
     return false;
   }
   if (!ReadDestination(start)) {
@@ -91,7 +91,7 @@ bool ZantroCompressHandler::ReadDestination(StartParameters& start) {
   if (destinations.size() != 1) {
     syslog(LOG_ERR, "%s:%d Bad parameter: Should not specify more than one detination path",
            kLogSource, __LINE__);
-    SetError(kErrBadParameter);
+    SetError(KAVO::kErrBadParameter);
     return false;
   }
   start.dest = destinations[0].asString();
@@ -100,12 +100,12 @@ bool ZantroCompressHandler::ReadDestination(StartParameters& start) {
   char* name = basename(start.dest.data());
   if (name == nullptr) {
     syslog(LOG_ERR, "%s:%d Bad parameter: no archive name", kLogSource, __LINE__);
-    SetError(kErrBadParameter);
+    SetError(KAVO::kErrBadParameter);
     return false;
   }
   if (std::strlen(basename(name)) > kArchiveNameMax) {
     syslog(LOG_ERR, "%s:%d Bad parameter: Compress zipname too long", kLogSource, __LINE__);
-    SetError(kErrArchiveNameTooLong);
+    SetError(KAVO::kErrArchiveNameTooLong);
     return false;
   }
   start.dest.resize(std::strlen(start.dest.c_str()));
@@ -125,7 +125,7 @@ bool ZantroCompressHandler::CreateTask(Vesk::TaskMgr& task_manager) {
     pTask = new Vesk::Task(login_user.c_str(), task_id.c_str());
     return true;
   } catch (...) {
-    SetError(kErrTask);
+    SetError(KAVO::kErrSystem);
     return false;
   }
 }
@@ -166,7 +166,7 @@ void ZantroCompressHandler::StoreNewTask(pid_t worker) {
   if (!pTask->endUpdate()) {
     // The worker runs on, deliberately; it makes the archive but has no data to report in.
     syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
-    SetError(kErrGeneral);
+    SetError(KAVO::kErrGeneral);
     return;
   }
   Json::Value answer(Json::objectValue);

@@ -5,8 +5,8 @@
 #include <optional>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "compress/error_codes.h"
 #include "compress/task_record.h"
+#include "platform/kavo/error_codes.h"
 
 namespace Zantro {
 
@@ -55,7 +55,7 @@ void ZantroCompressHandler::LumoProgressHandler() {
 
 Json::Value ZantroCompressHandler::ReportProgress(std::optional<Vesk::TaskMgr>& task_manager) {
   if (!request->HasParam(kParamTaskId)) {
-    SetError(kErrBadParameter);
+    SetError(KAVO::kErrBadParameter);
     return {};
   }
   task_manager.emplace(login_user.c_str());
@@ -63,13 +63,13 @@ Json::Value ZantroCompressHandler::ReportProgress(std::optional<Vesk::TaskMgr>& 
   try {
     pTask = task_manager->getTaskWithThrow(task_id.c_str());
   } catch (...) {
-    SetError(kErrNoTask);
+    SetError(KAVO::kErrNoTask);
     return {};
   }
   Json::Value data = pTask->getProperty(kPropData);
   if (data.isNull()) {
     syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
-    SetError(kErrTask);
+    SetError(KAVO::kErrSystem);
     return data;
   }
   SetResponse(MakeAnswer(data));

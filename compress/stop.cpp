@@ -3,14 +3,14 @@
 #include <syslog.h>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "compress/error_codes.h"
 #include "compress/task_record.h"
+#include "platform/kavo/error_codes.h"
 
 namespace Zantro {
 
 void ZantroCompressHandler::LumoCancelHandler() {
   if (!request->HasParam(kParamTaskId)) {
-    SetError(kErrBadParameter);
+    SetError(KAVO::kErrBadParameter);
     return;
   }
   Vesk::TaskMgr task_manager(login_user.c_str());
@@ -33,7 +33,7 @@ void ZantroCompressHandler::KillWorker() {
   // "start" may still be storing the worker's process id.
   if (WaitForTaskDataKeyReady(pTask, kPropData, kDataPid, kDataWaitSeconds) == 0) {
     syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
-    SetError(kErrTask);
+    SetError(KAVO::kErrSystem);
     return;
   }
   if (pTask->isFinished()) {
@@ -42,11 +42,11 @@ void ZantroCompressHandler::KillWorker() {
   const Json::Value data = pTask->getProperty(kPropData);
   if (data.isNull()) {
     syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
-    SetError(kErrTask);
+    SetError(KAVO::kErrSystem);
     return;
   }
   if (DoKill(data[kDataPid].asInt()) == 0) {
-    SetError(kErrTask);
+    SetError(KAVO::kErrSystem);
   }
 }
 

@@ -12,8 +12,8 @@
 #include <utility>
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "compress/error_codes.h"
 #include "compress/task_record.h"
+#include "platform/kavo/error_codes.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Zantro {
@@ -142,7 +142,7 @@ bool ZantroCompressHandler::RunJob(StartParameters& start, _tag_CompressInfo_& i
   } catch (...) {
     syslog(LOG_ERR, "%s:%d Unexpected failure", kLogSource, __LINE__);
   }
-  SetErrItem(start.dest, kErrGeneral);
+  SetErrItem(start.dest, KAVO::kErrGeneral);
   return false;
 }
 

@@ -15,8 +15,8 @@ extern "C" int __lsan_do_recoverable_leak_check() __attribute__((weak));  // NOL
 
 namespace {
 
-using Device::ApiRow;
 using Device::Outcome;
+using KAVO::ApiRow;
 
 // The names of the module's dynamic symbols without a version, without their arguments.
 std::set<std::string> Symbols(const std::string& which) {

@@ -102,13 +102,12 @@ TEST(Run7z, TellsCauseAndObjectInOneLine) {
   for (const auto& row : rows) {
     const Cancel cancel(STDOUT_FILENO);
     Report report(cancel);
-    Child7z child;
-    child.program = *row.script == '/' ? row.script : "/bin/sh";
-    child.arguments = {"-c", row.script};
-    child.folder = "/";
-    child.left_out = {"left out"};
+    Device::ProgramStart start;
+    start.program = *row.script == '/' ? row.script : "/bin/sh";
+    start.arguments = {start.program, "-c", row.script};
+    start.folder = "/";
     try {
-      Run7z(child, cancel, report);
+      Run7z(start, {"left out"}, cancel, report);
       ADD_FAILURE() << "succeeded: " << row.script;
     } catch (const Failure& failure) {
       EXPECT_STREQ(failure.what(), row.line);

@@ -1,9 +1,7 @@
 // The archiver as a program: what it packs, and what it leaves behind when it cannot.
 #include <fcntl.h>
 #include <gtest/gtest.h>
-#include <sys/prctl.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <zip.h>
 
 #include <algorithm>
@@ -285,29 +283,20 @@ TEST_F(ArchiverTest, SaysWhyARequestCannotBeMet) {
   EXPECT_EQ(InOut(), Strings{});
 }
 
-TEST_F(ArchiverTest, StopsAtOnceAndLeavesNothing) {
-  const bool adopts_orphans = prctl(PR_SET_CHILD_SUBREAPER, 1) == 0;
-  ASSERT_TRUE(adopts_orphans || kIsEmulated);  // an emulator may not know of it
-  for (const int signal : {SIGTERM, SIGINT, SIGHUP, SIGKILL, 0}) {  // 0: nobody reads any more
+TEST_F(ArchiverTest, StopsWhenToldAndLeavesNothing) {
+  for (const int signal : {SIGTERM, SIGINT, SIGHUP, 0}) {  // 0: nobody reads any more
     const auto run = Pack();
     EXPECT_NE(run->Seen().find("Total: 5368709120\n"), std::string::npos) << run->Seen();
     EXPECT_EQ(InOut().size(), 1U);
     EXPECT_FALSE(fs::exists(out / "new"));
-    const auto start = std::chrono::steady_clock::now();
     if (signal == 0) {
       run->CloseOutput();
     } else {
-      kill(signal == SIGKILL ? run->Pid() : -run->Pid(), signal);
-    }
-    EXPECT_EQ(run->Wait(), signal == SIGKILL ? -SIGKILL : 1);
-    int status = 0;
-    if (signal == SIGKILL) {  // the supervisor's; the job, an orphan now, cancels itself
-      EXPECT_EQ(waitpid(-1, &status, 0) > 0, adopts_orphans);
+      kill(-run->Pid(), signal);
       EXPECT_TRUE(run->ReadUntil("\nError: cancelled\n"));
     }
+    EXPECT_EQ(run->Wait(), 1);
     EXPECT_EQ(InOut(), Strings{});
-    EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(kSlowness));
-    EXPECT_EQ(waitpid(-1, &status, WNOHANG), -1);
   }
 }
 
@@ -318,11 +307,8 @@ TEST_F(ArchiverTest, SparesTheFolderOfARunThatIsAliveAndSweepsThatOfOneThatWasKi
   Good("other", {"a"});
   EXPECT_EQ(InOut(), (Strings{before.front(), "other"}));
 
-  const std::string supervisor = std::to_string(run->Pid());
-  const int job = std::stoi(ReadFile("/proc/" + supervisor + "/task/" + supervisor + "/children"));
-  ASSERT_EQ(kill(job, SIGKILL), 0);
-  EXPECT_EQ(run->Wait(), 1);
-  EXPECT_TRUE(run->ReadUntil("\nError: the archiver was killed\n"));
+  ASSERT_EQ(kill(run->Pid(), SIGKILL), 0);
+  EXPECT_EQ(run->Wait(), -SIGKILL);
   EXPECT_EQ(InOut().size(), 2U);
   // The stock 7z dies with its parent, in its own time; then nothing holds the lock.
   for (int tries = 0; tries < 1000 && InOut() != Strings{"other"}; ++tries) {
@@ -353,13 +339,13 @@ TEST_F(ArchiverTest, HidesThePasswordFromOtherUsers) {
     GTEST_SKIP() << "what a program makes of its arguments is the emulator's own memory";
   }
   const auto run = Pack({"a", "", "geheim", nullptr});
-  int processes = 0;
+  bool is_seen = false;
   for (const auto& entry : fs::directory_iterator("/proc")) {
     const std::string command = ReadFile(entry.path() / "cmdline");
-    processes += command.find(root.string()) != std::string::npos ? 1 : 0;
+    is_seen = is_seen || command.find(root.string()) != std::string::npos;
     EXPECT_EQ(command.find("geheim"), std::string::npos) << command;
   }
-  EXPECT_EQ(processes, 3);  // supervisor, job, stock 7z
+  EXPECT_TRUE(is_seen);
 }
 
 }  // namespace

@@ -70,7 +70,7 @@ class DeviceTest : public testing::Test {
   std::vector<TracedCall> Calls(const std::string& call = "") const;
   // The last worker's process id, -1 when there was none.
   int Worker() const;
-  // The living processes of the worker's group: itself, the archiver's two, the stock 7z.
+  // The living processes of the worker's group: itself, the archiver, the stock 7z.
   static std::set<pid_t> Group(pid_t worker);
   // What a process called, libc's calls by the module among it: one line for each, the name and,
   // if asked for, the arguments as Plain has them. Getters of the task's id are left out.

@@ -3,7 +3,6 @@
 #include <dlfcn.h>
 #include <elf.h>
 #include <fcntl.h>
-#include <spawn.h>
 #include <unistd.h>
 
 #include <cstdlib>
@@ -90,13 +89,5 @@ extern "C" {
 int execve(const char* program, char* const* arguments, char* const* environment) noexcept {
   const Start start(program, arguments);
   return Real<decltype(execve)>("execve")(start.Program(), start.Arguments(), environment);
-}
-
-int posix_spawn(pid_t* pid, const char* program, const posix_spawn_file_actions_t* actions,
-                const posix_spawnattr_t* attributes, char* const* arguments,
-                char* const* environment) {
-  const Start start(program, arguments);
-  return Real<decltype(posix_spawn)>("posix_spawn")(pid, start.Program(), actions, attributes,
-                                                    start.Arguments(), environment);
 }
 }

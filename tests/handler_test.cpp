@@ -12,7 +12,7 @@
 
 #include "compress/KAVO.Zantro.Compress.h"
 #include "device/base/json_text.h"
-#include "device/platform/kavo/request_state.h"
+#include "device/platform/kavo/request.h"
 #include "device/platform/operations.h"
 #include "tests/programs.h"
 

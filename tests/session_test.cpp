@@ -20,7 +20,7 @@ TEST_F(SessionTest, ItsEndReachesProcessesThatAreOnTheirWay) {
     if (pid == 0) {
       char go = 0;
       const bool may = read(ends[0], &go, 1) == 1 && LumoLibUGIDSet(id.c_str(), "alice") == 0;
-      _exit(may ? 0 : LumoLibGetErr() - Device::kErrSystem);
+      _exit(may ? 0 : LumoLibGetErr() - KAVO::kErrSystem);
     }
     if (is_ended) {
       Device::SignOut(id);
@@ -28,7 +28,7 @@ TEST_F(SessionTest, ItsEndReachesProcessesThatAreOnTheirWay) {
     ASSERT_EQ(write(ends[1], "", 1), 1);
     int status = 0;
     ASSERT_EQ(waitpid(pid, &status, 0), pid);
-    EXPECT_EQ(WEXITSTATUS(status), is_ended ? Device::kErrSession - Device::kErrSystem : 0);
+    EXPECT_EQ(WEXITSTATUS(status), is_ended ? KAVO::kErrSession - KAVO::kErrSystem : 0);
     close(ends[0]);
     close(ends[1]);
   }

@@ -1,20 +1,10 @@
 // The module's contact surface: the table from which the host learns what is served here, the
 // function that hands it out, and the entry that every row names.
-#include <cstdint>
+#include "platform/kavo/api_table.h"
 
 #include "compress/KAVO.Zantro.Compress.h"
-#include "platform/kavo/api_host.h"
 
 namespace {
-
-// The host reads rows by this layout: four machine words each, the last row all zero.
-struct ApiRow {
-  const char* api;
-  std::intptr_t version;
-  const char* method;
-  void (*handler)(KAVO::APIRequest*, KAVO::APIResponse*);
-};
-static_assert(sizeof(ApiRow) == 4 * sizeof(void*));
 
 constexpr char kApiName[] = "KAVO.Zantro.Compress";
 
@@ -31,9 +21,9 @@ void CompressAPIEntry(KAVO::APIRequest* request, KAVO::APIResponse* response) {
 
 extern "C" {
 
-extern ApiRow gTable[];
+extern KAVO::ApiRow gTable[];
 // The versions differ inside the methods only.
-ApiRow gTable[] = {
+KAVO::ApiRow gTable[] = {
     {kApiName, 1, "start", CompressAPIEntry},  {kApiName, 1, "status", CompressAPIEntry},
     {kApiName, 1, "stop", CompressAPIEntry},   {kApiName, 2, "start", CompressAPIEntry},
     {kApiName, 2, "status", CompressAPIEntry}, {kApiName, 2, "stop", CompressAPIEntry},

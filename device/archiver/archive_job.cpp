@@ -9,6 +9,7 @@
 #include <iterator>
 #include <memory>
 #include <set>
+#include <unordered_set>
 #include <utility>
 
 #include "device/archiver/code_page.h"
@@ -21,14 +22,12 @@
 #include "device/archiver/switches.h"
 #include "device/archiver/work_place.h"
 #include "device/archiver/zip_names.h"
+#include "device/base/file_io.h"
 
 namespace Archiver {
 namespace {
 
 constexpr mode_t kFileMode = 0666;  // the umask takes its share
-// Bytes. To hand a smaller file to another thread costs more than to pack it; measured on two cores
-// with 7-Zip 26.02, where the gain is a tenth at 100 bytes and gone at 500.
-constexpr std::uint64_t kTinyFile = 256;
 
 Device::FileDescriptor Open(const std::string& path, int flags) {
   Device::FileDescriptor fd(open(path.c_str(), flags | O_CLOEXEC, kFileMode));
@@ -38,40 +37,24 @@ Device::FileDescriptor Open(const std::string& path, int flags) {
   return fd;
 }
 
-// Hands `use` the bytes of `path` piece by piece.
-template <typename Use>
-void ReadFile(const std::string& path, Use use) {
-  const Device::FileDescriptor fd = Open(path, O_RDONLY);
-  std::array<char, 65536> buffer{};
-  while (const ssize_t size = read(fd.Get(), buffer.data(), buffer.size())) {
-    if (size > 0) {
-      use(buffer.data(), static_cast<size_t>(size));
-    } else if (errno != EINTR) {
-      throw SystemFailure("cannot read", path, errno);
+void CopyFile(const std::string& from, const std::string& to, const Cancel& cancel) {
+  const Device::FileDescriptor in = Open(from, O_RDONLY);
+  const Device::FileDescriptor out = Open(to, O_WRONLY | O_CREAT | O_EXCL);
+  std::array<char, 65536> block{};
+  while (const ssize_t size = read(in.Get(), block.data(), block.size())) {
+    cancel.Check();
+    if (size < 0) {
+      throw SystemFailure("cannot read", from, errno);
+    }
+    if (!Device::WriteAll(out.Get(), {block.data(), static_cast<size_t>(size)})) {
+      throw SystemFailure("cannot write", to, errno);
     }
   }
 }
 
-void CopyFile(const std::string& from, const std::string& to, const Cancel& cancel) {
-  const Device::FileDescriptor out = Open(to, O_WRONLY | O_CREAT | O_EXCL);
-  ReadFile(from, [&](const char* bytes, size_t size) {
-    cancel.Check();
-    while (size > 0) {
-      const ssize_t written = write(out.Get(), bytes, size);
-      if (written < 0 && errno != EINTR) {
-        throw SystemFailure("cannot write", to, errno);
-      }
-      const size_t done = written > 0 ? static_cast<size_t>(written) : 0;
-      bytes += done;
-      size -= done;
-    }
-  });
-}
-
 std::vector<std::string> Sources(const Request& request) {
-  std::string list;
-  ReadFile(request.list_path, [&](const char* bytes, size_t size) { list.append(bytes, size); });
-  std::vector<std::string> sources = ReadSources(list, request.list_path);
+  std::vector<std::string> sources =
+      ReadSources(Device::ReadTextFile(request.list_path), request.list_path);
   if (std::all_of(sources.begin(), sources.end(),
                   [&](const std::string& source) { return IsExcluded(request, source); })) {
     throw NamedFailure("nothing to pack", sources.front(), "all sources are excluded");
@@ -80,7 +63,7 @@ std::vector<std::string> Sources(const Request& request) {
 }
 
 template <typename IsWanted>
-std::vector<std::string> Those(const std::vector<std::string>& sources, IsWanted is_wanted) {
+std::vector<std::string> Filter(const std::vector<std::string>& sources, IsWanted is_wanted) {
   std::vector<std::string> result;
   std::copy_if(sources.begin(), sources.end(), std::back_inserter(result), is_wanted);
   return result;
@@ -93,13 +76,14 @@ void Pack(const Request& request, PackRun run, const std::string& folder, const 
   const Device::FileDescriptor password = PasswordInput(request);
   run.sources_file = "/proc/self/fd/" + std::to_string(sources.Get());
   run.left_out_file = "/proc/self/fd/" + std::to_string(left_out.Get());
-  Child7z child;
-  child.arguments = SwitchesFor7z(request, run);
-  child.folder = folder;
-  child.input_fd = password.Get();
-  child.kept_fds = {sources.Get(), left_out.Get()};
-  child.left_out = run.left_out_links;
-  Run7z(child, cancel, report);
+  Device::ProgramStart start;
+  start.program = kStock7z;
+  start.arguments = SwitchesFor7z(request, run);
+  start.arguments.insert(start.arguments.begin(), kStock7z);
+  start.folder = folder;
+  start.input = password.Get();
+  start.kept = {sources.Get(), left_out.Get()};
+  Run7z(start, run.left_out_links, cancel, report);
 }
 
 // The special files are left out of the main run and then added from harmless copies of them, so
@@ -114,7 +98,7 @@ void PackWithSpecials(const Request& request, PackRun run, std::vector<std::stri
   const std::set<std::string> known(specials.begin(), specials.end());
   if (!specials.empty()) {
     run.sources = DivideNames(
-        Those(sources, [&](const std::string& source) { return known.count(source) == 0; }));
+        Filter(sources, [&](const std::string& source) { return known.count(source) == 0; }));
   }
   if (!run.sources.IsEmpty()) {
     left_out.insert(left_out.end(), specials.begin(), specials.end());
@@ -145,20 +129,17 @@ void PackArchive(const Request& request, const Cancel& cancel, Report& report) {
   const bool recode = request.zip && !CodePage::IsUtf8(request.code_page);
   const auto page = recode ? std::make_unique<CodePage>(request.code_page) : nullptr;
   std::vector<std::string> listed = Sources(request);
-  report.Pace(listed.size());
   const WorkPlace place = FindWorkPlace(listed, request.list_path);
-  const CheckedSources checked = CheckSources(place, listed);
-  const bool are_tiny = checked.no_files.empty() && checked.file_bytes / listed.size() < kTinyFile;
-  const std::vector<std::string> sources = WithoutNested(std::move(listed), checked.no_files);
-  const std::vector<std::string> suspects = Those(
-      sources, [&](const std::string& source) { return checked.no_files.count(source) != 0; });
+  const std::unordered_set<std::string> no_files = CheckSources(place, listed);
+  const std::vector<std::string> sources = WithoutNested(std::move(listed), no_files);
+  const std::vector<std::string> suspects =
+      Filter(sources, [&](const std::string& source) { return no_files.count(source) != 0; });
   const ArchiveState seen = LookAtArchive(request.archive);
   const WorkFolder work(request.archive);
 
   PackRun run;
   run.archive = work.Result();
   run.sources = DivideNames(sources);
-  run.one_thread = are_tiny;
   if (seen.exists && page && HasNamesIn(*page, request.archive)) {
     CopyFile(request.archive, work.Result(), cancel);
     NamesToUtf8(*page, work.Result(), cancel);

@@ -1,10 +1,10 @@
 #include "device/archiver/list_file.h"
 
 #include <algorithm>
-#include <memory_resource>
 #include <string_view>
 
 #include "device/archiver/failure.h"
+#include "device/base/utf8.h"
 
 namespace Archiver {
 namespace {
@@ -59,16 +59,13 @@ bool HasAncestorIn(const std::unordered_set<std::string>& names, const std::stri
 }  // namespace
 
 std::vector<std::string> ReadSources(const std::string& text, const std::string& list_path) {
-  const auto lines = static_cast<size_t>(std::count(text.begin(), text.end(), '\n')) + 1;
   std::vector<std::string> listed;
-  listed.reserve(lines);  // so that what `known` looks at stays in its place
-  std::pmr::monotonic_buffer_resource nodes;
-  std::pmr::unordered_set<std::string_view> known(lines, &nodes);
+  std::unordered_set<std::string> known;
   ForEachPart(text, '\n', [&](std::string_view line) {
     if (!line.empty()) {
-      listed.push_back(Normalize(line));
-      if (!known.insert(listed.back()).second) {
-        listed.pop_back();
+      const auto [name, is_new] = known.insert(Normalize(line));
+      if (is_new) {
+        listed.push_back(*name);
       }
     }
   });
@@ -93,40 +90,13 @@ NamesFor7z DivideNames(const std::vector<std::string>& names) {
   NamesFor7z result;
   for (const std::string& name : names) {
     const auto holds = [&](char byte) { return name.find(byte) != std::string::npos; };
-    if (IsUtf8(name) && !holds('\r') && !holds('\n')) {
+    if (Device::IsUtf8(name) && !holds('\r') && !holds('\n')) {
       result.list.append("\"").append(name).append("\"\n");
     } else {
       result.arguments.push_back(name);
     }
   }
   return result;
-}
-
-bool IsUtf8(const std::string& text) {
-  for (size_t i = 0; i < text.size();) {
-    const auto lead = static_cast<unsigned char>(text[i++]);
-    if (lead < 0x80) {
-      continue;
-    }
-    const int more = lead >= 0xF0 ? 3 : lead >= 0xE0 ? 2 : 1;
-    if (lead < 0xC2 || lead > 0xF4 || text.size() - i < static_cast<size_t>(more)) {
-      return false;
-    }
-    unsigned code = lead & (0x3FU >> more);
-    for (int k = 0; k < more; ++k) {
-      const auto byte = static_cast<unsigned char>(text[i++]);
-      if ((byte & 0xC0U) != 0x80) {
-        return false;
-      }
-      code = code << 6U | (byte & 0x3FU);
-    }
-    const bool surrogate = code >= 0xD800 && code < 0xE000;
-    if (surrogate || code > 0x10FFFF || (more == 2 && code < 0x800) ||
-        (more == 3 && code < 0x10000)) {
-      return false;
-    }
-  }
-  return true;
 }
 
 }  // namespace Archiver

@@ -27,6 +27,4 @@ struct NamesFor7z {
 // A list line is UTF-8, ends at a carriage return and loses outer blanks unless quoted.
 NamesFor7z DivideNames(const std::vector<std::string>& names);
 
-bool IsUtf8(const std::string& text);
-
 }  // namespace Archiver

@@ -5,12 +5,8 @@
 // archive.
 
 #include <fcntl.h>
-#include <sys/prctl.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
-#include <cerrno>
-#include <csignal>
 #include <exception>
 #include <string>
 #include <vector>
@@ -33,7 +29,7 @@ void OccupyStandardStreams() {
   close(fd);
 }
 
-// Runs the job in this process; the exit status.
+// The exit status.
 int RunJob(const std::vector<std::string>& arguments) {
   try {
     const Archiver::Cancel cancel(STDOUT_FILENO);
@@ -52,27 +48,6 @@ int RunJob(const std::vector<std::string>& arguments) {
   return 1;
 }
 
-volatile pid_t job_process = 0;
-
-void PassOn(int signal_number) { kill(job_process, signal_number); }
-
-// The caller looks at the lines alone, so a job that is killed must not end without one: another
-// process stays beside it to say so, and if that one is killed, the job cancels itself.
-int Supervise(pid_t job) {
-  job_process = job;
-  for (const int number : {SIGTERM, SIGINT, SIGHUP}) {
-    std::signal(number, PassOn);
-  }
-  int status = 0;
-  while (waitpid(job, &status, 0) < 0 && errno == EINTR) {
-  }
-  if (WIFEXITED(status)) {
-    return WEXITSTATUS(status);
-  }
-  Archiver::Report::KilledRun(STDOUT_FILENO);
-  return 1;
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -82,16 +57,5 @@ int main(int argc, char** argv) {
     return 1;  // nobody to report to
   }
   OccupyStandardStreams();
-  const pid_t supervisor = getpid();
-  const pid_t job = fork();
-  if (job > 0) {
-    return Supervise(job);
-  }
-  if (job == 0) {
-    prctl(PR_SET_PDEATHSIG, SIGTERM);
-    if (getppid() != supervisor) {
-      return 1;  // killed in the moment before
-    }
-  }
-  return RunJob(arguments);  // without a supervisor where there can be none
+  return RunJob(arguments);
 }

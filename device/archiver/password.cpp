@@ -6,6 +6,7 @@
 #include <cerrno>
 
 #include "device/archiver/failure.h"
+#include "device/base/file_io.h"
 
 namespace Archiver {
 
@@ -32,13 +33,7 @@ Device::FileDescriptor PasswordInput(const Request& request) {
 
 Device::FileDescriptor UnnamedFile(const std::string& text) {
   Device::FileDescriptor fd(memfd_create("kavo-7z", MFD_CLOEXEC));
-  bool whole = static_cast<bool>(fd);
-  for (size_t done = 0; whole && done < text.size();) {
-    const ssize_t size = write(fd.Get(), text.data() + done, text.size() - done);
-    whole = size > 0 || (size < 0 && errno == EINTR);
-    done += size > 0 ? static_cast<size_t>(size) : 0;
-  }
-  if (!whole || lseek(fd.Get(), 0, SEEK_SET) != 0) {
+  if (!fd || !Device::WriteAll(fd.Get(), text) || lseek(fd.Get(), 0, SEEK_SET) != 0) {
     throw SystemFailure("cannot write", "unnamed file for 7z", errno);
   }
   return fd;

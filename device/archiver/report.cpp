@@ -6,23 +6,11 @@
 #include <algorithm>
 #include <cerrno>
 #include <climits>
+#include <string_view>
 
 #include "device/archiver/failure.h"
 
 namespace Archiver {
-
-namespace {
-
-// Begins a line of its own, as the one before may be cut off. Waits for nothing: the reader may be
-// gone or not reading.
-void LastWord(int fd, const std::string& text) {
-  pollfd reader = {fd, POLLOUT, 0};
-  if (poll(&reader, 1, 0) == 1 && (reader.revents & POLLERR) == 0) {
-    (void)!write(fd, text.data(), text.size());
-  }
-}
-
-}  // namespace
 
 void Report::Total(uint64_t bytes) {
   if (!has_total_) {
@@ -38,26 +26,22 @@ void Report::Compressing(const std::string& name) {
   }
 }
 
-void Report::Pace(size_t sources) {
-  percent_pause_ = sources * kPausePerSource;
-  next_percent_ = Clock::now() + percent_pause_;
-}
-
 void Report::Progress(uint64_t percent) {
-  const Clock::time_point now = Clock::now();
-  if (now >= next_percent_) {
-    next_percent_ = now + percent_pause_;
-    Percent(static_cast<int>(std::min<uint64_t>(percent, 99)));
-  }
+  Percent(static_cast<int>(std::min<uint64_t>(percent, 99)));
 }
 
 void Report::Done() { Percent(100); }
 
 void Report::Error(const std::string& reason) { Line("Error: " + Printable(reason)); }
 
-void Report::CancelledRun() { LastWord(cancel_.ReportFd(), "\nError: cancelled\n"); }
-
-void Report::KilledRun(int report_fd) { LastWord(report_fd, "\nError: the archiver was killed\n"); }
+void Report::CancelledRun() {
+  // On a line of its own, as the one before may be cut off.
+  constexpr std::string_view kText = "\nError: cancelled\n";
+  pollfd reader = {cancel_.ReportFd(), POLLOUT, 0};
+  if (poll(&reader, 1, 0) == 1 && (reader.revents & POLLERR) == 0) {
+    (void)!write(cancel_.ReportFd(), kText.data(), kText.size());
+  }
+}
 
 void Report::Percent(int percent) {
   if (percent > percent_) {

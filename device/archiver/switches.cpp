@@ -31,9 +31,6 @@ std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& ru
   };
   if (request.zip) {
     switches.emplace_back("-mcu=on");
-    if (run.one_thread) {
-      switches.emplace_back("-mmt=1");
-    }
   }
   if (!request.level.empty()) {
     switches.push_back(request.level);

@@ -18,7 +18,6 @@ struct PackRun {
   std::string sources_file;  // path under which 7z finds the text of sources.list
   std::string left_out_file;
   bool follow_links = false;
-  bool one_thread = false;               // of a zip; a 7z archive is packed in one piece
   std::set<std::string> left_out_links;  // among left_out; 7z warns of those that lead nowhere
 };
 

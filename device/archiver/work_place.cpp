@@ -81,8 +81,9 @@ WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::stri
   return place;
 }
 
-CheckedSources CheckSources(const WorkPlace& place, const std::vector<std::string>& sources) {
-  CheckedSources checked;
+std::unordered_set<std::string> CheckSources(const WorkPlace& place,
+                                             const std::vector<std::string>& sources) {
+  std::unordered_set<std::string> no_files;
   const Device::FileDescriptor folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   std::unordered_set<std::string_view> folders;
   struct stat info {};
@@ -101,13 +102,11 @@ CheckedSources CheckSources(const WorkPlace& place, const std::vector<std::strin
     if (fstatat(folder.Get(), source.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
       throw SystemFailure(kCannotPack, source, errno);
     }
-    if (S_ISREG(info.st_mode)) {
-      checked.file_bytes += static_cast<std::uint64_t>(info.st_size);
-    } else {
-      checked.no_files.insert(source);
+    if (!S_ISREG(info.st_mode)) {
+      no_files.insert(source);
     }
   }
-  return checked;
+  return no_files;
 }
 
 std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& path) {

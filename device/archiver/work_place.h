@@ -1,6 +1,5 @@
 #pragma once
 
-#include <cstdint>
 #include <map>
 #include <string>
 #include <unordered_set>
@@ -22,14 +21,11 @@ struct WorkPlace {
 // link; only what is scattered needs following.
 WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::string& list_path);
 
-struct CheckedSources {
-  std::unordered_set<std::string> no_files;  // those that are no plain files
-  std::uint64_t file_bytes = 0;              // in the plain files
-};
-
-// Throws Failure for a source that is missing or lies behind a link other than those of a staging
-// folder. 7z overlooks both when the name has a '*' or '?', for all that it matches literally.
-CheckedSources CheckSources(const WorkPlace& place, const std::vector<std::string>& sources);
+// The sources that are no plain files. Throws Failure for a source that is missing or lies behind a
+// link other than those of a staging folder. 7z overlooks both when the name has a '*' or '?', for
+// all that it matches literally.
+std::unordered_set<std::string> CheckSources(const WorkPlace& place,
+                                             const std::vector<std::string>& sources);
 
 // The names, relative to the place, under which 7z can come across `path`, an absolute one.
 std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& path);

@@ -1,8 +1,11 @@
 // Owns a descriptor.
 #pragma once
 
+#include <fcntl.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <system_error>
 #include <utility>
 
 namespace Device {
@@ -31,6 +34,19 @@ class FileDescriptor {
 
  private:
   int fd_;
+};
+
+// Throws std::system_error.
+struct Pipe {
+  Pipe() {
+    int ends[2];
+    if (pipe2(ends, O_CLOEXEC) != 0) {
+      throw std::system_error(errno, std::generic_category(), "pipe");
+    }
+    reader = FileDescriptor(ends[0]);
+    writer = FileDescriptor(ends[1]);
+  }
+  FileDescriptor reader, writer;
 };
 
 }  // namespace Device

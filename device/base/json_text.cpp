@@ -1,30 +1,15 @@
 #include "device/base/json_text.h"
 
-#include <rapidjson/encodedstream.h>
-#include <rapidjson/error/en.h>
-#include <rapidjson/memorystream.h>
-#include <rapidjson/reader.h>
-#include <rapidjson/stringbuffer.h>
-#include <rapidjson/writer.h>
-
 #include <algorithm>
-#include <charconv>
-#include <cmath>
-#include <cstdint>
-#include <optional>
+#include <cstdio>
+#include <memory>
 #include <stdexcept>
-#include <system_error>
-#include <utility>
-#include <vector>
+
+#include "device/base/utf8.h"
 
 namespace Device {
 
 namespace {
-
-using rapidjson::SizeType;
-using Utf8 = rapidjson::UTF8<>;
-using Stream = rapidjson::EncodedInputStream<Utf8, rapidjson::MemoryStream>;
-using Writer = rapidjson::Writer<rapidjson::StringBuffer>;
 
 constexpr char kHexDigits[] = "0123456789abcdefABCDEF";
 constexpr int kHexBase = 16;
@@ -34,165 +19,96 @@ constexpr unsigned long kFirstByteEscape = 0xDC80;
 constexpr unsigned long kLastByteEscape = 0xDCFF;
 constexpr unsigned long kFirstByte = 0x80;
 
-template <typename Number>
-std::optional<Number> NumberIn(const char* begin, const char* end) {
-  Number number{};
-  const auto [stop, error] = std::from_chars(begin, end, number);
-  return error == std::errc() && stop == end ? std::optional(number) : std::nullopt;
+const Json::StreamWriterBuilder& LineWriter() {
+  static const Json::StreamWriterBuilder kWriter = [] {
+    Json::StreamWriterBuilder writer;
+    writer["indentation"] = "";
+    writer["commentStyle"] = "None";
+    writer["emitUTF8"] = true;  // bytes as they are
+    writer["precision"] = 17;   // digits, so that a double reads back as itself
+    return writer;
+  }();
+  return kWriter;
 }
 
-// Makes a value of what the parser comes upon. Its functions answer whether to go on; why not
-// stands in `refusal`.
-class ValueBuilder : public rapidjson::BaseReaderHandler<Utf8, ValueBuilder> {
- public:
-  ValueBuilder(const Stream& stream, int depth)
-      : stream_(stream), depth_(static_cast<std::size_t>(depth)) {}
-
-  bool Null() { return Add(Json::Value()); }
-  bool Bool(bool value) { return Add(value); }
-  bool RawNumber(const char* text, SizeType length, bool /*is_copy*/) {
-    const char* end = text + length;
-    // As in values that the program makes: unsigned only where it must be.
-    if (const auto value = NumberIn<std::int64_t>(text, end)) {
-      return Add(Json::Int64{*value});
-    }
-    if (const auto value = NumberIn<std::uint64_t>(text, end)) {
-      return Add(Json::UInt64{*value});
-    }
-    if (const auto value = NumberIn<double>(text, end)) {
-      return Add(*value);
-    }
-    refusal = "number out of range";
-    return false;
-  }
-  bool String(const char* text, SizeType length, bool /*is_copy*/) {
-    return Add(Json::Value(text, text + length));
-  }
-  bool Key(const char* text, SizeType length, bool /*is_copy*/) {
-    key_.assign(text, length);
-    if (open_.back()->isMember(key_)) {
-      refusal = "Duplicate key: '" + key_ + "'";
-    }
-    return refusal.empty();
-  }
-  bool StartObject() { return Open(Json::objectValue); }
-  bool StartArray() { return Open(Json::arrayValue); }
-  bool EndObject(SizeType /*members*/) { return Close(); }
-  bool EndArray(SizeType /*elements*/) { return Close(); }
-
-  Json::Value root;
-  std::string refusal;
-
- private:
-  Json::Value& Place(Json::Value value) {
-    value.setOffsetStart(static_cast<std::ptrdiff_t>(stream_.Tell()));
-    if (open_.empty()) {
-      return root = std::move(value);
-    }
-    if (open_.back()->isArray()) {
-      return open_.back()->append(std::move(value));
-    }
-    return (*open_.back())[key_] = std::move(value);
-  }
-  bool Add(Json::Value value) {
-    Place(std::move(value));
-    return true;
-  }
-  bool Open(Json::ValueType type) {
-    if (open_.size() == depth_) {
-      refusal = "nested too deep";
-      return false;
-    }
-    open_.push_back(&Place(type));
-    return true;
-  }
-  bool Close() {
-    open_.pop_back();
-    return true;
-  }
-
-  const Stream& stream_;
-  std::size_t depth_;
-  std::vector<Json::Value*> open_;  // arrays and objects, each within the one before
-  std::string key_;
-};
-
-std::string PlaceIn(const std::string& text, std::size_t offset) {
-  const auto place = text.begin() + static_cast<std::ptrdiff_t>(std::min(offset, text.size()));
-  const auto line = std::count(text.begin(), place, '\n') + 1;
-  const std::size_t line_end = offset == 0 ? std::string::npos : text.rfind('\n', offset - 1);
-  return "line " + std::to_string(line) + ", column " + std::to_string(offset - line_end);
+[[noreturn]] void Fail(unsigned long line, unsigned long column, const std::string& reason) {
+  throw std::runtime_error("line " + std::to_string(line) + ", column " + std::to_string(column) +
+                           ": " + reason);
 }
 
-void Write(const Json::Value& value, Writer& writer) {
-  switch (value.type()) {
-    case Json::nullValue:
-      writer.Null();
-      break;
-    case Json::booleanValue:
-      writer.Bool(value.asBool());
-      break;
-    case Json::intValue:
-      writer.Int64(value.asInt64());
-      break;
-    case Json::uintValue:
-      writer.Uint64(value.asUInt64());
-      break;
-    case Json::realValue:
-      std::isfinite(value.asDouble()) ? writer.Double(value.asDouble()) : writer.Null();
-      break;
-    case Json::stringValue: {
-      const char* begin = nullptr;
-      const char* end = nullptr;
-      value.getString(&begin, &end);
-      writer.String(begin, static_cast<SizeType>(end - begin));
-      break;
+// Throws with the first of the library's errors: "* Line 1, Column 8\n  Reason.\n...".
+[[noreturn]] void FailFor(const std::string& errors) {
+  unsigned long line = 1;
+  unsigned long column = 1;
+  std::sscanf(errors.c_str(), "* Line %lu, Column %lu", &line, &column);
+  const std::size_t begin = std::min(errors.find("\n  ") + 3, errors.size());
+  std::string reason = errors.substr(begin, errors.find('\n', begin) - begin);
+  reason.resize(reason.find_last_not_of('.') + 1);
+  Fail(line, column, reason);
+}
+
+// What the library does not refuse with a place, or not at all.
+void CheckBytes(const std::string& text, int most_depth) {
+  unsigned long line = 1;
+  std::size_t line_begin = 0;
+  int depth = 0;
+  bool is_in_string = false;
+  for (std::size_t at = 0; at < text.size(); ++at) {
+    const char byte = text[at];
+    const unsigned long column = at - line_begin + 1;
+    if (byte == '\0') {
+      Fail(line, column, "a zero byte");
+    } else if (byte == '\n') {
+      ++line;
+      line_begin = at + 1;
+    } else if (byte == '"') {
+      is_in_string = !is_in_string;
+    } else if (is_in_string) {
+      at += byte == '\\' ? 1 : 0;
+    } else if ((byte == '[' || byte == '{') && ++depth > most_depth) {
+      Fail(line, column, "nested too deep");
+    } else if (byte == ']' || byte == '}') {
+      --depth;
     }
-    case Json::arrayValue:
-      writer.StartArray();
-      for (const Json::Value& element : value) {
-        Write(element, writer);
-      }
-      writer.EndArray();
-      break;
-    case Json::objectValue:
-      writer.StartObject();
-      for (auto member = value.begin(); member != value.end(); ++member) {
-        const std::string name = member.name();
-        writer.Key(name.data(), static_cast<SizeType>(name.size()));
-        Write(*member, writer);
-      }
-      writer.EndObject();
-      break;
   }
 }
 
 }  // namespace
 
-std::string ToText(const Json::Value& value) {
-  rapidjson::StringBuffer buffer;
-  Writer writer(buffer);
-  Write(value, writer);
-  return {buffer.GetString(), buffer.GetSize()};
+std::string ToText(const Json::Value& value) { return Json::writeString(LineWriter(), value); }
+
+std::string ToUtf8Text(const Json::Value& value) {
+  const std::string text = ToText(value);
+  std::string safe;
+  safe.reserve(text.size());
+  for (std::size_t at = 0; at < text.size();) {
+    const std::size_t length = Utf8SequenceLength(text, at);
+    if (length > 0) {
+      safe.append(text, at, length);
+      at += length;
+      continue;
+    }
+    const auto byte = static_cast<unsigned char>(text[at++]);
+    safe += "\\udc";
+    safe += kHexDigits[byte / kHexBase];
+    safe += kHexDigits[byte % kHexBase];
+  }
+  return safe;
 }
 
 Json::Value ParseJson(const std::string& text, int depth) {
-  rapidjson::MemoryStream bytes(text.data(), text.size());
-  Stream stream(bytes);
-  ValueBuilder builder(stream, depth);
-  // The library's own reading of numbers is wrong for some of more than twenty digits.
-  const rapidjson::ParseResult result =
-      rapidjson::Reader().Parse<rapidjson::kParseNumbersAsStringsFlag>(stream, builder);
-  if (!result) {
-    std::string reason = rapidjson::GetParseError_En(result.Code());
-    reason.pop_back();  // its full stop
-    throw std::runtime_error(PlaceIn(text, result.Offset()) + ": " +
-                             (builder.refusal.empty() ? reason : builder.refusal));
+  CheckBytes(text, depth);
+  Json::CharReaderBuilder builder;
+  Json::CharReaderBuilder::strictMode(&builder.settings_);
+  builder["strictRoot"] = false;  // a text or a number alone is JSON too
+  builder["stackLimit"] = depth + 2;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  Json::Value value;
+  std::string errors;
+  if (!reader->parse(text.data(), text.data() + text.size(), &value, &errors)) {
+    FailFor(errors);
   }
-  if (stream.Tell() < text.size()) {
-    throw std::runtime_error(PlaceIn(text, stream.Tell()) + ": a zero byte");
-  }
-  return std::move(builder.root);
+  return value;
 }
 
 std::string DecodeByteEscapes(std::string json) {

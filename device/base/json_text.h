@@ -7,7 +7,12 @@
 
 namespace Device {
 
+// Integers of 64 bits and doubles read back as they were.
 std::string ToText(const Json::Value& value);
+
+// The same in valid UTF-8, for those outside the device: a byte that is no part of UTF-8 becomes
+// the escape \udc80 to \udcff.
+std::string ToUtf8Text(const Json::Value& value);
 
 // How deep arrays and objects may lie in each other: in a text, and in a parameter, which tasks and
 // trace lines hold within objects of their own.
@@ -15,8 +20,8 @@ inline constexpr int kTextDepth = 1000;
 inline constexpr int kParamDepth = kTextDepth - 10;
 
 // Throws std::runtime_error, with line, column and reason, for a text that is no JSON. Comments,
-// trailing commas and repeated keys are refused. Of each value, getOffsetStart() tells a byte of
-// the text that stands in the line where the value begins.
+// trailing commas, repeated keys and zero bytes are refused. Of each value, getOffsetStart() tells
+// the byte of the text at which it begins.
 Json::Value ParseJson(const std::string& text, int depth = kTextDepth);
 
 // Takes the escapes \udc80 to \udcff, where they stand alone, for the bytes 0x80 to 0xFF, so that a

@@ -35,7 +35,7 @@ void AddParam(const std::string& text, Json::Value& params) {
 
 int CallCommand(const CallOptions& options) {
   Open(options.folder);
-  Launcher launcher;
+  Launcher launcher(WorkerLog::kSyslogOnly);
   Request request;
   request.api = options.api;
   request.method = options.method;

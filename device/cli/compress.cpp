@@ -8,8 +8,8 @@
 #include <iostream>
 #include <stdexcept>
 
+#include "device/base/file_io.h"
 #include "device/base/json_text.h"
-#include "device/base/text_file.h"
 #include "device/cli/commands.h"
 #include "device/cli/progress_display.h"
 #include "device/host/launcher.h"
@@ -20,8 +20,6 @@
 namespace Device {
 
 namespace {
-
-using Clock = std::chrono::steady_clock;
 
 constexpr char kApi[] = "KAVO.Zantro.Compress";
 constexpr int kApiVersion = 3;
@@ -122,16 +120,14 @@ class Job {
         display.Clear();
         return Stop();
       }
-      const Clock::time_point asked = Clock::now();
       const Outcome outcome = AskAboutTask("status");
-      const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(Clock::now() - asked);
       if (outcome.code != 0 || outcome.data["finished"].asBool()) {
         display.Clear();
         Launcher::Reap();
         return Report(outcome);
       }
       display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
-      Launcher::AwaitWorker(Launcher::PauseBeforeAsking(pause, took));
+      Launcher::AwaitWorker(pause);
       pause = std::min(2 * pause, kLongestPause);
     }
   }

@@ -11,7 +11,7 @@
 #include <random>
 #include <stdexcept>
 
-#include "device/base/text_file.h"
+#include "device/base/file_io.h"
 #include "device/cli/commands.h"
 #include "device/model/config.h"
 #include "device/model/device.h"

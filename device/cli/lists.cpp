@@ -1,6 +1,5 @@
 // "tasks" and "notifications": what the device keeps for a user, read under that user's identity.
 #include <sys/wait.h>
-#include <unistd.h>
 
 #include <cmath>
 #include <ctime>
@@ -8,10 +7,11 @@
 #include <iostream>
 #include <stdexcept>
 
+#include "device/base/child_process.h"
 #include "device/cli/commands.h"
 #include "device/model/device.h"
 #include "device/tasks/task_store.h"
-#include "device/tasks/task_view.h"
+#include "device/tasks/user_tasks.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {
@@ -23,30 +23,20 @@ int RunAs(const std::string& user, const std::function<void()>& body) {
   if (TheDevice().config.FindUser(user) == nullptr) {
     throw std::runtime_error("no user '" + user + "'");
   }
-  const pid_t pid = fork();
-  if (pid == 0) {
-    try {
-      if (LumoLibUGIDSet(nullptr, user.c_str()) < 0) {
-        throw std::runtime_error("cannot take on the identity of '" + user + "'");
-      }
-      body();
-      std::cout.flush();
-      CloseStores();
-      _exit(kExitDone);
-    } catch (const std::exception& error) {
-      std::cerr << "kavo-device: " << error.what() << '\n';
-      _exit(kExitFailed);
-    }
-  }
-  int status = 0;
-  if (pid < 0 || waitpid(pid, &status, 0) < 0 || !WIFEXITED(status)) {
-    throw std::runtime_error("cannot run a process as '" + user + "'");
-  }
-  return WEXITSTATUS(status);
+  const int status = ChildProcess::Run([&] {
+                       if (LumoLibUGIDSet(nullptr, user.c_str()) < 0) {
+                         throw std::runtime_error("cannot take on the identity of '" + user + "'");
+                       }
+                       body();
+                       std::cout.flush();
+                       CloseStores();
+                       return kExitDone;
+                     }).Wait();
+  return WIFEXITED(status) ? WEXITSTATUS(status) : kExitFailed;
 }
 
-void PrintTask(const TaskRow& row, const std::string& user) {
-  const Json::Value task = TaskView(user, row);
+void PrintTask(const TaskRow& row) {
+  const Json::Value task = TaskView(row);
   std::cout << row.id << '\t' << task["state"].asString() << '\t'
             << std::lround(task["progress"].asDouble() * 100) << " %\t"
             << task["dest_file_path"].asString() << '\n';
@@ -65,8 +55,8 @@ std::string TimeText(std::time_t time) {
 int TasksCommand(const std::string& folder, const std::string& user) {
   Open(folder);
   return RunAs(user, [&] {
-    for (const TaskRow& row : StoreOf(user).AllTasks()) {
-      PrintTask(row, user);
+    for (const TaskRow& row : AllTasks(user)) {
+      PrintTask(row);
     }
   });
 }

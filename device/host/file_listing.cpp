@@ -85,7 +85,7 @@ Listing ListFolder(const std::string& user, const std::string& path) {
     return {folder.error, {}};
   }
   if (AccessOf(folder, user) == Access::kNone) {
-    return {kErrNoPrivilege, {}};
+    return {KAVO::kErrNoPrivilege, {}};
   }
   std::error_code error;
   const std::string followed = fs::canonical(folder.real_path, error).string();
@@ -93,7 +93,7 @@ Listing ListFolder(const std::string& user, const std::string& path) {
     return FailWithErrno(error.value());
   }
   if (!IsWithin(followed, fs::canonical(folder.share_real_path, error).string())) {
-    return {kErrOutsideShare, {}};  // a link leads there
+    return {KAVO::kErrOutsideShare, {}};  // a link leads there
   }
   const std::unique_ptr<DIR, int (*)(DIR*)> directory(opendir(folder.real_path.c_str()), closedir);
   if (directory == nullptr) {

@@ -8,7 +8,7 @@
 namespace Device {
 
 struct Listing {
-  int error = 0;     // a LibraryError; 0: listed
+  int error = 0;     // a KAVO::ErrorCode; 0: listed
   Json::Value body;  // {"path", "writable", "entries": [{"name", "kind", "size", "modified"}]}
 };
 

@@ -1,23 +1,26 @@
 #include "device/host/launcher.h"
 
 #include <dlfcn.h>
-#include <fcntl.h>
 #include <sys/prctl.h>
+#include <sys/stat.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <ctime>
 #include <optional>
 #include <stdexcept>
+#include <system_error>
 
+#include "device/base/child_process.h"
 #include "device/base/frame.h"
 #include "device/base/json_text.h"
+#include "device/host/sessions.h"
 #include "device/model/device.h"
-#include "device/platform/kavo/request_state.h"
+#include "device/platform/host_services.h"
+#include "device/platform/kavo/request.h"
 #include "device/platform/lumo/errors.h"
 #include "device/tasks/task_store.h"
 
@@ -39,12 +42,19 @@ void* LoadModule() {
   return module;
 }
 
-const ApiRow* GetTable(void* module) {
+const KAVO::ApiRow* GetTable(void* module) {
   auto* const get_table = reinterpret_cast<void* (*)()>(dlsym(module, "GetAPITable"));
   if (get_table == nullptr) {
     throw std::runtime_error("cannot load module: " + DlError());
   }
-  return static_cast<const ApiRow*>(get_table());
+  return static_cast<const KAVO::ApiRow*>(get_table());
+}
+
+// True if somebody may read standard error until every process has closed it.
+bool IsStandardErrorRead() {
+  struct stat status {};
+  return fstat(STDERR_FILENO, &status) == 0 &&
+         (S_ISFIFO(status.st_mode) || S_ISSOCK(status.st_mode));
 }
 
 // False when the other side is gone.
@@ -67,35 +77,47 @@ bool ReceiveOutcome(int fd, Outcome& outcome) {
 
 }  // namespace
 
-Launcher::Launcher() : module_(LoadModule(), dlclose), table_(GetTable(module_.get())) {
+Launcher::Launcher(WorkerLog worker_log)
+    : module_(LoadModule(), dlclose), table_(GetTable(module_.get())) {
   prctl(PR_SET_CHILD_SUBREAPER, 1);
+  TheHost().has_session = [](const std::string& id, const std::string& user) {
+    return UserOfSession(id) == user;
+  };
+  TheHost().leave_request = [this, worker_log] {
+    answer_.Close();
+    if (worker_log == WorkerLog::kSyslogOnly && IsStandardErrorRead()) {
+      dup2(STDOUT_FILENO, STDERR_FILENO);  // /dev/null
+    }
+  };
 }
 
-const ApiRow* Launcher::FindRow(const Request& request, int& code) const {
-  code = kErrNoApi;
-  for (const ApiRow* row = table_; row->api != nullptr; ++row) {
+Launcher::~Launcher() { TheHost() = {}; }
+
+const KAVO::ApiRow* Launcher::FindRow(const Request& request, int& code) const {
+  code = KAVO::kErrNoApi;
+  for (const KAVO::ApiRow* row = table_; row->api != nullptr; ++row) {
     if (request.api != row->api) {
       continue;
     }
     if (request.method != row->method) {
-      code = code == kErrNoApi ? kErrNoMethod : code;
+      code = code == KAVO::kErrNoApi ? KAVO::kErrNoMethod : code;
       continue;
     }
     if (row->version == request.version) {
       return row;
     }
-    code = kErrNoVersion;
+    code = KAVO::kErrNoVersion;
   }
   return nullptr;
 }
 
 Outcome Launcher::CallHere(const Request& request) {
   Outcome outcome;
-  const ApiRow* const row = FindRow(request, outcome.code);
+  const KAVO::ApiRow* const row = FindRow(request, outcome.code);
   if (row == nullptr) {
     return outcome;
   }
-  TheDevice().is_followed = request.is_followed;
+  TheHost().notifies_desktop = !request.is_followed;
   KAVO::APIRequest::State request_state{request};
   KAVO::APIResponse::State response_state;
   KAVO::APIRequest api_request{&request_state};
@@ -109,10 +131,10 @@ Outcome Launcher::CallSafely(const Request& request) {
     return CallHere(request);
   } catch (const Json::Exception& error) {
     syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
-    return {kErrBadParameter, Json::Value()};
+    return {KAVO::kErrBadParameter, Json::Value()};
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
-    return {kErrInternal, Json::Value()};
+    return {KAVO::kErrInternal, Json::Value()};
   }
 }
 
@@ -121,29 +143,22 @@ Outcome Launcher::Call(const Request& request) {
   if (FindRow(request, outcome.code) == nullptr) {
     return outcome;
   }
-  int ends[2];
-  if (pipe2(ends, O_CLOEXEC) != 0) {
-    return {kErrInternal, Json::Value()};
-  }
-  const FileDescriptor read_end(ends[0]);
-  FileDescriptor write_end(ends[1]);
-  const pid_t pid = fork();
-  if (pid < 0) {
-    syslog(LOG_ERR, "cannot fork request process: %m");
-    return {kErrInternal, Json::Value()};
-  }
-  if (pid == 0) {
-    TheDevice().outcome = std::move(write_end);
-    const Outcome reached = CallSafely(request);
-    CloseStores();
-    _exit(SendOutcome(TheDevice().outcome.Get(), reached) ? 0 : 1);
-  }
-  write_end.Close();
-  if (!ReceiveOutcome(read_end.Get(), outcome)) {
-    syslog(LOG_ERR, "request process %d ended without an outcome", static_cast<int>(pid));
-    outcome = {kErrInternal, Json::Value()};
-  }
-  while (waitpid(pid, nullptr, 0) < 0 && errno == EINTR) {
+  outcome.code = KAVO::kErrInternal;
+  try {
+    Pipe pipe;
+    ChildProcess process = ChildProcess::Run([&] {
+      answer_ = std::move(pipe.writer);
+      const Outcome reached = CallSafely(request);
+      CloseStores();
+      return SendOutcome(answer_.Get(), reached) ? 0 : 1;
+    });
+    pipe.writer.Close();
+    if (!ReceiveOutcome(pipe.reader.Get(), outcome)) {
+      syslog(LOG_ERR, "request process %d ended without an outcome", process.Pid());
+    }
+    process.Wait();
+  } catch (const std::system_error& error) {
+    syslog(LOG_ERR, "cannot start request process: %s", error.what());
   }
   return outcome;
 }
@@ -171,13 +186,6 @@ void Launcher::AwaitWorker(std::chrono::milliseconds pause) {
     Reap();
   }
   sigprocmask(SIG_SETMASK, &saved, nullptr);
-}
-
-std::chrono::milliseconds Launcher::PauseBeforeAsking(std::chrono::milliseconds pause,
-                                                      std::chrono::milliseconds answer_time) {
-  constexpr int kLeisure = 50;
-  constexpr std::chrono::milliseconds kLongestLeisure(5000);
-  return std::clamp(kLeisure * answer_time, pause, kLongestLeisure);
 }
 
 }  // namespace Device

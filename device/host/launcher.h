@@ -2,47 +2,31 @@
 // one that crashes costs that request alone.
 #pragma once
 
-#include <json/json.h>
-
 #include <chrono>
 #include <memory>
 #include <string>
 
-namespace KAVO {
-class APIRequest;
-class APIResponse;
-}  // namespace KAVO
+#include "device/base/file_descriptor.h"
+#include "device/platform/kavo/request.h"
+#include "platform/kavo/api_table.h"
 
 namespace Device {
 
-struct Request {
-  std::string api;
-  std::string method;
-  int version = 0;
-  Json::Value params{Json::objectValue};
-  std::string user;
-  std::string session_id;
-  bool is_followed = false;  // the client watches the task to its end: no desktop notification
-};
-
-struct Outcome {
-  int code = 0;
-  Json::Value data;
-};
-
-// A row of a module's API table, as the host reads it: four machine words; a row of zeros ends it.
-struct ApiRow {
-  const char* api;
-  std::intptr_t version;
-  const char* method;
-  void (*handler)(KAVO::APIRequest*, KAVO::APIResponse*);
+// Where the log lines of workers go that are written while this process may have ended.
+enum class WorkerLog {
+  kHere,       // to standard error, like those of the launcher
+  kSyslogOnly  // who reads standard error to its end would else wait for the workers
 };
 
 class Launcher {
  public:
-  // Loads the open device's module. The calling process becomes
-  // the one that reaps the workers. Throws std::runtime_error that names the module and the reason.
-  Launcher();
+  // Loads the open device's module and serves the libraries of this process as their host. The
+  // process becomes the one that reaps the workers. Throws std::runtime_error that names the module
+  // and the reason.
+  explicit Launcher(WorkerLog worker_log = WorkerLog::kHere);
+  ~Launcher();
+  Launcher(const Launcher&) = delete;
+  Launcher& operator=(const Launcher&) = delete;
 
   // Runs one request to its outcome. A request that no row serves, that throws or that crashes has
   // an outcome too: an error code of the host's.
@@ -55,23 +39,23 @@ class Launcher {
   // The same; what the handler throws becomes an error code of the host's.
   Outcome CallSafely(const Request& request);
 
+  // Where this request process writes its answer. No worker holds it, so that who reads there does
+  // not wait for one.
+  FileDescriptor& AnswerStream() { return answer_; }
+
   // Takes leave of workers that have ended. False when none has.
   static bool Reap();
 
   // The same, but waits for one, for `pause` at the most; a signal ends the waiting too.
   static void AwaitWorker(std::chrono::milliseconds pause);
 
-  // For who asks about a task from time to time: `pause`, or, when the last answer took long, as
-  // that of a large job does, 50 times as long as it took, up to 5 s.
-  static std::chrono::milliseconds PauseBeforeAsking(std::chrono::milliseconds pause,
-                                                     std::chrono::milliseconds answer_time);
-
  private:
   // Null, and the host's error code in `code`, when no row serves the request.
-  const ApiRow* FindRow(const Request& request, int& code) const;
+  const KAVO::ApiRow* FindRow(const Request& request, int& code) const;
 
   std::unique_ptr<void, int (*)(void*)> module_;
-  const ApiRow* table_ = nullptr;
+  const KAVO::ApiRow* table_ = nullptr;
+  FileDescriptor answer_;
 };
 
 }  // namespace Device

@@ -1,9 +1,14 @@
 #include "device/host/sessions.h"
 
 #include <crypt.h>
+#include <sys/mman.h>
 
 #include <algorithm>
+#include <atomic>
+#include <cerrno>
 #include <memory>
+#include <new>
+#include <system_error>
 
 #include "device/base/random_id.h"
 #include "device/model/device.h"
@@ -19,8 +24,33 @@ constexpr std::chrono::seconds kLongestWait(60);
 // In place of that of a user who is not there; no password has it.
 constexpr char kNobodysHash[] = "$6$nobody$";
 
+using Flag = std::atomic<bool>;
+static_assert(Flag::is_always_lock_free, "a lock would be one process's own");
+
+// In memory that is shared with the processes that are forked from now on.
+std::shared_ptr<Flag> MakeSharedFlag() {
+  void* const memory =
+      mmap(nullptr, sizeof(Flag), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+  if (memory == MAP_FAILED) {
+    throw std::system_error(errno, std::generic_category(), "shared memory");
+  }
+  return {new (memory) Flag(false), [](Flag* flag) { munmap(flag, sizeof(Flag)); }};
+}
+
+struct Session {
+  std::string user;
+  std::uint64_t number = 0;  // in the order of signing in
+  std::shared_ptr<Flag> has_ended = MakeSharedFlag();
+};
+
+// By id.
+std::map<std::string, Session>& Sessions() {
+  static std::map<std::string, Session> sessions;
+  return sessions;
+}
+
 void EndOldestOf(const std::string& user) {
-  auto& sessions = TheDevice().sessions;
+  auto& sessions = Sessions();
   const auto is_users = [&](const auto& entry) { return entry.second.user == user; };
   if (std::count_if(sessions.begin(), sessions.end(), is_users) < kMostSessions) {
     return;
@@ -40,22 +70,22 @@ std::string SignIn(const std::string& user) {
   EndOldestOf(user);
   static std::uint64_t number = 0;
   std::string id = RandomId(kSessionIdBytes);
-  TheDevice().sessions.emplace(id, Session{user, ++number, {}});
+  Sessions().emplace(id, Session{user, ++number});
   return id;
 }
 
 void SignOut(const std::string& session_id) {
-  auto& sessions = TheDevice().sessions;
+  auto& sessions = Sessions();
   if (const auto found = sessions.find(session_id); found != sessions.end()) {
-    found->second.has_ended.Set();
+    found->second.has_ended->store(true);
     sessions.erase(found);
   }
 }
 
 std::string UserOfSession(const std::string& session_id) {
-  const auto& sessions = TheDevice().sessions;
+  const auto& sessions = Sessions();
   const auto found = sessions.find(session_id);
-  return found == sessions.end() || found->second.has_ended.IsSet() ? "" : found->second.user;
+  return found == sessions.end() || *found->second.has_ended ? "" : found->second.user;
 }
 
 bool IsPassword(const std::string& user, const std::string& password) {

@@ -1,5 +1,5 @@
-// Who is signed in. The sessions of the device live in the launcher; processes forked from it see
-// those that were there, and the end of each.
+// Who is signed in. The sessions live in the launcher; processes forked from it see those that were
+// there, and the end of each.
 #pragma once
 
 #include <chrono>
@@ -9,7 +9,7 @@
 namespace Device {
 
 // Makes a session for the user, as signing in does, and returns its id, which cannot be guessed. A
-// user's oldest sessions end when there are too many.
+// user's oldest sessions end when there are too many. Throws std::system_error.
 std::string SignIn(const std::string& user);
 
 // Ends the session, for requests and workers that are on their way too. Any text may be given.

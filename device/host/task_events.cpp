@@ -10,7 +10,7 @@
 #include "device/base/json_text.h"
 #include "device/host/sessions.h"
 #include "device/tasks/task_store.h"
-#include "device/tasks/task_view.h"
+#include "device/tasks/user_tasks.h"
 #include "device/tasks/workers.h"
 
 namespace Device {
@@ -56,20 +56,19 @@ class Watcher {
   }
 
   void Send(const char* event, const Json::Value& data) {
-    Json::Value frame(Json::objectValue);
-    frame["event"] = event;
-    frame["data"] = data;
-    is_read_ = is_read_ && WriteFrame(stream_, ToText(frame));
+    const std::string text =
+        std::string("event: ") + event + "\ndata: " + ToUtf8Text(data) + "\n\n";
+    is_read_ = is_read_ && WriteFrame(stream_, text);
   }
 
   void SendTasks() {
     std::map<std::string, Json::Value> tasks;
-    StoreOf(user_).RefreshTasks(rows_);
-    for (auto& [id, row] : rows_) {
-      if (!EndIfDead(user_, row) || !HasData(row)) {
+    ReadTasks(user_, rows_);
+    for (const auto& [id, row] : rows_) {
+      if (!HasData(row)) {
         continue;
       }
-      const Json::Value view = TaskView(user_, row);
+      const Json::Value view = TaskView(row);
       tasks[id] = view;
       if (const auto known = tasks_.find(id); known == tasks_.end() || known->second != view) {
         Send("task", view);

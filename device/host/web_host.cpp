@@ -7,21 +7,19 @@
 #include <sys/wait.h>
 #include <syslog.h>
 
-#include <array>
 #include <cerrno>
 #include <chrono>
 #include <cstring>
 #include <filesystem>
 #include <iostream>
 #include <stdexcept>
+#include <system_error>
+#include <utility>
 
+#include "device/base/child_process.h"
 #include "device/base/json_text.h"
-#include "device/host/http_status.h"
 #include "device/host/web_request.h"
 #include "device/model/device.h"
-#include "device/tasks/task_store.h"
-#include "device/tasks/task_view.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -59,18 +57,10 @@ FileDescriptor LockDevice() {
   return file;
 }
 
-// What the front end's process becomes; one that cannot start says so.
-[[noreturn]] void BecomeFrontEnd(const FrontEndFiles& files, int control,
-                                 const std::string& listen) {
-  dup2(control, STDIN_FILENO);
-  const int page = fcntl(files.page.Get(), F_DUPFD, STDERR_FILENO + 1);
-  const std::string page_text = std::to_string(page);
-  std::string name = kFrontEndProgram;
-  std::array<char*, 4> arguments = {name.data(), const_cast<char*>(listen.c_str()),
-                                    const_cast<char*>(page_text.c_str()), nullptr};
-  fexecve(files.program.Get(), arguments.data(), environ);
-  syslog(LOG_ERR, "cannot start %s: %m", kFrontEndProgram);
-  _exit(1);
+// The header that gives the client the session's id, or takes it away.
+std::pair<std::string, std::string> SessionCookie(const std::string& value) {
+  return {"Set-Cookie",
+          std::string(kSessionCookie) + "=" + value + "; Path=/; HttpOnly; SameSite=Strict"};
 }
 
 }  // namespace
@@ -92,7 +82,6 @@ WebHost::WebHost(const FrontEndFiles& files, std::string listen)
 WebHost::~WebHost() { EndFrontEnd(); }
 
 bool WebHost::Run() {
-  EndDeadTasksOfAll();
   StartFrontEnd();
   for (;;) {
     const bool has_room = requests_.size() + checks_.size() < kMostRequests;
@@ -120,7 +109,12 @@ void WebHost::StartFrontEnd() {
   }
   control_ = FileDescriptor(ends[0]);
   const FileDescriptor front_end_side(ends[1]);
-  front_end_ = Fork([&]() -> int { BecomeFrontEnd(files_, front_end_side.Get(), listen_); });
+  ProgramStart start;
+  start.program = "/proc/self/fd/" + std::to_string(files_.program.Get());
+  start.arguments = {kFrontEndProgram, listen_, std::to_string(files_.page.Get())};
+  start.input = front_end_side.Get();
+  start.kept = {files_.page.Get()};
+  front_end_ = ChildProcess::Start(start).Release();
 }
 
 // It ends by itself when its control socket closes, when it has answered what was asked.
@@ -141,27 +135,22 @@ void WebHost::EndFrontEnd() {
 }
 
 pid_t WebHost::Fork(const std::function<int()>& body) {
-  const pid_t pid = fork();
-  if (pid == 0) {
-    // What belongs to the launcher alone.
-    control_.Close();
-    signals_.Close();
-    lock_.Close();
-    requests_.clear();
-    checks_.clear();
-    sigprocmask(SIG_SETMASK, &saved_mask_, nullptr);
-    int status = 1;
-    try {
-      status = body();
-    } catch (const std::exception& error) {
-      syslog(LOG_ERR, "%s", error.what());
-    }
-    _exit(status);
+  try {
+    return ChildProcess::Run([&] {
+             // What belongs to the launcher alone.
+             control_.Close();
+             signals_.Close();
+             lock_.Close();
+             requests_.clear();
+             checks_.clear();
+             sigprocmask(SIG_SETMASK, &saved_mask_, nullptr);
+             return body();
+           })
+        .Release();
+  } catch (const std::system_error& error) {
+    syslog(LOG_ERR, "cannot start a process: %s", error.what());
+    return -1;
   }
-  if (pid < 0) {
-    syslog(LOG_ERR, "cannot fork: %m");
-  }
-  return pid;
 }
 
 bool WebHost::TakeMessage() {
@@ -179,7 +168,7 @@ bool WebHost::TakeMessage() {
 
 void WebHost::Serve(ControlMessage& message) {
   if (message.kind != ControlKind::kRequest) {
-    fcntl(message.exchange.Get(), F_SETFL, O_NONBLOCK);  // the launcher waits for no reader
+    fcntl(message.stream.Get(), F_SETFL, O_NONBLOCK);  // the launcher waits for no reader
   }
   switch (message.kind) {
     case ControlKind::kListening:
@@ -191,21 +180,20 @@ void WebHost::Serve(ControlMessage& message) {
       }
       break;
     case ControlKind::kRequest:
-      TakeRequest(std::move(message.exchange));
+      TakeRequest(std::move(message.stream));
       break;
     case ControlKind::kSignIn:
-      TakeSignIn(message.text, std::move(message.exchange));
+      TakeSignIn(message.text, std::move(message.stream));
       break;
     case ControlKind::kSignOut:
-      SignOut(message.text);
-      Answer(message.exchange.Get(), kHttpNoContent, Json::Value());
+      TakeSignOut(message);
       break;
   }
 }
 
-void WebHost::TakeRequest(FileDescriptor exchange) {
+void WebHost::TakeRequest(FileDescriptor stream) {
   const pid_t pid = Fork([&] {
-    ServeWebRequest(launcher_, std::move(exchange));
+    ServeWebRequest(launcher_, std::move(stream));
     return 0;
   });
   if (pid > 0) {
@@ -213,34 +201,40 @@ void WebHost::TakeRequest(FileDescriptor exchange) {
   }
 }
 
-void WebHost::TakeSignIn(const std::string& text, FileDescriptor exchange) {
+void WebHost::TakeSignIn(const std::string& text, FileDescriptor stream) {
   const Json::Value asked = ParseJson(text);
   const std::string user = asked["user"].asString();
   const std::chrono::seconds wait = gate_.Try(user, SignInGate::Clock::now());
   if (wait.count() > 0) {
-    Json::Value body(Json::objectValue);
-    body["error"] = "too many wrong passwords";
-    body["retry_after"] = static_cast<Json::Int64>(wait.count());
-    Answer(exchange.Get(), kHttpTooMany, body);
+    Answer answer = Refusal(kHttpTooMany, "too many wrong passwords");
+    answer.headers = {{"Retry-After", std::to_string(wait.count())}};
+    SendAnswer(stream.Get(), answer);
     return;
   }
   // Looking at a password takes its time, which is not the launcher's.
   const pid_t pid = Fork([&] { return IsPassword(user, asked["password"].asString()) ? 0 : 1; });
   if (pid > 0) {
-    checks_.emplace(pid, SignInCheck{user, std::move(exchange)});
+    checks_.emplace(pid, SignInCheck{user, std::move(stream)});
   }
+}
+
+void WebHost::TakeSignOut(const ControlMessage& message) {
+  SignOut(message.text);
+  Answer answer(kHttpNoContent);
+  answer.headers = {SessionCookie("; Max-Age=0")};
+  SendAnswer(message.stream.Get(), answer);
 }
 
 void WebHost::FinishSignIn(const SignInCheck& check, bool is_password) {
   if (!is_password) {
-    Refuse(check.exchange.Get(), kHttpUnauthorized, "wrong user name or password");
+    SendAnswer(check.stream.Get(), Refusal(kHttpUnauthorized, "wrong user name or password"));
     return;
   }
   gate_.Succeeded(check.user);
   try {
-    Json::Value body = SessionBody(check.user);
-    body["session"] = SignIn(check.user);
-    Answer(check.exchange.Get(), kHttpOk, body);
+    Answer answer(kHttpOk, SessionBody(check.user));
+    answer.headers = {SessionCookie(SignIn(check.user))};
+    SendAnswer(check.stream.Get(), answer);
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "sign in: %s", error.what());
   }
@@ -266,33 +260,10 @@ void WebHost::TakeEndedChildren() {
       FinishSignIn(finished, ended.si_code == CLD_EXITED && ended.si_status == 0);
     } else if (pid == front_end_) {
       front_end_ = -1;  // its control socket tells the rest
-    } else if (requests_.erase(pid) == 0) {
-      TakeEndedWorker(ended);
+    } else {
+      requests_.erase(pid);  // or it was a worker: who reads its task sees what it has stored
     }
     ended.si_pid = 0;
-  }
-}
-
-// A worker that was killed could not store its outcome.
-void WebHost::TakeEndedWorker(const siginfo_t& ended) {
-  if (ended.si_code != CLD_EXITED) {
-    EndDeadTasksOfAll();
-  }
-}
-
-void WebHost::EndDeadTasksOfAll() {
-  for (const User& user : TheDevice().config.users) {
-    const pid_t pid = Fork([&] {
-      if (LumoLibUGIDSet(nullptr, user.name.c_str()) != 0) {
-        throw std::runtime_error("cannot take on the identity of '" + user.name + "'");
-      }
-      EndDeadTasks(user.name);
-      CloseStores();
-      return 0;
-    });
-    if (pid > 0) {
-      requests_.insert(pid);
-    }
   }
 }
 

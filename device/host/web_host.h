@@ -11,9 +11,9 @@
 #include <string>
 
 #include "device/base/file_descriptor.h"
-#include "device/host/control.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
+#include "device/host/wire.h"
 
 namespace Device {
 
@@ -43,7 +43,7 @@ class WebHost {
  private:
   struct SignInCheck {
     std::string user;
-    FileDescriptor exchange;
+    FileDescriptor stream;
   };
 
   void StartFrontEnd();
@@ -54,15 +54,14 @@ class WebHost {
   // False when the front end is gone.
   bool TakeMessage();
   void Serve(ControlMessage& message);
-  void TakeRequest(FileDescriptor exchange);
-  void TakeSignIn(const std::string& text, FileDescriptor exchange);
+  void TakeRequest(FileDescriptor stream);
+  void TakeSignIn(const std::string& text, FileDescriptor stream);
+  void TakeSignOut(const ControlMessage& message);
   void FinishSignIn(const SignInCheck& check, bool is_password);
 
   // False when serving is to end.
   bool TakeSignal();
   void TakeEndedChildren();
-  void TakeEndedWorker(const siginfo_t& ended);
-  void EndDeadTasksOfAll();
 
   const FrontEndFiles& files_;
   std::string listen_;

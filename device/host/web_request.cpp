@@ -6,15 +6,13 @@
 
 #include "device/base/frame.h"
 #include "device/base/json_text.h"
-#include "device/host/control.h"
 #include "device/host/file_listing.h"
-#include "device/host/http_status.h"
 #include "device/host/sessions.h"
 #include "device/host/task_events.h"
+#include "device/host/wire.h"
 #include "device/model/device.h"
 #include "device/platform/lumo/errors.h"
-#include "device/tasks/task_store.h"
-#include "device/tasks/task_view.h"
+#include "device/tasks/user_tasks.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {
@@ -27,7 +25,7 @@ void TakeIdentity(const std::string& session_id, const std::string& user) {
   }
 }
 
-void AnswerCall(Launcher& launcher, const std::string& user, const Json::Value& asked) {
+Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& asked) {
   Request request;
   request.api = asked["api"].asString();
   request.method = asked["method"].asString();
@@ -40,67 +38,74 @@ void AnswerCall(Launcher& launcher, const std::string& user, const Json::Value& 
   Json::Value body(Json::objectValue);
   body["code"] = outcome.code;
   body["data"] = outcome.data;
-  Answer(TheDevice().outcome.Get(), kHttpOk, body);
+  return Answer(kHttpOk, body);
 }
 
-void AnswerFiles(int exchange, const std::string& user, const std::string& path) {
+Answer ListFiles(const std::string& user, const std::string& path) {
   const Listing listing = ListFolder(user, path);
   if (listing.error == 0) {
-    Answer(exchange, kHttpOk, listing.body);
-    return;
+    return Answer(kHttpOk, listing.body);
   }
   Json::Value body(Json::objectValue);
   body["code"] = listing.error;
   body["error"] = ErrorText(listing.error);
-  const bool is_forbidden = listing.error == kErrNoPrivilege || listing.error == kErrOutsideShare;
-  Answer(exchange, is_forbidden ? kHttpForbidden : kHttpNotFound, body);
+  const bool is_forbidden =
+      listing.error == KAVO::kErrNoPrivilege || listing.error == KAVO::kErrOutsideShare;
+  return Answer(is_forbidden ? kHttpForbidden : kHttpNotFound, body);
 }
 
-void AnswerTasks(int exchange, const std::string& user) {
+Answer ListTasks(const std::string& user) {
   Json::Value body(Json::objectValue);
   body["tasks"] = Json::Value(Json::arrayValue);
-  for (const TaskRow& row : EndDeadTasks(user)) {
+  for (const TaskRow& row : AllTasks(user)) {
     if (HasData(row)) {
-      body["tasks"].append(TaskView(user, row));
+      body["tasks"].append(TaskView(row));
     }
   }
-  Answer(exchange, kHttpOk, body);
+  return Answer(kHttpOk, body);
 }
 
-void AnswerCodes(int exchange) {
+Answer ListCodes() {
   Json::Value body(Json::objectValue);
   for (const auto& [code, text] : ErrorTexts()) {
     body[std::to_string(code)] = text;
   }
-  Answer(exchange, kHttpOk, body);
+  return Answer(kHttpOk, body);
+}
+
+void StreamEvents(int stream, const std::string& user, const std::string& session_id) {
+  StoreOf(user);  // throws when it cannot be opened, before a stream is promised
+  if (!SendAnswer(stream, Answer(kHttpOk))) {
+    return;
+  }
+  try {
+    SendTaskEvents(stream, user, session_id);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "event stream: %s", error.what());  // the stream ends, and is asked for again
+  }
 }
 
 void Serve(Launcher& launcher, const Json::Value& asked) {
-  const int exchange = TheDevice().outcome.Get();
+  const int stream = launcher.AnswerStream().Get();
   const std::string kind = asked["kind"].asString();
-  if (kind == kKindCodes) {
-    AnswerCodes(exchange);
-    return;
-  }
   const std::string session_id = asked["session"].asString();
   const std::string user = UserOfSession(session_id);
-  if (user.empty()) {
-    Refuse(exchange, kHttpUnauthorized, "no session");
+  if (kind == kKindCodes) {
+    SendAnswer(stream, ListCodes());
+  } else if (user.empty()) {
+    SendAnswer(stream, Refusal(kHttpUnauthorized, "no session"));
   } else if (kind == kKindCall) {
-    AnswerCall(launcher, user, asked);
+    SendAnswer(stream, CallApi(launcher, user, asked));
   } else if (kind == kKindSession) {
-    Answer(exchange, kHttpOk, SessionBody(user));
+    SendAnswer(stream, Answer(kHttpOk, SessionBody(user)));
   } else {
     TakeIdentity(session_id, user);
     if (kind == kKindFiles) {
-      AnswerFiles(exchange, user, asked["path"].asString());
+      SendAnswer(stream, ListFiles(user, asked["path"].asString()));
     } else if (kind == kKindTasks) {
-      AnswerTasks(exchange, user);
+      SendAnswer(stream, ListTasks(user));
     } else {
-      StoreOf(user);  // throws when it cannot be opened, before a stream is promised
-      if (Answer(exchange, kHttpOk, Json::Value())) {
-        SendTaskEvents(exchange, user, session_id);
-      }
+      StreamEvents(stream, user, session_id);
     }
   }
 }
@@ -114,29 +119,16 @@ Json::Value SessionBody(const std::string& user) {
   return body;
 }
 
-bool Answer(int exchange, int status, const Json::Value& body) {
-  Json::Value frame(Json::objectValue);
-  frame["status"] = status;
-  frame["body"] = body;
-  return WriteFrame(exchange, ToText(frame));
-}
-
-bool Refuse(int exchange, int status, const std::string& reason) {
-  Json::Value body(Json::objectValue);
-  body["error"] = reason;
-  return Answer(exchange, status, body);
-}
-
-void ServeWebRequest(Launcher& launcher, FileDescriptor exchange) {
-  // No worker may hold on to it.
-  TheDevice().outcome = std::move(exchange);
+void ServeWebRequest(Launcher& launcher, FileDescriptor stream) {
+  launcher.AnswerStream() = std::move(stream);
+  const int answer = launcher.AnswerStream().Get();
   try {
-    if (const std::optional<std::string> text = ReadFrame(TheDevice().outcome.Get())) {
+    if (const std::optional<std::string> text = ReadFrame(answer)) {
       Serve(launcher, ParseJson(*text));
     }
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "web request: %s", error.what());
-    Refuse(TheDevice().outcome.Get(), kHttpInternal, "the device cannot answer: see its log");
+    SendAnswer(answer, Refusal(kHttpInternal, "the device cannot answer: see its log"));
   }
   CloseStores();
 }

@@ -201,7 +201,9 @@ const T* FindByName(const std::vector<T>& all, const std::string& name) {
 const User* Config::FindUser(const std::string& name) const { return FindByName(users, name); }
 const Share* Config::FindShare(const std::string& name) const { return FindByName(shares, name); }
 
-Config ParseConfig(const std::string& text) {
+Config ParseConfig(const std::string& file) {
+  constexpr char kByteOrderMark[] = "\xEF\xBB\xBF";
+  const std::string text = file.rfind(kByteOrderMark, 0) == 0 ? file.substr(3) : file;
   const Json::Value root = ParseJson(text);
   const ConfigReader reader(text);
   Config config;

@@ -11,7 +11,7 @@
 #include <memory>
 #include <stdexcept>
 
-#include "device/base/text_file.h"
+#include "device/base/file_io.h"
 #include "device/model/reachable.h"
 
 namespace Device {

@@ -1,17 +1,15 @@
-// The device that this process and those forked from it belong to: its folder, its configuration,
-// and the user whose identity the process has.
+// The device that this process and those forked from it belong to: its folder and its
+// configuration.
 //
 // In the folder: device.json; a folder for each volume; in a volume its shared folders and, under
 // "homes", the users' homes; under "users" a folder for each user, that only that user can enter,
 // with the store of tasks.
 #pragma once
 
-#include <map>
 #include <string>
 #include <vector>
 
 #include "device/base/file_descriptor.h"
-#include "device/host/session.h"
 #include "device/model/config.h"
 
 namespace Device {
@@ -30,11 +28,6 @@ struct OpenDevice {
   bool switches_identity = false;         // false: not root, all users are the caller
   FileDescriptor archiver;                // the program that runs in place of /usr/bin/7z
   FileDescriptor module;                  // the shared library that serves the requests
-
-  std::map<std::string, Session> sessions;  // by session id
-  std::string current_user;  // whose identity this process has; empty: the device's own
-  bool is_followed = false;  // the client of this request watches the task to its end
-  FileDescriptor outcome;    // where a request process writes its outcome; no worker may hold it
 
   std::string VolumePath(const std::string& volume) const { return root + "/" + volume; }
   std::string HomePath(const User& user) const {

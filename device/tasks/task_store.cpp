@@ -1,6 +1,5 @@
 #include "device/tasks/task_store.h"
 
-#include <algorithm>
 #include <ctime>
 #include <stdexcept>
 #include <utility>
@@ -143,20 +142,6 @@ void TaskStore::RefreshTasks(std::map<std::string, TaskRow>& rows) {
       ReadChanges(row);
     }
   });
-}
-
-std::vector<TaskRow> TaskStore::AllTasks() {
-  std::map<std::string, TaskRow> rows;
-  RefreshTasks(rows);
-  std::vector<TaskRow> all;
-  all.reserve(rows.size());
-  for (auto& [id, row] : rows) {
-    all.push_back(std::move(row));
-  }
-  std::stable_sort(all.begin(), all.end(), [](const TaskRow& one, const TaskRow& other) {
-    return one.updated < other.updated;
-  });
-  return all;
 }
 
 bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> properties,

@@ -56,7 +56,6 @@ class TaskStore {
   // A new task, with what is in the row.
   void AddTask(TaskRow& row);
   std::optional<TaskRow> FindTask(const std::string& id);
-  std::vector<TaskRow> AllTasks();
   // Brings the row up to date. Only what has changed is read, of a property that is an object only
   // the members that have. False when there is no such task any more.
   bool RefreshTask(TaskRow& row);

@@ -68,31 +68,6 @@ int VersionOf(const Json::Value& field) {
   return static_cast<int>(number);
 }
 
-// Bytes of the valid UTF-8 sequence at that place, 0 when there is none.
-std::size_t SequenceLength(const std::string& text, std::size_t at) {
-  const auto byte = [&](std::size_t index) {
-    return index < text.size() ? static_cast<unsigned char>(text[index]) : 0U;
-  };
-  const unsigned first = byte(at);
-  if (first < 0x80) {
-    return 1;
-  }
-  const std::size_t length = first >= 0xF5 || first < 0xC2 ? 0
-                             : first >= 0xF0               ? 4
-                             : first >= 0xE0               ? 3
-                                                           : 2;
-  for (std::size_t index = 1; index < length; ++index) {
-    if ((byte(at + index) & 0xC0U) != 0x80U) {
-      return 0;
-    }
-  }
-  // Longer than need be, surrogates, and above the last code point.
-  const unsigned second = byte(at + 1);
-  const bool is_wrong = (first == 0xE0 && second < 0xA0) || (first == 0xED && second >= 0xA0) ||
-                        (first == 0xF0 && second < 0x90) || (first == 0xF4 && second >= 0x90);
-  return is_wrong ? 0 : length;
-}
-
 }  // namespace
 
 Json::Value ParseBody(const std::string& content_type, const std::string& body) {
@@ -133,25 +108,6 @@ std::string TextField(const Json::Value& body, const std::string& name) {
     throw std::runtime_error("'" + name + "' is missing or no text");
   }
   return body[name].asString();
-}
-
-std::string BodyText(const Json::Value& value) {
-  const std::string text = Device::ToText(value);
-  std::string safe;
-  for (std::size_t at = 0; at < text.size();) {
-    const std::size_t length = SequenceLength(text, at);
-    if (length > 0) {
-      safe.append(text, at, length);
-      at += length;
-      continue;
-    }
-    constexpr char kDigits[] = "0123456789abcdef";
-    const auto byte = static_cast<unsigned char>(text[at++]);
-    safe += "\\udc";
-    safe += kDigits[byte >> 4U];
-    safe += kDigits[byte & 0xFU];
-  }
-  return safe;
 }
 
 }  // namespace Web

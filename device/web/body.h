@@ -1,4 +1,4 @@
-// The bodies of HTTP requests and answers. No I/O.
+// The bodies of HTTP requests. No I/O.
 #pragma once
 
 #include <json/json.h>
@@ -18,9 +18,5 @@ Json::Value ApiRequest(const Json::Value& body);
 
 // A text field. Throws std::runtime_error that names it when it is missing or none.
 std::string TextField(const Json::Value& body, const std::string& name);
-
-// One line of JSON in UTF-8. A byte of a text that is no part of valid UTF-8 becomes the escape
-// \udc80 to \udcff, which ParseBody turns back.
-std::string BodyText(const Json::Value& value);
 
 }  // namespace Web

@@ -6,7 +6,6 @@
 
 #include "device/base/frame.h"
 #include "device/base/json_text.h"
-#include "device/host/http_status.h"
 
 namespace Web {
 
@@ -30,20 +29,13 @@ Exchange::Exchange(const Json::Value& request) : Exchange(Device::ControlKind::k
   Device::WriteFrame(stream_.Get(), Device::ToText(request));
 }
 
-Answer Exchange::Receive() {
-  const std::optional<Json::Value> frame = Next();
-  if (!frame) {
-    Answer answer{Device::kHttpInternal, Json::Value(Json::objectValue)};
-    answer.body["error"] = "the request ended without an answer";
-    return answer;
-  }
-  return {(*frame)["status"].asInt(), (*frame)["body"]};
+Device::Answer Exchange::Receive() {
+  const std::optional<Device::Answer> answer = Device::ReceiveAnswer(stream_.Get());
+  return answer ? *answer
+                : Device::Refusal(Device::kHttpInternal, "the request ended without an answer");
 }
 
-std::optional<Json::Value> Exchange::Next() {
-  const std::optional<std::string> text = Device::ReadFrame(stream_.Get());
-  return text ? std::optional(Device::ParseJson(*text)) : std::nullopt;
-}
+std::optional<std::string> Exchange::Next() { return Device::ReadFrame(stream_.Get()); }
 
 bool Exchange::Wait(int milliseconds) const {
   pollfd source = {stream_.Get(), POLLIN, 0};

@@ -7,14 +7,9 @@
 #include <string>
 
 #include "device/base/file_descriptor.h"
-#include "device/host/control.h"
+#include "device/host/wire.h"
 
 namespace Web {
-
-struct Answer {
-  int status = 0;  // HTTP
-  Json::Value body;
-};
 
 class Exchange {
  public:
@@ -24,9 +19,9 @@ class Exchange {
   explicit Exchange(const Json::Value& request);
 
   // The answer; the status 500 when the other side went without one.
-  Answer Receive();
-  // The next frame of a stream. Nothing at its end.
-  std::optional<Json::Value> Next();
+  Device::Answer Receive();
+  // The next of the events that follow the answer, as the client gets it. Nothing at their end.
+  std::optional<std::string> Next();
   // Waits for the next frame. False after the time-out.
   bool Wait(int milliseconds) const;
 

@@ -1,6 +1,5 @@
 #include "device/web/front_end.h"
 
-#include <malloc.h>
 #include <poll.h>
 #include <sys/socket.h>
 
@@ -8,7 +7,6 @@
 #include <stdexcept>
 
 #include "device/base/json_text.h"
-#include "device/host/http_status.h"
 #include "device/web/body.h"
 #include "device/web/connection_threads.h"
 
@@ -28,29 +26,28 @@ constexpr std::chrono::seconds kEndGrace(5);
 constexpr char kJson[] = "application/json";
 constexpr char kSession[] = "/session";
 constexpr char kWebApi[] = "/webapi";
-constexpr char kCookie[] = "session";
-constexpr char kCookieAttributes[] = "; Path=/; HttpOnly; SameSite=Strict";
 constexpr char kPolicy[] =
     "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self'; connect-src 'self'; "
     "base-uri 'none'; form-action 'none'; frame-ancestors 'none'";
 
-void Respond(Response& response, int status, const Json::Value& body) {
-  response.status = status;
-  if (!body.isNull()) {
-    response.set_content(BodyText(body) + "\n", kJson);
+void Respond(Response& response, const Device::Answer& answer) {
+  response.status = answer.status;
+  for (const auto& [name, value] : answer.headers) {
+    response.set_header(name, value);
+  }
+  if (!answer.body.empty()) {
+    response.set_content(answer.body, kJson);
   }
 }
 
 void Refuse(Response& response, int status, const std::string& reason) {
-  Json::Value body(Json::objectValue);
-  body["error"] = reason;
-  Respond(response, status, body);
+  Respond(response, Device::Refusal(status, reason));
 }
 
 // The cookie's value; empty when there is none.
 std::string SessionOf(const Request& request) {
   const std::string cookies = "; " + request.get_header_value("Cookie");
-  const std::string name = std::string("; ") + kCookie + "=";
+  const std::string name = std::string("; ") + Device::kSessionCookie + "=";
   const std::size_t begin = cookies.find(name);
   if (begin == std::string::npos) {
     return "";
@@ -86,10 +83,9 @@ Json::Value Asked(const Request& request, const char* kind) {
   return asked;
 }
 
-// Passes what the launcher's process answers on.
-void Pass(const Json::Value& asked, Response& response) {
-  const Answer answer = Exchange(asked).Receive();
-  Respond(response, answer.status, answer.body);
+// Has the request served by a process of the launcher's.
+void Serve(const Json::Value& asked, Response& response) {
+  Respond(response, Exchange(asked).Receive());
 }
 
 const char* ReasonFor(int status) {
@@ -143,17 +139,13 @@ bool MayParse(const Request& request, const std::string& body, Response& respons
       response.status = Device::kHttpTooLarge;
       return false;
     }
-    const Answer answer = Exchange(Asked(request, Device::kKindSession)).Receive();
+    const Device::Answer answer = Exchange(Asked(request, Device::kKindSession)).Receive();
     if (answer.status != Device::kHttpOk) {
-      Respond(response, answer.status, answer.body);
+      Respond(response, answer);
       return false;
     }
   }
   return true;
-}
-
-std::string EventText(const Json::Value& frame) {
-  return "event: " + frame["event"].asString() + "\ndata: " + BodyText(frame["data"]) + "\n\n";
 }
 
 }  // namespace
@@ -226,7 +218,7 @@ void FrontEnd::AddRoutes() {
                         const httplib::ContentReader& /*body*/) { SignOut(request, response); });
   for (const char* kind : {Device::kKindSession, Device::kKindTasks, Device::kKindCodes}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
-      Pass(Asked(request, kind), response);
+      Serve(Asked(request, kind), response);
     });
   }
   server_.Get("/files", [](const Request& request, Response& response) {
@@ -236,7 +228,7 @@ void FrontEnd::AddRoutes() {
     }
     Json::Value asked = Asked(request, Device::kKindFiles);
     asked["path"] = request.get_param_value("path");
-    Pass(asked, response);
+    Serve(asked, response);
   });
   server_.Get("/events", [this](const Request& request, Response& response) {
     StreamEvents(request, response);
@@ -255,9 +247,6 @@ void FrontEnd::Post(const char* route,
         (this->*handler)(request, ParseBody(request.get_header_value("Content-Type"), body),
                          response);
       }
-      if (body.size() > kMostStrangersBytes) {
-        malloc_trim(0);  // as JSON it has taken a hundred times its length
-      }
     } catch (const std::runtime_error& error) {
       Refuse(response, Device::kHttpBadRequest, error.what());
     }
@@ -273,23 +262,12 @@ void FrontEnd::SignIn(const Request& /*request*/, const Json::Value& body, Respo
     Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
     return;
   }
-  Answer answer = Exchange(Device::ControlKind::kSignIn, text).Receive();
-  if (answer.status == Device::kHttpOk) {
-    response.set_header("Set-Cookie", std::string(kCookie) + "=" +
-                                          answer.body["session"].asString() + kCookieAttributes);
-    answer.body.removeMember("session");
-  } else if (answer.status == Device::kHttpTooMany) {
-    response.set_header("Retry-After", answer.body["retry_after"].asString());
-    answer.body.removeMember("retry_after");
-  }
-  Respond(response, answer.status, answer.body);
+  Respond(response, Exchange(Device::ControlKind::kSignIn, text).Receive());
 }
 
 void FrontEnd::SignOut(const Request& request, Response& response) {
   const std::string session = SessionOf(request).substr(0, Device::kMostControlBytes);
-  const Answer answer = Exchange(Device::ControlKind::kSignOut, session).Receive();
-  response.set_header("Set-Cookie", std::string(kCookie) + "=; Max-Age=0" + kCookieAttributes);
-  Respond(response, answer.status, answer.body);
+  Respond(response, Exchange(Device::ControlKind::kSignOut, session).Receive());
 }
 
 void FrontEnd::CallApi(const Request& request, const Json::Value& body, Response& response) {
@@ -297,7 +275,7 @@ void FrontEnd::CallApi(const Request& request, const Json::Value& body, Response
   asked["kind"] = Device::kKindCall;
   asked["session"] = SessionOf(request);
   asked["followed"] = streams_.HasAny(asked["session"].asString());
-  Pass(asked, response);
+  Serve(asked, response);
 }
 
 void FrontEnd::StreamEvents(const Request& request, Response& response) {
@@ -309,9 +287,9 @@ void FrontEnd::StreamEvents(const Request& request, Response& response) {
     return;
   }
   const auto exchange = std::make_shared<Exchange>(asked);
-  const Answer answer = exchange->Receive();
+  const Device::Answer answer = exchange->Receive();
   if (answer.status != Device::kHttpOk) {
-    Respond(response, answer.status, answer.body);
+    Respond(response, answer);
     return;
   }
   response.set_chunked_content_provider(
@@ -319,12 +297,12 @@ void FrontEnd::StreamEvents(const Request& request, Response& response) {
         // A comment now and then tells whether the client is still there.
         std::string text = ":\n\n";
         if (exchange->Wait(kHeartbeatMs)) {
-          const std::optional<Json::Value> frame = exchange->Next();
-          if (!frame || !frame->isMember("event")) {  // a refusal says that the store has failed
+          const std::optional<std::string> event = exchange->Next();
+          if (!event) {
             sink.done();
             return true;
           }
-          text = EventText(*frame);
+          text = *event;
         }
         return !is_ending_ && sink.write(text.data(), text.size());
       });

@@ -16,7 +16,7 @@
 #include <string>
 #include <thread>
 
-#include "device/host/control.h"
+#include "device/host/wire.h"
 #include "device/web/front_end.h"
 
 namespace {

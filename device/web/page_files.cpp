@@ -3,7 +3,7 @@
 #include <filesystem>
 #include <stdexcept>
 
-#include "device/base/text_file.h"
+#include "device/base/file_io.h"
 
 namespace Web {
 

@@ -3,7 +3,7 @@
 
 #include <filesystem>
 
-#include "device/base/text_file.h"
+#include "device/base/file_io.h"
 #include "tests/fuzz/targets.h"
 
 void PrintTo(const FuzzTarget& target, std::ostream* out) { *out << target.name; }

@@ -9,9 +9,10 @@
 
 #include "device/base/json_text.h"
 #include "device/model/device.h"
-#include "device/platform/kavo/request_state.h"
+#include "device/platform/kavo/request.h"
+#include "platform/kavo/api_table.h"
 #include "device/platform/operations.h"
-#include "device/tasks/task_store.h"
+#include "device/tasks/user_tasks.h"
 #include "tests/fuzz/targets.h"
 
 extern "C" void* GetAPITable();
@@ -96,7 +97,7 @@ Device::Outcome Serve(const Json::Value& scene, const std::string& method,
   KAVO::APIResponse api_response{&state};
   bool threw = false;
   try {
-    static_cast<const Device::ApiRow*>(GetAPITable())->handler(&api_request, &api_response);
+    static_cast<const KAVO::ApiRow*>(GetAPITable())->handler(&api_request, &api_response);
   } catch (const Json::Exception&) {
     threw = true;
   }
@@ -124,7 +125,7 @@ void FuzzStartRequest(const std::string& input) {
   const Json::Value scene = ReadScene(input);
   Store();
   const Device::Outcome outcome = Serve(scene, "start", {0, 101, 401, 402, 1300, 1301});
-  const std::vector<Device::TaskRow> tasks = Store().AllTasks();
+  const std::vector<Device::TaskRow> tasks = Device::AllTasks("alice");
   for (const Device::TaskRow& task : tasks) {
     Store().RemoveTask(task.id);
   }

@@ -7,6 +7,7 @@
 #include "compress/split_path.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/list_file.h"
+#include "device/base/utf8.h"
 #include "device/platform/lumo/paths.h"
 #include "platform/lumo/file_manager.h"
 #include "tests/fuzz/targets.h"
@@ -65,7 +66,7 @@ void CheckForeignList(const std::string& list) {
   const Archiver::NamesFor7z divided = Archiver::DivideNames(packed);
   std::multiset<std::string> again(divided.arguments.begin(), divided.arguments.end());
   for (const std::string& line : SplitAt('\n', divided.list)) {
-    Require(line.find('\r') == line.npos && Archiver::IsUtf8(line), "a line is read as it is");
+    Require(line.find('\r') == line.npos && Device::IsUtf8(line), "a line is read as it is");
     if (!line.empty()) {
       again.insert(line.substr(1, line.size() - 2));
     }

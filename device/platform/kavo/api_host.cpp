@@ -1,5 +1,5 @@
 // The request and response objects that a module sees.
-#include "device/platform/kavo/request_state.h"
+#include "device/platform/kavo/request.h"
 #include "device/platform/operations.h"
 
 using Device::Operation;

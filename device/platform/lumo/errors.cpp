@@ -18,26 +18,26 @@ struct TextRow {
   const char* text;
 };
 constexpr TextRow kTexts[] = {
-    {kErrInternal, "the request failed without an answer"},
-    {kErrBadParameter, "bad or missing parameter"},
-    {kErrNoApi, "no such API"},
-    {kErrNoMethod, "no such method"},
-    {kErrNoVersion, "no such version of the method"},
-    {kErrSystem, "system error"},
-    {kErrSession, "the session has ended"},
-    {kErrNoUser, "no such user"},
-    {kErrNoPrivilege, "no privilege"},
-    {kErrNotFound, "no such file or folder"},
-    {kErrReadOnly, "read-only file system"},
-    {kErrNameTooLong, "file name too long"},
-    {kErrNameTooLongCrypt, "file name too long for an encrypted shared folder"},
-    {kErrQuota, "disk quota exceeded"},
-    {kErrNoSpace, "no space left on device"},
-    {kErrBadName, "not a valid file name"},
-    {kErrOutsideShare, "the path leads out of its shared folder"},
-    {kErrNoTask, "no such task"},
-    {kErrArchive, "the archive could not be made"},
-    {kErrArchiveName, "the archive's name is longer than 255 bytes"},
+    {KAVO::kErrInternal, "the request failed without an answer"},
+    {KAVO::kErrBadParameter, "bad or missing parameter"},
+    {KAVO::kErrNoApi, "no such API"},
+    {KAVO::kErrNoMethod, "no such method"},
+    {KAVO::kErrNoVersion, "no such version of the method"},
+    {KAVO::kErrSystem, "system error"},
+    {KAVO::kErrSession, "the session has ended"},
+    {KAVO::kErrNoUser, "no such user"},
+    {KAVO::kErrNoPrivilege, "no privilege"},
+    {KAVO::kErrNotFound, "no such file or folder"},
+    {KAVO::kErrReadOnly, "read-only file system"},
+    {KAVO::kErrNameTooLong, "file name too long"},
+    {KAVO::kErrNameTooLongEncrypted, "file name too long for an encrypted shared folder"},
+    {KAVO::kErrQuota, "disk quota exceeded"},
+    {KAVO::kErrNoSpace, "no space left on device"},
+    {KAVO::kErrBadName, "not a valid file name"},
+    {KAVO::kErrOutsideShare, "the path leads out of its shared folder"},
+    {KAVO::kErrNoTask, "no such task"},
+    {KAVO::kErrGeneral, "the archive could not be made"},
+    {KAVO::kErrArchiveNameTooLong, "the archive's name is longer than 255 bytes"},
 };
 
 struct ErrnoRow {
@@ -46,22 +46,22 @@ struct ErrnoRow {
 };
 constexpr ErrnoRow kErrnos[] = {
     {0, 0},
-    {EACCES, kErrNoPrivilege},
-    {EPERM, kErrNoPrivilege},
-    {ENOENT, kErrNotFound},
-    {ENOTDIR, kErrNotFound},
-    {ELOOP, kErrNotFound},
-    {EROFS, kErrReadOnly},
-    {ENAMETOOLONG, kErrNameTooLong},
-    {EDQUOT, kErrQuota},
-    {ENOSPC, kErrNoSpace},
+    {EACCES, KAVO::kErrNoPrivilege},
+    {EPERM, KAVO::kErrNoPrivilege},
+    {ENOENT, KAVO::kErrNotFound},
+    {ENOTDIR, KAVO::kErrNotFound},
+    {ELOOP, KAVO::kErrNotFound},
+    {EROFS, KAVO::kErrReadOnly},
+    {ENAMETOOLONG, KAVO::kErrNameTooLong},
+    {EDQUOT, KAVO::kErrQuota},
+    {ENOSPC, KAVO::kErrNoSpace},
 };
 
 int FromErrno(int error_number) {
   const auto* const row =
       std::find_if(std::begin(kErrnos), std::end(kErrnos),
                    [&](const ErrnoRow& each) { return each.error_number == error_number; });
-  return row == std::end(kErrnos) ? static_cast<int>(kErrSystem) : row->code;
+  return row == std::end(kErrnos) ? static_cast<int>(KAVO::kErrSystem) : row->code;
 }
 
 }  // namespace

@@ -1,4 +1,6 @@
 // The identity and the file-creation mask of a process.
+#include "device/platform/lumo/identity.h"
+
 #include <grp.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -6,6 +8,7 @@
 #include <cerrno>
 
 #include "device/model/device.h"
+#include "device/platform/host_services.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/operations.h"
 #include "platform/klib/system.h"
@@ -16,6 +19,8 @@ namespace Device {
 namespace {
 
 constexpr mode_t kWorkingMask = 022;
+
+std::string current_user;
 
 // For good: what the process starts cannot go back either.
 bool BecomeUser(const User& user) {
@@ -29,31 +34,30 @@ bool BecomeUser(const User& user) {
 }
 
 int SwitchTo(const char* session_id, const char* name) {
-  OpenDevice& device = TheDevice();
-  const User* const user = name == nullptr ? nullptr : device.config.FindUser(name);
+  const User* const user = name == nullptr ? nullptr : TheDevice().config.FindUser(name);
   if (user == nullptr) {
-    SetLastError(kErrNoUser);
+    SetLastError(KAVO::kErrNoUser);
     errno = ENOENT;
     return -1;
   }
-  if (session_id != nullptr && *session_id != '\0') {
-    const auto session = device.sessions.find(session_id);
-    if (session == device.sessions.end() || session->second.user != user->name ||
-        session->second.has_ended.IsSet()) {
-      SetLastError(kErrSession);
-      errno = EACCES;
-      return -1;
-    }
+  if (session_id != nullptr && *session_id != '\0' &&
+      !TheHost().has_session(session_id, user->name)) {
+    SetLastError(KAVO::kErrSession);
+    errno = EACCES;
+    return -1;
   }
   if (!BecomeUser(*user)) {
     SetLastErrno(errno);
     return -1;
   }
-  device.current_user = user->name;
+  current_user = user->name;
   return 0;
 }
 
 }  // namespace
+
+const std::string& CurrentUser() { return current_user; }
+
 }  // namespace Device
 
 using Device::Operation;

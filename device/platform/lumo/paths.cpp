@@ -7,7 +7,6 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <chrono>
 #include <climits>
 #include <cstdlib>
 #include <cstring>
@@ -17,6 +16,7 @@
 
 #include "device/base/file_descriptor.h"
 #include "device/platform/lumo/errors.h"
+#include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
 #include "platform/lumo/file_manager.h"
 
@@ -28,7 +28,7 @@ constexpr std::size_t kNameMax = 255;  // bytes
 constexpr std::size_t kEncryptedNameMax = 143;
 
 // The path's parts. False when ".." leads above the first of them, the shared folder.
-bool SplitPath(std::string_view path, std::vector<std::string_view>& parts) {
+bool SplitUserPath(std::string_view path, std::vector<std::string_view>& parts) {
   std::size_t begin = 0;
   while (begin < path.size()) {
     const std::size_t end = std::min(path.find('/', begin), path.size());
@@ -99,40 +99,21 @@ bool HasNoLinks(const std::string& path) {
       static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof how))));
 }
 
-// The same of one file after another in one folder: the folder's answer holds for the next ones for
-// a moment, within which the caller could as well have asked for all of them; of each, one look at
-// the file itself is left, which costs half.
-bool IsInFolderWithoutLinks(const std::string& path) {
-  using Clock = std::chrono::steady_clock;
-  constexpr auto kMoment = std::chrono::milliseconds(10);
-  thread_local std::string folder;
-  thread_local Clock::time_point until;
-  const std::size_t slash = path.rfind('/');
-  const Clock::time_point now = Clock::now();
-  if (now >= until || path.compare(0, slash, folder) != 0) {
-    folder.assign(path, 0, slash);
-    until = HasNoLinks(folder + "/") ? now + kMoment : Clock::time_point();
-  }
-  struct stat info {};
-  return now < until && lstat(path.c_str(), &info) == 0 && !S_ISLNK(info.st_mode);
-}
-
 // True of an absolute path without ".", ".." and doubled slashes: with no links on the way, it is
 // what following it would give. Names that begin with a dot are left to following.
-bool IsPlain(const std::string& path) {
+bool IsNormal(const std::string& path) {
   return path[0] == '/' && path.find("/.") == std::string::npos &&
          path.find("//") == std::string::npos;
 }
 
 int CheckPath(const char* path) {
-  const std::string followed =
-      IsPlain(path) && IsInFolderWithoutLinks(path) ? path : FollowLinks(path);
+  const std::string followed = IsNormal(path) && HasNoLinks(path) ? path : FollowLinks(path);
   if (followed.empty()) {
     SetLastErrno(errno);
     return -1;
   }
   if (!IsOnVolumes(followed)) {
-    SetLastError(kErrOutsideShare);
+    SetLastError(KAVO::kErrOutsideShare);
     return -1;
   }
   return 0;
@@ -140,13 +121,13 @@ int CheckPath(const char* path) {
 
 int CheckFileName(const std::string& directory, const std::string& name) {
   if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos) {
-    SetLastError(kErrBadName);
+    SetLastError(KAVO::kErrBadName);
     return -1;
   }
   const Share* const share = ShareOfRealPath(TheDevice(), directory);
   const bool is_encrypted = share != nullptr && share->encrypted;
   if (name.size() > (is_encrypted ? kEncryptedNameMax : kNameMax)) {
-    SetLastError(is_encrypted ? kErrNameTooLongCrypt : kErrNameTooLong);
+    SetLastError(is_encrypted ? KAVO::kErrNameTooLongEncrypted : KAVO::kErrNameTooLong);
     return -1;
   }
   return 0;
@@ -169,16 +150,16 @@ ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const st
   ResolvedPath resolved;
   std::vector<std::string_view> parts;
   if (path.empty() || path[0] != '/' || path.find('\0') != std::string::npos) {
-    resolved.error = kErrBadName;
+    resolved.error = KAVO::kErrBadName;
   } else if (path.size() >= PATH_MAX) {
-    resolved.error = kErrNameTooLong;
-  } else if (!SplitPath(path, parts)) {
-    resolved.error = kErrOutsideShare;
+    resolved.error = KAVO::kErrNameTooLong;
+  } else if (!SplitUserPath(path, parts)) {
+    resolved.error = KAVO::kErrOutsideShare;
   } else if (parts.empty()) {
-    resolved.error = kErrNotFound;
+    resolved.error = KAVO::kErrNotFound;
   } else {
     resolved.share_name = parts.front();
-    resolved.error = FindShareFolder(device, user, resolved) ? 0 : kErrNotFound;
+    resolved.error = FindShareFolder(device, user, resolved) ? 0 : KAVO::kErrNotFound;
     resolved.user_path = "/" + resolved.share_name;
     resolved.real_path = resolved.share_real_path;
     resolved.user_path.reserve(path.size());
@@ -188,7 +169,7 @@ ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const st
       resolved.real_path.append("/").append(parts[part]);
     }
     if (resolved.error == 0 && resolved.real_path.size() >= PATH_MAX) {
-      resolved.error = kErrNameTooLong;
+      resolved.error = KAVO::kErrNameTooLong;
     }
   }
   return resolved;
@@ -230,7 +211,7 @@ int PathInfoFactory::create(const char* user, const std::string& path, PathInfo&
   return operation.Run([&] {
     Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), user, path);
     if (resolved.error == 0 && Device::AccessOf(resolved, user) == Device::Access::kNone) {
-      resolved.error = Device::kErrNoPrivilege;  // the user does not even see the shared folder
+      resolved.error = KAVO::kErrNoPrivilege;  // the user does not even see the shared folder
     }
     if (resolved.error != 0) {
       Device::SetLastError(resolved.error);
@@ -269,7 +250,7 @@ int LumoFullPathGet(const char* path, std::string* full_path, std::string* home_
 int IsDirUserHome(const std::string& path, const char* reserved) {
   return Operation("IsDirUserHome", path, reserved).Run([&] {
     const Device::OpenDevice& device = Device::TheDevice();
-    const Device::User* const user = device.config.FindUser(device.current_user);
+    const Device::User* const user = device.config.FindUser(Device::CurrentUser());
     return user != nullptr && Device::IsWithin(path, device.HomePath(*user)) ? 1 : 0;
   });
 }
@@ -307,7 +288,7 @@ int VolumePathParse(const char* volume_path, VolumeInfo* out) {
       }
       ++index;
     }
-    Device::SetLastError(Device::kErrNotFound);
+    Device::SetLastError(KAVO::kErrNotFound);
     return -1;
   });
 }

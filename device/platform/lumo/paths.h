@@ -8,7 +8,7 @@
 namespace Device {
 
 struct ResolvedPath {
-  int error = 0;          // a LibraryError; the rest counts when it is 0
+  int error = 0;          // a KAVO::ErrorCode; the rest counts when it is 0
   std::string user_path;  // without ".", ".." and doubled slashes
   std::string real_path;  // full path
   std::string share_name;

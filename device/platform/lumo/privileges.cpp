@@ -7,6 +7,7 @@
 
 #include "device/model/device.h"
 #include "device/platform/lumo/errors.h"
+#include "device/platform/lumo/identity.h"
 #include "device/platform/lumo/paths.h"
 #include "device/platform/operations.h"
 #include "platform/klib/system.h"
@@ -68,7 +69,7 @@ int AskKernel(const char* path, int mode) {
 int ChownToAdmins(const char* path, const std::string& name) {
   const User* const user = TheDevice().config.FindUser(name);
   if (user == nullptr) {
-    SetLastError(kErrNoUser);
+    SetLastError(KAVO::kErrNoUser);
     return -1;
   }
   // Without root there are no such users and groups, only the caller.
@@ -105,7 +106,7 @@ int ACLAccess(const char* path, int mode) {
 int LumoLibCheckEncryptShare(const std::string& path, bool* encrypted) {
   return Operation("LumoLibCheckEncryptShare", path).Run([&] {
     const Device::OpenDevice& device = Device::TheDevice();
-    const Device::ResolvedPath resolved = Device::Resolve(device, device.current_user, path);
+    const Device::ResolvedPath resolved = Device::Resolve(device, Device::CurrentUser(), path);
     if (resolved.error != 0) {
       Device::SetLastError(resolved.error);
       return 0;

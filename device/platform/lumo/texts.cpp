@@ -1,12 +1,9 @@
 // Splitting and encoding texts.
 #include <algorithm>
-#include <cctype>
-#include <cstring>
 #include <utility>
 
 #include "device/base/json_text.h"
 #include "device/platform/operations.h"
-#include "platform/klib/system.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {
@@ -88,25 +85,6 @@ std::string EncodeHtml(const std::string& text, bool encode_blanks) {
   return encoded;
 }
 
-// Each character that means something to a shell behind a backslash; a line feed, which a backslash
-// would take away, in single quotes. At the most three bytes for one.
-std::string QuoteForShell(const std::string& text) {
-  constexpr char kPlain[] = "%+,-./:=@_";
-  std::string quoted;
-  for (const char each : text) {
-    if (each == '\n') {
-      quoted += "'\n'";
-      continue;
-    }
-    const auto byte = static_cast<unsigned char>(each);
-    if (byte < 0x80 && std::isalnum(byte) == 0 && std::strchr(kPlain, each) == nullptr) {
-      quoted += '\\';
-    }
-    quoted += each;
-  }
-  return quoted;
-}
-
 }  // namespace
 }  // namespace Device
 
@@ -122,16 +100,5 @@ Json::Value StringExplodeEx(const Json::Value& value, const std::string& separat
 std::string WebUtils::EncodeHtml(const std::string& text, bool encode_blanks) {
   return Operation("WebUtils::EncodeHtml", text, encode_blanks).Run([&] {
     return Device::EncodeHtml(text, encode_blanks);
-  });
-}
-
-int KLIBCEncShParam(const char* text, char* buffer, size_t size) {
-  return Operation("KLIBCEncShParam", text, size).Run([&] {
-    const std::string quoted = Device::QuoteForShell(text);
-    if (quoted.size() >= size) {
-      return -1;
-    }
-    std::copy_n(quoted.c_str(), quoted.size() + 1, buffer);
-    return static_cast<int>(quoted.size());
   });
 }

@@ -6,11 +6,14 @@
 #include <chrono>
 #include <ctime>
 #include <functional>
+#include <map>
 #include <set>
+#include <string>
 #include <thread>
 
 #include "device/base/json_text.h"
 #include "device/model/device.h"
+#include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
 #include "device/platform/vesk/task_state.h"
 #include "device/tasks/workers.h"
@@ -68,9 +71,11 @@ void RemoveStaleTasks(const std::string& user) {
   // Read before the tasks: the worker of a task that is made meanwhile is not among them.
   const std::vector<pid_t> workers = StoreOf(user).AllWorkers();
   std::set<pid_t> named;
-  for (const TaskRow& row : StoreOf(user).AllTasks()) {
+  std::map<std::string, TaskRow> rows;
+  StoreOf(user).RefreshTasks(rows);
+  for (const auto& [id, row] : rows) {
     if (IsStale(user, row)) {
-      StoreOf(user).RemoveTask(row.id);
+      StoreOf(user).RemoveTask(id);
     } else {
       named.insert(WorkerOf(row));
     }
@@ -145,7 +150,7 @@ void CleanTimeOutTasks(const char* user) {
 int DoKill(int pid) {
   return Operation("DoKill", pid).Run([&] {
     try {
-      return Device::EndWorker(Device::TheDevice().current_user, pid) ? 1 : 0;
+      return Device::EndWorker(Device::CurrentUser(), pid) ? 1 : 0;
     } catch (const std::exception& error) {
       syslog(LOG_ERR, "kill worker: %s", error.what());
       return 0;

@@ -10,10 +10,10 @@
 
 #include "device/base/json_text.h"
 #include "device/base/random_id.h"
-#include "device/model/device.h"
+#include "device/platform/host_services.h"
 #include "device/platform/operations.h"
 #include "device/platform/vesk/task_state.h"
-#include "device/tasks/task_view.h"
+#include "device/tasks/user_tasks.h"
 
 using Device::Operation;
 
@@ -137,7 +137,7 @@ Task::Task(const char* user, const char* task_id) : state(nullptr) {
     task_state->user = user;
     task_state->row.id = task_id;
     // When nobody watches the task, the desktop is to be told of its end.
-    task_state->row.properties[kPropNotify] = Json::Value(!Device::TheDevice().is_followed);
+    task_state->row.properties[kPropNotify] = Json::Value(Device::TheHost().notifies_desktop);
     LogAndThrow("make task", [&] { Device::StoreOf(user).AddTask(task_state->row); });
     state = task_state.release();
   });
@@ -240,8 +240,8 @@ std::string TaskMgr::getUniqueTaskId(const char* prefix) {
 Task* TaskMgr::getTaskWithThrow(const char* task_id) {
   return Operation("Vesk::TaskMgr::getTaskWithThrow", task_id).Run([&] {
     std::optional<Device::TaskRow> row =
-        LogAndThrow("find task", [&] { return Device::StoreOf(state_->user).FindTask(task_id); });
-    if (!row || !Device::EndIfDead(state_->user, *row)) {
+        LogAndThrow("find task", [&] { return Device::ReadTask(state_->user, task_id); });
+    if (!row) {
       throw std::runtime_error("no task '" + std::string(task_id) + "'");
     }
     return new Task(new Task::State{state_->user, std::move(*row), false, {}});

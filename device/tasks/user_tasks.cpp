@@ -1,13 +1,15 @@
-#include "device/tasks/task_view.h"
+#include "device/tasks/user_tasks.h"
 
 #include <syslog.h>
 
+#include <algorithm>
+#include <iterator>
 #include <stdexcept>
 #include <utility>
 
 #include "device/base/json_text.h"
-#include "device/platform/lumo/errors.h"
 #include "device/tasks/workers.h"
+#include "platform/kavo/error_codes.h"
 
 namespace Device {
 
@@ -19,16 +21,11 @@ const StoredValue& Property(const TaskRow& row, const std::string& name) {
   return found == row.properties.end() ? kNone : found->second;
 }
 
-std::string StateOf(const std::string& user, const TaskRow& row) {
-  const StoredValue& data = Property(row, kPropData);
-  if (data.HasMember(kDataErrors)) {
-    return "failed";
-  }
-  if (row.finished) {
-    return "finished";
-  }
-  const Json::Value pid = data.Member(kDataPid);
-  return pid.isInt() && HasDied(user, pid.asInt()) ? kTaskDead : kTaskRunning;
+bool HasFailed(const TaskRow& row) { return Property(row, kPropData).HasMember(kDataErrors); }
+
+bool HasLostWorker(const std::string& user, const TaskRow& row) {
+  const Json::Value pid = Property(row, kPropData).Member(kDataPid);
+  return !row.finished && !HasFailed(row) && pid.isInt() && HasDied(user, pid.asInt());
 }
 
 // What the task manager noted when the task was made.
@@ -48,13 +45,10 @@ Json::Value Destination(const TaskRow& row) {
   return dest.isString() ? dest : Json::Value("");
 }
 
-bool IsDead(const std::string& user, const TaskRow& row) { return StateOf(user, row) == kTaskDead; }
-
-// In the row alone when the store has no room.
 void StoreFailure(const std::string& user, TaskRow& row) {
   Json::Value item(Json::objectValue);
   item["path"] = Destination(row);
-  item["code"] = kErrArchive;
+  item["code"] = KAVO::kErrGeneral;
   Json::Value errors(Json::arrayValue);
   errors.append(item);
   StoredValue data = Property(row, kPropData);
@@ -70,49 +64,66 @@ void StoreFailure(const std::string& user, TaskRow& row) {
   }
 }
 
-}  // namespace
-
-bool HasData(const TaskRow& row) { return Property(row, kPropData).IsObject(); }
-
-Json::Value TaskView(const std::string& user, const TaskRow& row) {
-  const StoredValue& data = Property(row, kPropData);
-  const Json::Value progress = Property(row, "progress").Value();
-  const Json::Value total_size = data.Member("total_size");
-  Json::Value view(Json::objectValue);
-  view["taskid"] = row.id;
-  view["dest_file_path"] = Destination(row);
-  view["state"] = StateOf(user, row);
-  view["progress"] = progress.isNumeric() ? progress.asDouble() : 0.0;
-  view["total_size"] = total_size.isNull() ? Json::Value(0U) : total_size;
-  view["started"] = InfoOf(row).get("started", 0);
-  if (data.HasMember(kDataErrors)) {
-    view[kDataErrors] = data.Member(kDataErrors);
-  }
-  return view;
-}
-
-bool EndIfDead(const std::string& user, TaskRow& row) {
-  if (!IsDead(user, row)) {
+// False when the task was removed meanwhile.
+bool EndIfWorkerIsLost(const std::string& user, TaskRow& row) {
+  if (!HasLostWorker(user, row)) {
     return true;
   }
   // What the worker stored last counts: it may have ended between the two looks.
   if (!StoreOf(user).RefreshTask(row)) {
     return false;
   }
-  if (IsDead(user, row)) {
+  if (HasLostWorker(user, row)) {
     StoreFailure(user, row);
   }
   return true;
 }
 
-std::vector<TaskRow> EndDeadTasks(const std::string& user) {
-  std::vector<TaskRow> rows;
-  for (TaskRow& row : StoreOf(user).AllTasks()) {
-    if (EndIfDead(user, row)) {
-      rows.push_back(std::move(row));
-    }
+}  // namespace
+
+std::optional<TaskRow> ReadTask(const std::string& user, const std::string& id) {
+  std::optional<TaskRow> row = StoreOf(user).FindTask(id);
+  return row && EndIfWorkerIsLost(user, *row) ? std::move(row) : std::nullopt;
+}
+
+void ReadTasks(const std::string& user, std::map<std::string, TaskRow>& rows) {
+  StoreOf(user).RefreshTasks(rows);
+  for (auto row = rows.begin(); row != rows.end();) {
+    row = EndIfWorkerIsLost(user, row->second) ? std::next(row) : rows.erase(row);
   }
-  return rows;
+}
+
+std::vector<TaskRow> AllTasks(const std::string& user) {
+  std::map<std::string, TaskRow> rows;
+  ReadTasks(user, rows);
+  std::vector<TaskRow> all;
+  all.reserve(rows.size());
+  for (auto& [id, row] : rows) {
+    all.push_back(std::move(row));
+  }
+  std::stable_sort(all.begin(), all.end(), [](const TaskRow& one, const TaskRow& other) {
+    return one.updated < other.updated;
+  });
+  return all;
+}
+
+bool HasData(const TaskRow& row) { return Property(row, kPropData).IsObject(); }
+
+Json::Value TaskView(const TaskRow& row) {
+  const StoredValue& data = Property(row, kPropData);
+  const Json::Value progress = Property(row, "progress").Value();
+  const Json::Value total_size = data.Member("total_size");
+  Json::Value view(Json::objectValue);
+  view["taskid"] = row.id;
+  view["dest_file_path"] = Destination(row);
+  view["state"] = HasFailed(row) ? "failed" : row.finished ? "finished" : "running";
+  view["progress"] = progress.isNumeric() ? progress.asDouble() : 0.0;
+  view["total_size"] = total_size.isNull() ? Json::Value(0U) : total_size;
+  view["started"] = InfoOf(row).get("started", 0);
+  if (HasFailed(row)) {
+    view[kDataErrors] = data.Member(kDataErrors);
+  }
+  return view;
 }
 
 }  // namespace Device

@@ -1,14 +1,19 @@
-// Groups, file attributes, the file index, and the error channel of the system library.
+// Groups, file attributes, the file index, quoting, and the error channel of the system library.
+#include "platform/klib/system.h"
+
 #include <sys/stat.h>
 #include <syslog.h>
 
+#include <algorithm>
+#include <cctype>
 #include <cerrno>
+#include <cstring>
 
 #include "device/model/device.h"
 #include "device/platform/klib/klib_error.h"
+#include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
 #include "device/tasks/task_store.h"
-#include "platform/klib/system.h"
 
 namespace Device {
 
@@ -34,13 +39,32 @@ int IsAdmin(const char* name) {
 
 int AddToIndex(const char* path) {
   try {
-    StoreOf(TheDevice().current_user).AddToIndex(path);
+    StoreOf(CurrentUser()).AddToIndex(path);
     return 0;
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "file index: %s", error.what());
     KLIB_ERROR(EIO);
     return -1;
   }
+}
+
+// Each character that means something to a shell behind a backslash; a line feed, which a backslash
+// would take away, in single quotes. At the most three bytes for one.
+std::string QuoteForShell(const std::string& text) {
+  constexpr char kPlain[] = "%+,-./:=@_";
+  std::string quoted;
+  for (const char each : text) {
+    if (each == '\n') {
+      quoted += "'\n'";
+      continue;
+    }
+    const auto byte = static_cast<unsigned char>(each);
+    if (byte < 0x80 && std::isalnum(byte) == 0 && std::strchr(kPlain, each) == nullptr) {
+      quoted += '\\';
+    }
+    quoted += each;
+  }
+  return quoted;
 }
 
 }  // namespace
@@ -78,5 +102,16 @@ int KLIBKavoIndexAdd(const char* path, int scope) {
 int KAVOFSAclChmod(const char* path, int descriptor, mode_t mode) {
   return Operation("KAVOFSAclChmod", path, descriptor, mode).Run([&] {
     return descriptor == Device::kByPath ? chmod(path, mode) : fchmod(descriptor, mode);
+  });
+}
+
+int KLIBCEncShParam(const char* text, char* buffer, size_t size) {
+  return Operation("KLIBCEncShParam", text, size).Run([&] {
+    const std::string quoted = Device::QuoteForShell(text);
+    if (quoted.size() >= size) {
+      return -1;
+    }
+    std::copy_n(quoted.c_str(), quoted.size() + 1, buffer);
+    return static_cast<int>(quoted.size());
   });
 }

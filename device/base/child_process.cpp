@@ -1,0 +1,154 @@
+#include "device/base/child_process.h"
+
+#include <fcntl.h>
+#include <sys/prctl.h>
+#include <sys/wait.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <csignal>
+#include <system_error>
+
+#include "device/base/file_descriptor.h"
+
+namespace Device {
+
+namespace {
+
+constexpr int kCannotStart = 127;
+
+[[noreturn]] void FailFor(const char* what, int error) {
+  throw std::system_error(error, std::generic_category(), what);
+}
+
+// Holds every signal back, so that no handler of the caller's runs in a child that is to become
+// another program.
+class SignalsHeldBack {
+ public:
+  SignalsHeldBack() {
+    sigset_t all;
+    sigfillset(&all);
+    sigprocmask(SIG_SETMASK, &all, &saved_);
+  }
+  ~SignalsHeldBack() { sigprocmask(SIG_SETMASK, &saved_, nullptr); }
+  SignalsHeldBack(const SignalsHeldBack&) = delete;
+  SignalsHeldBack& operator=(const SignalsHeldBack&) = delete;
+
+ private:
+  sigset_t saved_{};
+};
+
+std::vector<char*> Pointers(const std::vector<std::string>& texts) {
+  std::vector<char*> pointers;
+  pointers.reserve(texts.size() + 1);
+  for (const std::string& text : texts) {
+    pointers.push_back(const_cast<char*>(text.c_str()));
+  }
+  pointers.push_back(nullptr);
+  return pointers;
+}
+
+void ResetSignals() {
+  for (int number = 1; number < NSIG; ++number) {
+    signal(number, SIG_DFL);
+  }
+  sigset_t none;
+  sigemptyset(&none);
+  sigprocmask(SIG_SETMASK, &none, nullptr);
+}
+
+// Puts a descriptor in the place of a standard stream; -1 leaves that as it is.
+bool Redirect(int from, int to) {
+  return from < 0 || (from == to ? fcntl(to, F_SETFD, 0) : dup2(from, to)) >= 0;
+}
+
+// In the child: returns only when the program cannot run, with the reason in errno.
+void Execute(const ProgramStart& start, int input, char* const* arguments, char* const* environment,
+             pid_t parent) {
+  ResetSignals();
+  if (start.ends_with_caller) {
+    prctl(PR_SET_PDEATHSIG, SIGKILL);
+    if (getppid() != parent) {
+      raise(SIGKILL);  // the parent has ended in the moment before
+    }
+  }
+  if ((start.folder.empty() || chdir(start.folder.c_str()) == 0) && Redirect(input, STDIN_FILENO) &&
+      Redirect(start.output, STDOUT_FILENO) && Redirect(start.errors, STDERR_FILENO)) {
+    for (const int fd : start.kept) {
+      fcntl(fd, F_SETFD, 0);
+    }
+    execve(start.program.c_str(), arguments, environment);
+  }
+}
+
+}  // namespace
+
+ChildProcess ChildProcess::Start(const ProgramStart& start) {
+  Pipe failure;  // gets the error number, or just closes when the program runs
+  const FileDescriptor null(open("/dev/null", O_RDONLY | O_CLOEXEC));
+  const int input = start.input < 0 ? null.Get() : start.input;
+  const std::vector<char*> arguments = Pointers(start.arguments);
+  const std::vector<char*> variables = Pointers(start.environment);
+  char* const* const environment = start.environment.empty() ? environ : variables.data();
+  const pid_t parent = getpid();
+  ChildProcess child(0);
+  {
+    const SignalsHeldBack held_back;
+    child = Fork();
+    if (child.Pid() == 0) {
+      Execute(start, input, arguments.data(), environment, parent);
+      const int error = errno;
+      [[maybe_unused]] const ssize_t told = write(failure.writer.Get(), &error, sizeof error);
+      _exit(kCannotStart);
+    }
+  }
+  failure.writer.Close();
+  int error = 0;
+  if (read(failure.reader.Get(), &error, sizeof error) == sizeof error) {
+    FailFor(start.program.c_str(), error);
+  }
+  return child;
+}
+
+ChildProcess ChildProcess::Run(const std::function<int()>& body) {
+  ChildProcess child = Fork();
+  if (child.Pid() == 0) {
+    int status = 1;
+    try {
+      status = body();
+    } catch (const std::exception& error) {
+      syslog(LOG_ERR, "%s", error.what());
+    }
+    _exit(status);
+  }
+  return child;
+}
+
+ChildProcess ChildProcess::Fork() {
+  const pid_t pid = fork();
+  if (pid < 0) {
+    FailFor("fork", errno);
+  }
+  return ChildProcess(pid);
+}
+
+ChildProcess::~ChildProcess() {
+  if (pid_ > 0) {
+    kill(pid_, SIGKILL);
+    Wait();
+  }
+}
+
+int ChildProcess::Wait() {
+  const pid_t pid = Release();
+  int status = 0;
+  while (waitpid(pid, &status, 0) < 0) {
+    if (errno != EINTR) {
+      return -1;
+    }
+  }
+  return status;
+}
+
+}  // namespace Device

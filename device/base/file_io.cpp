@@ -1,0 +1,58 @@
+#include "device/base/file_io.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <array>
+#include <cerrno>
+#include <cstring>
+#include <stdexcept>
+
+#include "device/base/file_descriptor.h"
+
+namespace Device {
+
+std::string ReadTextFile(const std::string& path) {
+  const FileDescriptor file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
+  std::string text;
+  std::array<char, 65536> block{};
+  ssize_t got = file ? 1 : -1;
+  while (got > 0) {
+    got = read(file.Get(), block.data(), block.size());
+    text.append(block.data(), got > 0 ? static_cast<std::size_t>(got) : 0);
+  }
+  if (got < 0) {
+    throw std::runtime_error(path + ": " + std::strerror(errno));
+  }
+  return text;
+}
+
+bool WriteAll(int fd, std::string_view bytes) {
+  while (!bytes.empty()) {
+    const ssize_t written = write(fd, bytes.data(), bytes.size());
+    if (written < 0 && errno != EINTR) {
+      return false;
+    }
+    bytes.remove_prefix(written < 0 ? 0 : static_cast<std::size_t>(written));
+  }
+  return true;
+}
+
+bool ReadAll(int fd, char* to, std::size_t size) {
+  while (size > 0) {
+    const ssize_t got = read(fd, to, size);
+    if (got == 0) {
+      errno = 0;
+      return false;
+    }
+    if (got < 0 && errno != EINTR) {
+      return false;
+    }
+    const std::size_t done = got < 0 ? 0 : static_cast<std::size_t>(got);
+    to += done;
+    size -= done;
+  }
+  return true;
+}
+
+}  // namespace Device

@@ -1,0 +1,19 @@
+// Whole reads and writes.
+#pragma once
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+
+namespace Device {
+
+// A file's text. Throws std::runtime_error that names the file and the reason.
+std::string ReadTextFile(const std::string& path);
+
+// Writes all of the bytes, waiting where that takes long. False, with errno, when it cannot.
+bool WriteAll(int fd, std::string_view bytes);
+
+// Fills the buffer. False, with errno, when the input ends before (errno is 0 then) or fails.
+bool ReadAll(int fd, char* to, std::size_t size);
+
+}  // namespace Device

@@ -1,0 +1,91 @@
+// How launcher and front end talk.
+//
+// The front end sends the launcher control messages over a socket of sequenced packets (its
+// standard input): a kind, a text, and the end of a stream for the answer. Everything on that
+// stream is a frame (base/frame.h). A request goes there as a frame of JSON, {"kind", "session",
+// ...}; what comes back is an answer, made into text by who knows it and passed through to the
+// client:
+//
+//     STATUS \n
+//     NAME: VALUE \n        any number of HTTP headers
+//     \n
+//     BODY                  as the client gets it
+//
+// An answer to kKindEvents is followed by frames of server-sent events, as the client gets them.
+#pragma once
+
+#include <json/json.h>
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "device/base/file_descriptor.h"
+
+namespace Device {
+
+enum HttpStatus : int {
+  kHttpOk = 200,
+  kHttpNoContent = 204,
+  kHttpBadRequest = 400,
+  kHttpUnauthorized = 401,
+  kHttpForbidden = 403,
+  kHttpNotFound = 404,
+  kHttpTooLarge = 413,
+  kHttpNotDecoded = 415,
+  kHttpTooMany = 429,
+  kHttpInternal = 500,
+  kHttpUnavailable = 503
+};
+
+inline constexpr char kSessionCookie[] = "session";
+inline constexpr std::size_t kMostControlBytes = 8192;
+
+enum class ControlKind : char {
+  kListening = 'l',  // text: ADDRESS:PORT; no stream
+  kRequest = 'r',    // the request comes as a frame on the stream; a process of its own reads it
+  kSignIn = 'i',     // text: {"user","password"}
+  kSignOut = 'o'     // text: the session's id
+};
+
+struct ControlMessage {
+  ControlKind kind = ControlKind::kRequest;
+  std::string text;  // kMostControlBytes at most
+  FileDescriptor stream;
+};
+
+// False when the other side is gone. `stream` stays the caller's; -1 for none.
+bool SendControl(int socket, ControlKind kind, const std::string& text, int stream);
+
+// Nothing when the other side is gone, or what came is no message.
+std::optional<ControlMessage> ReceiveControl(int socket);
+
+// What a request's frame asks for, by its "kind"; beside it "session" and what the kind needs.
+inline constexpr char kKindCall[] = "call";  // "api", "version", "method", "params", "followed"
+inline constexpr char kKindSession[] = "session";  // who is signed in
+inline constexpr char kKindFiles[] = "files";      // "path"
+inline constexpr char kKindTasks[] = "tasks";
+inline constexpr char kKindEvents[] = "events";
+inline constexpr char kKindCodes[] = "codes";  // no session needed
+
+struct Answer {
+  // Body in JSON, a line in UTF-8; none for null.
+  explicit Answer(int status, const Json::Value& json = {});
+
+  int status;
+  std::vector<std::pair<std::string, std::string>> headers;
+  std::string body;
+};
+
+// An answer {"error": reason}.
+Answer Refusal(int status, const std::string& reason);
+
+// False when the other side is gone.
+bool SendAnswer(int stream, const Answer& answer);
+
+// Nothing when the other side is gone without an answer.
+std::optional<Answer> ReceiveAnswer(int stream);
+
+}  // namespace Device

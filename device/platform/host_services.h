@@ -1,0 +1,25 @@
+// What the libraries leave to the host that a process belongs to. The host fills it in before the
+// first request; without it no session is a living one.
+#pragma once
+
+#include <functional>
+#include <string>
+
+namespace Device {
+
+struct HostServices {
+  // True if the session is a living one of that user.
+  std::function<bool(const std::string& session_id, const std::string& user)> has_session =
+      [](const std::string&, const std::string&) { return false; };
+  // Called in a worker's process when it has been forked: lets go of what belongs to the request.
+  std::function<void()> leave_request = [] {};
+  // Whether the desktop is to be told of the end of the tasks that the process makes.
+  bool notifies_desktop = true;
+};
+
+inline HostServices& TheHost() {
+  static HostServices services;
+  return services;
+}
+
+}  // namespace Device

@@ -1,0 +1,37 @@
+// A user's tasks as clients see them. To be used with the user's identity.
+//
+// Whoever reads tasks does so here, and here alone a worker's death is noticed: a task whose worker
+// went without an outcome gets the one that it could not store, a single error item, the
+// destination with the code of a general failure. Where the store has no room for it, the row has
+// it alone.
+#pragma once
+
+#include <json/json.h>
+
+#include <map>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "device/tasks/task_store.h"
+
+namespace Device {
+
+// Nothing when the user has no such task. Throws std::runtime_error, as the store does.
+std::optional<TaskRow> ReadTask(const std::string& user, const std::string& id);
+
+// Brings the rows, by id, up to date: new ones come, and those that are gone go. Throws
+// std::runtime_error.
+void ReadTasks(const std::string& user, std::map<std::string, TaskRow>& rows);
+
+// All of the user's tasks, the one that changed last at the end. Throws std::runtime_error.
+std::vector<TaskRow> AllTasks(const std::string& user);
+
+// False for a moment, until "start" has stored what the task is about.
+bool HasData(const TaskRow& row);
+
+// "taskid", "dest_file_path", "state" ("running", "finished" or "failed"), "progress" (0 to 1),
+// "total_size" (bytes), "started" (seconds since 1970) and, of a failed one, "errors". No password.
+Json::Value TaskView(const TaskRow& row);
+
+}  // namespace Device
