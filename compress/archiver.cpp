@@ -13,6 +13,7 @@
 #include <new>
 
 #include "compress/KAVO.Zantro.Compress.h"
+#include "compress/archiver_output.h"
 #include "compress/task_record.h"
 #include "platform/kavo/error_codes.h"
 #include "platform/klib/system.h"
@@ -101,66 +102,53 @@ struct LineBuffer {
   std::size_t size = 0;
 };
 
-}  // namespace
-
-bool ZantroCompressHandler::LumoCompressFiles(const _tag_CompressInfo_& info, const char* user) {
-  char archive_path[kArchivePathSize] = {};
-  ArgumentVector arguments;
-  std::unique_ptr<FILE, StreamCloser> output;
-  bool succeeded = false;
-
-  if (PrepareArchiver(info, user, archive_path)) {
-    AddArguments(info, archive_path, arguments);
-    output.reset(KLIBCPopenv(kArchiverProgram, "r", arguments.Get(), 0));
-    if (output == nullptr) {
-      syslog(LOG_ERR, "%s:%d KLIBCPopenv failed", kLogSource, __LINE__);
-      SetErrItem(info.dest_path, KAVO::kErrGeneral);
-    } else if (FollowArchiver(info, output.get())) {
-      SetArchiveMode(archive_path);
-      succeeded = true;
-    }
-  }
-  if (access(archive_path, F_OK) == 0) {
-    SetArchiveOwner(archive_path, user, info.dest_path);
-    KLIBKavoIndexAdd(archive_path, kIndexSingleFile);
-  }
-  output.reset();
-  if (!info.list_file.empty()) {
-    unlink(info.list_file.c_str());
-  }
-  return succeeded;
-}
-
 // Fills in the archive's full path and goes to the directory that the list is relative to.
-bool ZantroCompressHandler::PrepareArchiver(const _tag_CompressInfo_& info, const char* user,
-                                            char* archive_path) {
+bool PrepareArchiver(ZantroCompressHandler& handler, const _tag_CompressInfo_& info,
+                     const char* user, char* archive_path) {
   PathInfo archive;
   if (PathInfoFactory::create(user, info.dest_path, archive) == 0) {
     syslog(LOG_ERR, "%s:%d Failed to get path info:%s, reason=[%X]", kLogSource, __LINE__,
            info.dest_path.c_str(), static_cast<unsigned int>(LumoLibGetErr()));
-    SetErrItem(info.dest_path, LumoLibGetErr());
+    handler.SetErrItem(info.dest_path, LumoLibGetErr());
     return false;
   }
   VolumeInfo volume = {};
   if (VolumePathParse(archive.volume_path.c_str(), &volume) < 0) {
     syslog(LOG_ERR, "%s:%d Failed to get volume info, %s", kLogSource, __LINE__,
            archive.volume_path.c_str());
-    SetErrItem(archive.volume_path, KAVO::kErrGeneral);
+    handler.SetErrItem(archive.volume_path, KAVO::kErrGeneral);
     return false;
   }
   if (chdir(info.work_dir.c_str()) == -1) {
     const int error = errno;
     syslog(LOG_ERR, "%s:%d Failed to chdir, reason=%s(%d)", kLogSource, __LINE__,
            std::strerror(error), error);
-    SetErrItem(info.work_dir, LumoParseErrnoToError(error, nullptr, nullptr));
+    handler.SetErrItem(info.work_dir, LumoParseErrnoToError(error, nullptr, nullptr));
     return false;
   }
   std::snprintf(archive_path, kArchivePathSize, "%s", archive.real_path.c_str());
   return true;
 }
 
+void RecordArchiverError(ZantroCompressHandler& handler, ArchiverError error, const char* line,
+                         const std::string& dest_path) {
+  switch (error) {
+    case ArchiverError::kNoSpace:
+      return handler.SetErrItem(dest_path, KAVO::kErrNoSpace);
+    case ArchiverError::kQuota:
+      return handler.SetErrItem(dest_path, KAVO::kErrQuota);
+    case ArchiverError::kReadOnly:
+      return handler.SetErrItem(dest_path, KAVO::kErrReadOnly);
+    case ArchiverError::kNameTooLong:
+      return handler.SetErrItem(dest_path, NameTooLongCode(dest_path));
+    case ArchiverError::kUnknown:
+      syslog(LOG_ERR, "%s:%d %s", kLogSource, __LINE__, line);
+      return handler.SetErrItem(dest_path, KAVO::kErrGeneral);
+  }
+}
+
 // Reads to the end of the output, or to the first error line. A read error counts as the end.
-bool ZantroCompressHandler::FollowArchiver(const _tag_CompressInfo_& info, FILE* output) {
+bool FollowArchiver(ZantroCompressHandler& handler, const _tag_CompressInfo_& info, FILE* output) {
   std::string current_file;
   std::uint64_t total_size = 0;
   LineBuffer line;
@@ -179,7 +167,7 @@ bool ZantroCompressHandler::FollowArchiver(const _tag_CompressInfo_& info, FILE*
         WriteTaskProgress(current_file, event.progress, total_size);
         break;
       case ArchiverEvent::kError:
-        RecordArchiverError(event.error, line.text, info.dest_path);
+        RecordArchiverError(handler, event.error, line.text, info.dest_path);
         return false;
       case ArchiverEvent::kOther:
         break;
@@ -188,28 +176,11 @@ bool ZantroCompressHandler::FollowArchiver(const _tag_CompressInfo_& info, FILE*
   return true;
 }
 
-void ZantroCompressHandler::RecordArchiverError(ArchiverError error, const char* line,
-                                                const std::string& dest_path) {
-  switch (error) {
-    case ArchiverError::kNoSpace:
-      return SetErrItem(dest_path, KAVO::kErrNoSpace);
-    case ArchiverError::kQuota:
-      return SetErrItem(dest_path, KAVO::kErrQuota);
-    case ArchiverError::kReadOnly:
-      return SetErrItem(dest_path, KAVO::kErrReadOnly);
-    case ArchiverError::kNameTooLong:
-      return SetErrItem(dest_path, NameTooLongCode(dest_path));
-    case ArchiverError::kUnknown:
-      syslog(LOG_ERR, "%s:%d %s", kLogSource, __LINE__, line);
-      return SetErrItem(dest_path, KAVO::kErrGeneral);
-  }
-}
-
-void ZantroCompressHandler::SetArchiveMode(const char* archive_path) const {
+void SetArchiveMode(const char* archive_path, std::uint32_t saved_umask) {
   const mode_t mode =
       saved_umask == kNoSavedMask ? ~LumoLibGetUmask() & kArchiveMode : kArchiveMode;
   if (KAVOFSAclChmod(archive_path, kByPath, mode) < 0) {
-    // The text says 777 whatever the mode; deliberate.
+    // The text says 777 whatever the mode, for those who search logs for it.
     syslog(LOG_ERR, "%s:%d failed to ACL chmod '%s' to 777, errno: %m", kLogSource, __LINE__,
            archive_path);
   }
@@ -217,8 +188,8 @@ void ZantroCompressHandler::SetArchiveMode(const char* archive_path) const {
 
 // An administrator's archive goes to the administrators' group. What fails here leaves an item but
 // no failed job.
-void ZantroCompressHandler::SetArchiveOwner(const char* archive_path, const char* user,
-                                            const std::string& dest_path) {
+void SetArchiveOwner(ZantroCompressHandler& handler, const char* archive_path, const char* user,
+                     const std::string& dest_path) {
   const int is_admin = KLIBGroupIsAdminGroupMem(user, 0);
   if (is_admin == -1) {
     const auto error = static_cast<unsigned int>(KLIBCErrGet());
@@ -226,11 +197,37 @@ void ZantroCompressHandler::SetArchiveOwner(const char* archive_path, const char
     const int line = KLIBCErrorGetLine();
     syslog(LOG_ERR, "%s:%d KLIBGroupIsAdminGroupMem(%s) failed. [0x%04X %s:%d]", kLogSource,
            __LINE__, user, error, file, line);
-    SetErrItem(dest_path, KAVO::kErrSystem);
+    handler.SetErrItem(dest_path, KAVO::kErrSystem);
   } else if (is_admin == 1 && LumoLibChown2Admin(archive_path, user) != 0) {
     syslog(LOG_ERR, "%s:%d LumoLibChown2Admin fail", kLogSource, __LINE__);
-    SetErrItem(dest_path, KAVO::kErrSystem);
+    handler.SetErrItem(dest_path, KAVO::kErrSystem);
   }
+}
+
+}  // namespace
+
+bool ZantroCompressHandler::LumoCompressFiles(const _tag_CompressInfo_& info, const char* user) {
+  char archive_path[kArchivePathSize] = {};
+  ArgumentVector arguments;
+  std::unique_ptr<FILE, StreamCloser> output;
+  bool succeeded = false;
+
+  if (PrepareArchiver(*this, info, user, archive_path)) {
+    AddArguments(info, archive_path, arguments);
+    output.reset(KLIBCPopenv(kArchiverProgram, "r", arguments.Get(), 0));
+    if (output == nullptr) {
+      syslog(LOG_ERR, "%s:%d KLIBCPopenv failed", kLogSource, __LINE__);
+      SetErrItem(info.dest_path, KAVO::kErrGeneral);
+    } else if (FollowArchiver(*this, info, output.get())) {
+      SetArchiveMode(archive_path, saved_umask);
+      succeeded = true;
+    }
+  }
+  if (access(archive_path, F_OK) == 0) {
+    SetArchiveOwner(*this, archive_path, user, info.dest_path);
+    KLIBKavoIndexAdd(archive_path, kIndexSingleFile);
+  }
+  return succeeded;  // the list file goes next, with its owner
 }
 
 std::string ZantroCompressHandler::LumoEscape(const char* text) {

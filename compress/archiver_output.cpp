@@ -1,6 +1,5 @@
 #include "compress/archiver_output.h"
 
-#include <algorithm>
 #include <cstdlib>
 
 namespace Zantro {
@@ -24,9 +23,9 @@ constexpr ErrorText kErrorTexts[] = {
     {"File name too long", ArchiverError::kNameTooLong},
 };
 
-// What stands behind the prefix, null when the line does not begin with it.
+// What follows the prefix, null when the line does not begin with it.
 template <std::size_t kSize>
-const char* Behind(std::string_view line, const char (&prefix)[kSize]) {
+const char* AfterPrefix(std::string_view line, const char (&prefix)[kSize]) {
   constexpr std::size_t kLength = kSize - 1;
   return line.compare(0, kLength, prefix) == 0 ? line.data() + kLength : nullptr;
 }
@@ -45,16 +44,16 @@ ArchiverError FindError(std::string_view line) {
 ArchiverEvent ParseArchiverLine(std::string_view line) {
   constexpr int kDecimal = 10;
   ArchiverEvent event;
-  if (const char* size = Behind(line, kTotalPrefix)) {
+  if (const char* size = AfterPrefix(line, kTotalPrefix)) {
     event.kind = ArchiverEvent::kTotal;
     event.total_size = static_cast<std::uint64_t>(std::strtoll(size, nullptr, kDecimal));
-  } else if (Behind(line, kFilePrefix) != nullptr) {
+  } else if (AfterPrefix(line, kFilePrefix) != nullptr) {
     event.kind = ArchiverEvent::kFile;
-    const std::string_view name = line.substr(sizeof(kFilePrefix) - 1);
-    const std::string end(name.substr(name.length() - std::min<std::size_t>(name.length(), 1)));
-    // The last character alone, the line feed; deliberate. Without one this throws.
-    event.file = end.substr(end.length() - 1);
-  } else if (const char* percent = Behind(line, kProgressPrefix)) {
+    const std::string name(line.substr(sizeof(kFilePrefix) - 1));
+    // The last character alone, the line feed, which is all that the task's readers know. Without
+    // one this throws.
+    event.file = name.substr(name.length() - 1);
+  } else if (const char* percent = AfterPrefix(line, kProgressPrefix)) {
     event.kind = ArchiverEvent::kProgress;
     event.progress = static_cast<float>(std::strtol(percent, nullptr, kDecimal)) / 100.0F;
   } else if (line.find(kErrorMark) != std::string::npos) {

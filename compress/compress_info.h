@@ -9,6 +9,13 @@
 
 namespace Zantro {
 
+// What "start" has made of the request before it forks; the worker inherits it.
+struct StartParameters {
+  std::string dest;                       // user path of the archive, without slashes at its end
+  std::string codepage;                   // may be empty
+  std::vector<std::string> source_paths;  // at least one
+};
+
 // The order of the fields is part of the design: later ones are released first.
 struct _tag_CompressInfo_ {    // NOLINT: the device's name
   bool is7z;                   // format "7z", otherwise zip; set by archive_options, not before

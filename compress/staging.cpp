@@ -59,6 +59,84 @@ void RemoveStagingDirectory(const char* directory) {
   }
 }
 
+void RefuseSource(ZantroCompressHandler& handler, const PathInfo& source) {
+  syslog(LOG_ERR, "%s:%d Name is too long for tempzip or holds a line feed: %s", kLogSource,
+         __LINE__, source.share_path.c_str());
+  handler.SetErrItem(source.share_path, KAVO::kErrGeneral);
+}
+
+// `list_file` is a template of mkstemp's and is filled in.
+bool WriteList(ZantroCompressHandler& handler, const _tag_CompressInfo_& info,
+               const std::string& parent, char* list_file) {
+  const FileDescriptor list(mkstemp(list_file));
+  if (list.Get() == -1) {
+    syslog(LOG_ERR, "%s:%d Failed to mkstemp %s", kLogSource, __LINE__, kTempTemplate);
+    handler.SetErrItem(info.dest_path, KAVO::kErrGeneral);
+    return false;
+  }
+  for (const PathInfo& source : info.path_infos) {
+    // All of the parent but its "/", which begins the name. Throws out_of_range when the source
+    // does not lie below the parent.
+    const ListLine<kListLineSize> line(source.real_path.substr(parent.size() - 1));
+    if (!line.IsExpressible()) {
+      RefuseSource(handler, source);
+      return false;
+    }
+    if (!WriteLine(list.Get(), line)) {
+      syslog(LOG_ERR, "%s:%d Failed to write %s to tempzip", kLogSource, __LINE__, line.Text());
+      handler.SetErrItem(info.dest_path, KAVO::kErrGeneral);
+      return false;
+    }
+  }
+  return true;
+}
+
+// Links the source's shared folder into the current directory, once for all of its sources.
+bool LinkShare(ZantroCompressHandler& handler, const PathInfo& source) {
+  const char* const target = source.share_real_path.c_str();
+  const char* const link = source.share_name.c_str();
+  struct stat status {};
+  if (lstat(link, &status) == 0 || symlink(target, link) == 0) {
+    return true;
+  }
+  const int error = errno;
+  syslog(LOG_ERR, "%s:%d Failed to link the file from %s to %s.", kLogSource, __LINE__, target,
+         link);
+  handler.SetErrItem(source.share_real_path, LumoParseErrnoToError(error, nullptr, nullptr));
+  return false;
+}
+
+bool FillStagingDirectory(ZantroCompressHandler& handler, const _tag_CompressInfo_& info,
+                          const char* directory, char* list_file) {
+  if (chdir(directory) != 0) {
+    syslog(LOG_ERR, "%s:%d Failed to chdir %s.", kLogSource, __LINE__, directory);
+    handler.SetErrItem(info.dest_path, KAVO::kErrGeneral);
+    return false;
+  }
+  const FileDescriptor list(mkstemp(list_file));
+  if (list.Get() < 0) {
+    syslog(LOG_ERR, "%s:%d Failed to create a temp file.", kLogSource, __LINE__);
+    handler.SetErrItem(info.dest_path, KAVO::kErrGeneral);
+    return false;
+  }
+  for (const PathInfo& source : info.path_infos) {
+    if (!LinkShare(handler, source)) {
+      return false;
+    }
+    const ListLine<kStagedListLineSize> line(source.share_path);
+    if (!line.IsExpressible()) {
+      RefuseSource(handler, source);
+      return false;
+    }
+    if (!WriteLine(list.Get(), line)) {
+      syslog(LOG_ERR, "%s:%d Failed to write tempzip", kLogSource, __LINE__);
+      handler.SetErrItem(info.dest_path, KAVO::kErrGeneral);
+      return false;
+    }
+  }
+  return true;
+}
+
 }  // namespace
 
 bool ZantroCompressHandler::SaveZipFileListToTmp(_tag_CompressInfo_& info) {
@@ -74,37 +152,12 @@ bool ZantroCompressHandler::SaveZipFileListToTmp(_tag_CompressInfo_& info) {
 
 bool ZantroCompressHandler::GenerateZipList(_tag_CompressInfo_& info, const std::string& parent) {
   std::string list_file = kTempTemplate;
-  if (!WriteList(info, parent, list_file.data())) {
+  if (!WriteList(*this, info, parent, list_file.data())) {
     unlink(list_file.c_str());
     return false;
   }
   info.work_dir = parent;
   info.list_file = list_file;
-  return true;
-}
-
-bool ZantroCompressHandler::WriteList(const _tag_CompressInfo_& info, const std::string& parent,
-                                      char* list_file) {
-  const FileDescriptor list(mkstemp(list_file));
-  if (list.Get() == -1) {
-    syslog(LOG_ERR, "%s:%d Failed to mkstemp %s", kLogSource, __LINE__, kTempTemplate);
-    SetErrItem(info.dest_path, KAVO::kErrGeneral);
-    return false;
-  }
-  for (const PathInfo& source : info.path_infos) {
-    // All of the parent but its "/", which begins the name. Throws out_of_range when the source
-    // does not lie below the parent.
-    const ListLine<kListLineSize> line(source.real_path.substr(parent.size() - 1));
-    if (!line.IsExpressible()) {
-      RefuseSource(source);
-      return false;
-    }
-    if (!WriteLine(list.Get(), line)) {
-      syslog(LOG_ERR, "%s:%d Failed to write %s to tempzip", kLogSource, __LINE__, line.Text());
-      SetErrItem(info.dest_path, KAVO::kErrGeneral);
-      return false;
-    }
-  }
   return true;
 }
 
@@ -117,65 +170,13 @@ bool ZantroCompressHandler::GenerateZipListWithShare(_tag_CompressInfo_& info) {
     return false;
   }
   char list_file[] = "lumozipXXXXXX";
-  if (!FillStagingDirectory(info, directory.c_str(), list_file)) {
+  if (!FillStagingDirectory(*this, info, directory.c_str(), list_file)) {
     RemoveStagingDirectory(directory.c_str());
     return false;
   }
   info.work_dir = directory;
   info.list_file = directory + "/" + list_file;
   return true;
-}
-
-bool ZantroCompressHandler::FillStagingDirectory(const _tag_CompressInfo_& info,
-                                                 const char* directory, char* list_file) {
-  if (chdir(directory) != 0) {
-    syslog(LOG_ERR, "%s:%d Failed to chdir %s.", kLogSource, __LINE__, directory);
-    SetErrItem(info.dest_path, KAVO::kErrGeneral);
-    return false;
-  }
-  const FileDescriptor list(mkstemp(list_file));
-  if (list.Get() < 0) {
-    syslog(LOG_ERR, "%s:%d Failed to create a temp file.", kLogSource, __LINE__);
-    SetErrItem(info.dest_path, KAVO::kErrGeneral);
-    return false;
-  }
-  for (const PathInfo& source : info.path_infos) {
-    if (!LinkShare(source)) {
-      return false;
-    }
-    const ListLine<kStagedListLineSize> line(source.share_path);
-    if (!line.IsExpressible()) {
-      RefuseSource(source);
-      return false;
-    }
-    if (!WriteLine(list.Get(), line)) {
-      syslog(LOG_ERR, "%s:%d Failed to write tempzip", kLogSource, __LINE__);
-      SetErrItem(info.dest_path, KAVO::kErrGeneral);
-      return false;
-    }
-  }
-  return true;
-}
-
-// Links the source's shared folder into the current directory, once for all of its sources.
-bool ZantroCompressHandler::LinkShare(const PathInfo& source) {
-  const char* const target = source.share_real_path.c_str();
-  const char* const link = source.share_name.c_str();
-  struct stat status {};
-  if (lstat(link, &status) == 0 || symlink(target, link) == 0) {
-    return true;
-  }
-  const int error = errno;
-  syslog(LOG_ERR, "%s:%d Failed to link the file from %s to %s.", kLogSource, __LINE__, target,
-         link);
-  SetErrItem(source.share_real_path, LumoParseErrnoToError(error, nullptr, nullptr));
-  return false;
-}
-
-void ZantroCompressHandler::RefuseSource(const PathInfo& source) {
-  syslog(LOG_ERR, "%s:%d Name is too long for tempzip or holds a line feed: %s", kLogSource,
-         __LINE__, source.share_path.c_str());
-  SetErrItem(source.share_path, KAVO::kErrGeneral);
 }
 
 }  // namespace Zantro

@@ -24,58 +24,15 @@ constexpr std::size_t kArchiveNameMax = 255;  // bytes
 constexpr const char* kParamsStoredRaw[] = {kParamLevel, kParamMode, kParamFormat, kParamPassword,
                                             kParamCodepage};
 
-}  // namespace
-
-void ZantroCompressHandler::LumoCompressHandler() {
-  Vesk::TaskMgr task_manager(login_user.c_str());
-  StartParameters start;
-  _tag_CompressInfo_ info;
-  KavoSettings settings(login_user.c_str());
-
-  if (!ReadStartParameters(settings, start)) {
-    return;
-  }
-  if (!CreateTask(task_manager)) {
-    return;
-  }
-  const pid_t worker = KLIBCProcFork();
-  if (worker < 0) {
-    pTask->remove();
-    syslog(LOG_ERR, "%s:%d Failed to fork().", kLogSource, __LINE__);
-    SetError(KAVO::kErrGeneral);
-    return;
-  }
-  if (worker == 0) {
-    RunWorker(start, info);
-  }
-  StoreNewTask(worker);
+// A list parameter as an array of texts.
+Json::Value ExplodeParam(const KAVO::APIRequest& request, const char* name,
+                         const Json::Value& fallback) {
+  const Json::Value value = request.GetParam(name, fallback);
+  return StringExplodeEx(value, kListSeparator, request.GetAPIVersion(), false);
 }
 
-bool ZantroCompressHandler::ReadStartParameters(KavoSettings& settings, StartParameters& start) {
-  if (!request->HasParam(kParamPath) || !request->HasParam(kParamDest)) {
-    syslog(LOG_ERR, "%s:%d Bad parameter", kLogSource, __LINE__);
-    SetError(KAVO::kErrBadParameter);
-    return false;
-  }
-  start.codepage = SettleCodepage(settings);
-  const Json::Value source_list = ExplodeParam(kParamPath, "");
-  if (source_list.empty()) {
-    syslog(LOG_ERR, "%s:%d Bad parameter: no input source file", kLogSource, __LINE__);
-    SetError(KAVO::kErrBadParameter);
-    return false;
-  }
-  if (!ReadDestination(start)) {
-    return false;
-  }
-  start.source_paths.reserve(source_list.size());
-  for (const Json::Value& source : source_list) {
-    start.source_paths.push_back(source.asString());
-  }
-  return true;
-}
-
-std::string ZantroCompressHandler::SettleCodepage(KavoSettings& settings) const {
-  std::string codepage = request->GetParam(kParamCodepage, "").asString();
+std::string SettleCodepage(const KAVO::APIRequest& request, KavoSettings& settings) {
+  std::string codepage = request.GetParam(kParamCodepage, "").asString();
   if (codepage.empty()) {
     Json::Value user_settings(Json::objectValue);
     settings.loadUserJsonSettings(user_settings);
@@ -86,68 +43,81 @@ std::string ZantroCompressHandler::SettleCodepage(KavoSettings& settings) const 
   return codepage;
 }
 
-bool ZantroCompressHandler::ReadDestination(StartParameters& start) {
-  const Json::Value destinations = ExplodeParam(kParamDest, "");
+// 0, or the error code.
+int ReadDestination(const KAVO::APIRequest& request, std::string& dest) {
+  const Json::Value destinations = ExplodeParam(request, kParamDest, "");
   if (destinations.size() != 1) {
     syslog(LOG_ERR, "%s:%d Bad parameter: Should not specify more than one detination path",
            kLogSource, __LINE__);
-    SetError(KAVO::kErrBadParameter);
-    return false;
+    return KAVO::kErrBadParameter;
   }
-  start.dest = destinations[0].asString();
+  dest = destinations[0].asString();
   // basename cuts slashes at the end in place; deliberate, the worker is to see the text without
   // them too.
-  char* name = basename(start.dest.data());
+  char* const name = basename(dest.data());
   if (name == nullptr) {
     syslog(LOG_ERR, "%s:%d Bad parameter: no archive name", kLogSource, __LINE__);
-    SetError(KAVO::kErrBadParameter);
-    return false;
+    return KAVO::kErrBadParameter;
   }
   if (std::strlen(basename(name)) > kArchiveNameMax) {
     syslog(LOG_ERR, "%s:%d Bad parameter: Compress zipname too long", kLogSource, __LINE__);
-    SetError(KAVO::kErrArchiveNameTooLong);
-    return false;
+    return KAVO::kErrArchiveNameTooLong;
   }
-  start.dest.resize(std::strlen(start.dest.c_str()));
-  return true;
+  dest.resize(std::strlen(dest.c_str()));
+  return 0;
 }
 
-// A list parameter as an array of texts.
-Json::Value ZantroCompressHandler::ExplodeParam(const char* name,
-                                                const Json::Value& fallback) const {
-  const Json::Value value = request->GetParam(name, fallback);
-  return StringExplodeEx(value, kListSeparator, request->GetAPIVersion(), false);
+// 0, or the error code.
+int ReadStartParameters(const KAVO::APIRequest& request, KavoSettings& settings,
+                        StartParameters& start) {
+  if (!request.HasParam(kParamPath) || !request.HasParam(kParamDest)) {
+    syslog(LOG_ERR, "%s:%d Bad parameter", kLogSource, __LINE__);
+    return KAVO::kErrBadParameter;
+  }
+  start.codepage = SettleCodepage(request, settings);
+  const Json::Value source_list = ExplodeParam(request, kParamPath, "");
+  if (source_list.empty()) {
+    syslog(LOG_ERR, "%s:%d Bad parameter: no input source file", kLogSource, __LINE__);
+    return KAVO::kErrBadParameter;
+  }
+  if (const int error = ReadDestination(request, start.dest)) {
+    return error;
+  }
+  start.source_paths.reserve(source_list.size());
+  for (const Json::Value& source : source_list) {
+    start.source_paths.push_back(source.asString());
+  }
+  return 0;
 }
 
-bool ZantroCompressHandler::CreateTask(Vesk::TaskMgr& task_manager) {
+// Null when the task cannot be made.
+Vesk::Task* MakeTask(Vesk::TaskMgr& task_manager, const std::string& user) {
   try {
     const std::string task_id = task_manager.getUniqueTaskId(kTaskIdPrefix);
-    pTask = new Vesk::Task(login_user.c_str(), task_id.c_str());
-    return true;
+    return new Vesk::Task(user.c_str(), task_id.c_str());
   } catch (...) {
-    SetError(KAVO::kErrSystem);
-    return false;
+    return nullptr;
   }
 }
 
-Json::Value ZantroCompressHandler::MakeTaskData(pid_t worker) const {
+Json::Value MakeTaskData(const KAVO::APIRequest& request, pid_t worker) {
   Json::Value data(Json::objectValue);
-  data[kDataApi] = request->GetAPIClass();
-  data[kDataMethod] = request->GetAPIMethod();
-  data[kDataVersion] = request->GetAPIVersion();
+  data[kDataApi] = request.GetAPIClass();
+  data[kDataMethod] = request.GetAPIMethod();
+  data[kDataVersion] = request.GetAPIVersion();
   data[kDataTaskId] = pTask->getTaskId();
   data[kDataPid] = worker;
   Json::Value& params = data[kDataParams] = Json::Value(Json::objectValue);
-  if (request->HasParam(kParamPath)) {
-    params[kParamPath] = ExplodeParam(kParamPath, Json::Value());
+  if (request.HasParam(kParamPath)) {
+    params[kParamPath] = ExplodeParam(request, kParamPath, Json::Value());
   }
-  if (request->HasParam(kParamDest)) {
-    params[kParamDest] = ExplodeParam(kParamDest, Json::Value())[0];
+  if (request.HasParam(kParamDest)) {
+    params[kParamDest] = ExplodeParam(request, kParamDest, Json::Value())[0];
   }
   for (const char* name : kParamsStoredRaw) {
-    if (request->HasParam(name)) {
-      // The password as well: deliberately as it was given.
-      params[name] = request->GetParam(name, Json::Value());
+    if (request.HasParam(name)) {
+      // The password as well: deliberately as it was given, for the task's readers.
+      params[name] = request.GetParam(name, Json::Value());
     }
   }
   // The member comes first, so that the data handed over already holds it, as null.
@@ -156,18 +126,49 @@ Json::Value ZantroCompressHandler::MakeTaskData(pid_t worker) const {
   return data;
 }
 
-void ZantroCompressHandler::StoreNewTask(pid_t worker) {
-  const Json::Value data = MakeTaskData(worker);
+// False when the task is not stored.
+bool StoreNewTask(const Json::Value& data) {
   pTask->beginUpdate();
   pTask->setProperty(kPropProgress, 0);
   if (!pTask->setProperty(kPropData, data)) {
     syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
   }
   if (!pTask->endUpdate()) {
-    // The worker runs on, deliberately; it makes the archive but has no data to report in.
     syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
-    SetError(KAVO::kErrGeneral);
-    return;
+    return false;
+  }
+  return true;
+}
+
+}  // namespace
+
+void ZantroCompressHandler::LumoCompressHandler() {
+  Vesk::TaskMgr task_manager(login_user.c_str());
+  StartParameters start;
+  _tag_CompressInfo_ info;
+  KavoSettings settings(login_user.c_str());
+
+  if (const int error = ReadStartParameters(*request, settings, start)) {
+    return SetError(error);
+  }
+  Vesk::Task* const task = MakeTask(task_manager, login_user);
+  if (task == nullptr) {
+    return SetError(KAVO::kErrSystem);
+  }
+  pTask = task;
+  const pid_t worker = KLIBCProcFork();
+  if (worker < 0) {
+    pTask->remove();
+    syslog(LOG_ERR, "%s:%d Failed to fork().", kLogSource, __LINE__);
+    return SetError(KAVO::kErrGeneral);
+  }
+  if (worker == 0) {
+    RunWorker(start, info);
+  }
+  if (!StoreNewTask(MakeTaskData(*request, worker))) {
+    // The worker runs on, as whoever signals it would stop an archive that may become whole; it has
+    // no data to report in.
+    return SetError(KAVO::kErrGeneral);
   }
   Json::Value answer(Json::objectValue);
   answer[kParamTaskId] = pTask->getTaskId();

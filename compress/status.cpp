@@ -37,43 +37,51 @@ Json::Value MakeAnswer(const Json::Value& data) {
   return answer;
 }
 
+struct Status {
+  int error = 0;
+  Json::Value answer;  // when there is no error
+  Json::Value data;    // of the task; null when there is none
+};
+
+// Leaves the task, if there is one, in pTask.
+Status ReadStatus(const KAVO::APIRequest& request, const std::string& user,
+                  std::optional<Vesk::TaskMgr>& task_manager) {
+  if (!request.HasParam(kParamTaskId)) {
+    return {KAVO::kErrBadParameter, {}, {}};
+  }
+  task_manager.emplace(user.c_str());
+  const std::string task_id = request.GetParam(kParamTaskId, "").asString();
+  try {
+    pTask = task_manager->getTaskWithThrow(task_id.c_str());
+  } catch (...) {
+    return {KAVO::kErrNoTask, {}, {}};
+  }
+  const Json::Value data = pTask->getProperty(kPropData);
+  if (data.isNull()) {
+    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
+    return {KAVO::kErrSystem, {}, {}};
+  }
+  return {0, MakeAnswer(data), data};
+}
+
 }  // namespace
 
 void ZantroCompressHandler::LumoProgressHandler() {
   std::optional<Vesk::TaskMgr> task_manager;  // outlives the removal
-  // The removal is asked for on every path, deliberately: after an error there may be no task, and
-  // the call takes null.
-  Json::Value data;
+  // The removal is asked for on every path, also where there is no task: the call takes null.
+  Status status;
   try {
-    data = ReportProgress(task_manager);
+    status = ReadStatus(*request, login_user, task_manager);
   } catch (...) {
     LumoLibRemoveFinishedTask(pTask, kNoProcess, false);
     throw;
   }
-  LumoLibRemoveFinishedTask(pTask, WorkerOf(data), false);
-}
-
-Json::Value ZantroCompressHandler::ReportProgress(std::optional<Vesk::TaskMgr>& task_manager) {
-  if (!request->HasParam(kParamTaskId)) {
-    SetError(KAVO::kErrBadParameter);
-    return {};
+  if (status.error != 0) {
+    SetError(status.error);
+  } else {
+    SetResponse(status.answer);
   }
-  task_manager.emplace(login_user.c_str());
-  const std::string task_id = request->GetParam(kParamTaskId, "").asString();
-  try {
-    pTask = task_manager->getTaskWithThrow(task_id.c_str());
-  } catch (...) {
-    SetError(KAVO::kErrNoTask);
-    return {};
-  }
-  Json::Value data = pTask->getProperty(kPropData);
-  if (data.isNull()) {
-    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
-    SetError(KAVO::kErrSystem);
-    return data;
-  }
-  SetResponse(MakeAnswer(data));
-  return data;
+  LumoLibRemoveFinishedTask(pTask, WorkerOf(status.data), false);
 }
 
 }  // namespace Zantro

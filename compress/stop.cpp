@@ -8,46 +8,50 @@
 
 namespace Zantro {
 
+namespace {
+
+// 0, or the error code.
+int KillWorker() {
+  // "start" may still be storing the worker's process id.
+  if (WaitForTaskDataKeyReady(pTask, kPropData, kDataPid, kDataWaitSeconds) == 0) {
+    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
+    return KAVO::kErrSystem;
+  }
+  if (pTask->isFinished()) {
+    return 0;
+  }
+  const Json::Value data = pTask->getProperty(kPropData);
+  if (data.isNull()) {
+    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
+    return KAVO::kErrSystem;
+  }
+  return DoKill(data[kDataPid].asInt()) == 0 ? KAVO::kErrSystem : 0;
+}
+
+}  // namespace
+
 void ZantroCompressHandler::LumoCancelHandler() {
   if (!request->HasParam(kParamTaskId)) {
-    SetError(KAVO::kErrBadParameter);
-    return;
+    return SetError(KAVO::kErrBadParameter);
   }
   Vesk::TaskMgr task_manager(login_user.c_str());
   const std::string task_id = request->GetParam(kParamTaskId, "").asString();
   try {
     pTask = task_manager.getTaskWithThrow(task_id.c_str());
   } catch (...) {
-    return;  // no such task: nothing to stop, deliberately no error
+    return;  // nothing to stop: no error, for clients that ask twice
   }
+  int error = 0;
   try {
-    KillWorker();
+    error = KillWorker();
   } catch (...) {
     pTask->remove();
     throw;
   }
+  if (error != 0) {
+    SetError(error);
+  }
   pTask->remove();
-}
-
-void ZantroCompressHandler::KillWorker() {
-  // "start" may still be storing the worker's process id.
-  if (WaitForTaskDataKeyReady(pTask, kPropData, kDataPid, kDataWaitSeconds) == 0) {
-    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
-    SetError(KAVO::kErrSystem);
-    return;
-  }
-  if (pTask->isFinished()) {
-    return;
-  }
-  const Json::Value data = pTask->getProperty(kPropData);
-  if (data.isNull()) {
-    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
-    SetError(KAVO::kErrSystem);
-    return;
-  }
-  if (DoKill(data[kDataPid].asInt()) == 0) {
-    SetError(KAVO::kErrSystem);
-  }
 }
 
 }  // namespace Zantro

@@ -1,7 +1,6 @@
 // The background worker: takes on the user's identity, runs the job's steps, writes the outcome
 // into the task, notifies the desktop and leaves. It never returns into the host and never answers
 // a request; all that it has to say goes into the task and the log.
-#include <malloc.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -12,6 +11,7 @@
 #include <utility>
 
 #include "compress/KAVO.Zantro.Compress.h"
+#include "compress/list_file.h"
 #include "compress/task_record.h"
 #include "platform/kavo/error_codes.h"
 #include "platform/lumo/file_manager.h"
@@ -24,29 +24,6 @@ constexpr char kNotifyApp[] = "KAVO.Nolo.App.Zantro3.Instance";
 constexpr char kNotifyTitle[] = "tree:leaf_filebrowser";
 constexpr char kNotifyCompleted[] = "filebrowser:filebrowser_compress_completed";
 constexpr char kNotifyFailed[] = "filebrowser:filebrowser_compress_failed";
-
-// The list file of a job that may yet be stopped; null when there is none.
-const char* volatile list_file_of_job = nullptr;
-
-// Owns the list file from staging on until the archiver run, which removes it: for a job that is
-// stopped before, and for a step that throws.
-class ListFileOwner {
- public:
-  explicit ListFileOwner(const std::string& path) : path_(path) {
-    list_file_of_job = path_.c_str();
-  }
-  ~ListFileOwner() {
-    list_file_of_job = nullptr;
-    if (std::uncaught_exceptions() > 0) {
-      unlink(path_.c_str());
-    }
-  }
-  ListFileOwner(const ListFileOwner&) = delete;
-  ListFileOwner& operator=(const ListFileOwner&) = delete;
-
- private:
-  const std::string& path_;
-};
 
 // Holds SIGTERM back, so that it finds a job before it has a list file or when that has its owner.
 class TermHeldBack {
@@ -69,20 +46,9 @@ class TermHeldBack {
 void EndProcessGroup(int signal_number) {
   if (signal_number == SIGTERM) {
     kill(0, SIGTERM);
-    if (list_file_of_job != nullptr) {
-      unlink(list_file_of_job);
-    }
+    ListFile::RemovePresent();
     std::exit(1);  // NOLINT(bugprone-signal-handler): who stops a worker kills it if this hangs
   }
-}
-
-// Once they are listed, nothing asks for the sources any more, and the archiver may run for hours.
-void ReleaseSources(_tag_CompressInfo_& info) {
-  for (std::vector<std::string>* texts : {&info.src_dirs, &info.src_names, &info.src_paths}) {
-    *texts = std::vector<std::string>();
-  }
-  info.path_infos = std::vector<PathInfo>();
-  malloc_trim(0);
 }
 
 void TellSuccess(const std::string& name, Json::Value& data) {
@@ -95,7 +61,7 @@ void TellSuccess(const std::string& name, Json::Value& data) {
   data[kDataNotification2] = name;
 }
 
-// Unlike the call above, this one has no null pointer at its end, deliberately.
+// Unlike the call above, this one has no null pointer at its end: its message has two arguments.
 void TellFailure(const std::string& name, Json::Value& data) {
   const bool is_notified = pTask->getBoolProperty(kPropNotify, false);
   const char* const reason = LumoParseErrorToVeskString(LumoLibGetErr(), 0);
@@ -109,13 +75,56 @@ void TellFailure(const std::string& name, Json::Value& data) {
   data[kDataNotification3] = reason;
 }
 
+void StoreOutcome(bool succeeded, const std::string& dest, const Json::Value& error_items) {
+  pTask->reload();
+  Json::Value data = pTask->getProperty(kPropData);
+  if (data.isNull()) {
+    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
+    return;
+  }
+  pTask->beginUpdate();
+  const std::string name = WebUtils::EncodeHtml(dest, false);
+  if (succeeded) {
+    TellSuccess(name, data);
+  } else {
+    data[kDataErrors] = error_items;
+    TellFailure(name, data);
+  }
+  pTask->setProperty(kPropData, data);
+  // finish closes the update.
+  if (!pTask->finish(false)) {
+    syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
+  }
+}
+
+// Gives the vectors' memory back.
+template <typename... Vectors>
+void Release(Vectors&... vectors) {
+  (Vectors().swap(vectors), ...);
+}
+
 }  // namespace
 
 void ZantroCompressHandler::RunWorker(StartParameters& start, _tag_CompressInfo_& info) noexcept {
   std::signal(SIGTERM, EndProcessGroup);
-  const bool succeeded = RunJob(start, info);
+  bool succeeded = false;
+  // An exception out of a step, such as a request value that is no text, fails the job; it must not
+  // reach the host's frames.
   try {
-    StoreOutcome(succeeded, start.dest);
+    WaitForTaskDataReady(pTask, kPropData, kDataWaitSeconds);
+    // An archive of itself is taken for done, as clients expect that ask for one.
+    const bool is_itself =
+        start.source_paths.size() == 1 && start.source_paths.front() == start.dest;
+    succeeded = is_itself || RunPipeline(start, info);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "%s:%d Unexpected failure: %s", kLogSource, __LINE__, error.what());
+    SetErrItem(start.dest, KAVO::kErrGeneral);
+  } catch (...) {
+    syslog(LOG_ERR, "%s:%d Unexpected failure", kLogSource, __LINE__);
+    SetErrItem(start.dest, KAVO::kErrGeneral);
+  }
+  try {
+    StoreOutcome(succeeded, start.dest, error_items);
   } catch (...) {
     syslog(LOG_ERR, "%s:%d Failed to store the outcome", kLogSource, __LINE__);
   }
@@ -125,25 +134,6 @@ void ZantroCompressHandler::RunWorker(StartParameters& start, _tag_CompressInfo_
     syslog(LOG_ERR, "%s:%d Failed to clean tasks", kLogSource, __LINE__);
   }
   _exit(0);
-}
-
-// An exception out of a step, such as a request value that is no text, fails the job; it must not
-// reach the host's frames.
-bool ZantroCompressHandler::RunJob(StartParameters& start, _tag_CompressInfo_& info) noexcept {
-  try {
-    WaitForTaskDataReady(pTask, kPropData, kDataWaitSeconds);
-    // Packing an archive into itself is done already, deliberately.
-    if (start.source_paths.size() == 1 && start.source_paths.front() == start.dest) {
-      return true;
-    }
-    return RunPipeline(start, info);
-  } catch (const std::exception& error) {
-    syslog(LOG_ERR, "%s:%d Unexpected failure: %s", kLogSource, __LINE__, error.what());
-  } catch (...) {
-    syslog(LOG_ERR, "%s:%d Unexpected failure", kLogSource, __LINE__);
-  }
-  SetErrItem(start.dest, KAVO::kErrGeneral);
-  return false;
 }
 
 bool ZantroCompressHandler::RunPipeline(StartParameters& start, _tag_CompressInfo_& info) {
@@ -172,39 +162,19 @@ bool ZantroCompressHandler::RunPipeline(StartParameters& start, _tag_CompressInf
     syslog(LOG_ERR, "%s:%d Failed to get ziplist", kLogSource, __LINE__);
     return false;
   }
-  const ListFileOwner list_file(info.list_file);
+  ListFile list_file(info.list_file);
   held_back.reset();
-  ReleaseSources(info);
+  // Once they are listed nothing asks for the sources any more, and the archiver may run for hours.
+  Release(info.path_infos, info.src_paths, info.src_names, info.src_dirs);
   info.dest_path = start.dest;
   info.codepage = start.codepage;
   LumoGetZipInfo(info);
-  if (!LumoCompressFiles(info, login_user.c_str())) {
+  const bool succeeded = LumoCompressFiles(info, login_user.c_str());
+  list_file.Remove();
+  if (!succeeded) {
     syslog(LOG_ERR, "%s:%d Failed to compress file %s", kLogSource, __LINE__, start.dest.c_str());
-    return false;
   }
-  return true;
-}
-
-void ZantroCompressHandler::StoreOutcome(bool succeeded, const std::string& dest) {
-  pTask->reload();
-  Json::Value data = pTask->getProperty(kPropData);
-  if (data.isNull()) {
-    syslog(LOG_ERR, "%s:%d Failed to get json data", kLogSource, __LINE__);
-    return;
-  }
-  pTask->beginUpdate();
-  const std::string name = WebUtils::EncodeHtml(dest, false);
-  if (succeeded) {
-    TellSuccess(name, data);
-  } else {
-    data[kDataErrors] = error_items;
-    TellFailure(name, data);
-  }
-  pTask->setProperty(kPropData, data);
-  // finish closes the update.
-  if (!pTask->finish(false)) {
-    syslog(LOG_ERR, "%s:%d Failed to write progress.", kLogSource, __LINE__);
-  }
+  return succeeded;
 }
 
 }  // namespace Zantro

@@ -1,0 +1,36 @@
+// The file that tells the archiver what to pack.
+#pragma once
+
+#include <unistd.h>
+
+#include <string>
+
+namespace Zantro {
+
+// Owns the file from the end of staging to the end of the archiver's run; one at a time in a
+// process.
+class ListFile {
+ public:
+  // Takes over the file of that path, which outlives the object; an empty one is no file.
+  explicit ListFile(const std::string& path) { present_ = path.c_str(); }
+  ~ListFile() { Remove(); }
+  ListFile(const ListFile&) = delete;
+  ListFile& operator=(const ListFile&) = delete;
+
+  void Remove() {
+    RemovePresent();
+    present_ = "";
+  }
+
+  // Removes the file that has an owner now, if any; a signal handler may call it.
+  static void RemovePresent() {
+    if (*present_ != 0) {
+      unlink(present_);
+    }
+  }
+
+ private:
+  static inline const char* volatile present_ = "";
+};
+
+}  // namespace Zantro
