@@ -7,7 +7,7 @@
 #include "device/archiver/command_line.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/list_file.h"
-#include "device/archiver/progress.h"
+#include "device/archiver/output_of_7z.h"
 #include "device/archiver/report.h"
 #include "device/archiver/stock_7z.h"
 #include "tests/programs.h"

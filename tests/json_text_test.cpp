@@ -15,9 +15,10 @@ using Device::ToText;
 
 TEST(JsonTextTest, GoesOutAsItCameIn) {
   for (const char* text :
-       {"null", "[]", "{}", "-9223372036854775808", "18446744073709551615", "0.5", "0.28999999165534973",
-        R"(["",true,[false,{"a":{},"b":[1,-1]}]])", R"("\u0000\u001f\b\f\n\r\t\"\\/")",
-        "\"\x80\xff\xed\xa0\x80 \xc3\xa9\x7f\"", R"({"":1,"k\u0000":2,"é":3})"}) {
+       {"null", "[]", "{}", "-9223372036854775808", "18446744073709551615", "0.5",
+        "0.28999999165534973", R"(["",true,[false,{"a":{},"b":[1,-1]}]])",
+        R"("\u0000\u001f\b\f\n\r\t\"\\/")", "\"\x80\xff\xed\xa0\x80 \xc3\xa9\x7f\"",
+        R"({"":1,"k\u0000":2,"é":3})"}) {
     EXPECT_EQ(ToText(ParseJson(text)), text);
   }
   EXPECT_EQ(ToText(ParseJson(" [ \"\\u00e9\\ud83d\\ude00\" , 1.0 ]\n")), "[\"é😀\",1.0]");
@@ -56,8 +57,8 @@ TEST(JsonTextTest, WhatIsNoJsonIsRefusedWithItsPlace) {
         Row{"{\"a\":1,\n\"a\":2}", "line 2, column 1: Duplicate key: 'a'"},
         Row{R"("\ud800")", "line 1, column 1: "},
         Row{std::string("[1]\0]", 5), "line 1, column 4: "}, Row{"NaN", "line 1, column 1: "},
-        Row{"[1,922337203685477581e308]", "line 1, column "},
-        Row{"-1e400", "line 1, column "}, Row{"[[[1]]]", "line 1, column 3: nested too deep"}}) {
+        Row{"[1,922337203685477581e308]", "line 1, column "}, Row{"-1e400", "line 1, column "},
+        Row{"[[[1]]]", "line 1, column 3: nested too deep"}}) {
     try {
       ParseJson(text, 2);
       ADD_FAILURE() << text;

@@ -1,6 +1,7 @@
 #include "device/archiver/archive_job.h"
 
 #include <fcntl.h>
+#include <sys/mman.h>
 #include <sys/stat.h>
 
 #include <algorithm>
@@ -16,7 +17,6 @@
 #include "device/archiver/failure.h"
 #include "device/archiver/list_file.h"
 #include "device/archiver/output_file.h"
-#include "device/archiver/password.h"
 #include "device/archiver/special_files.h"
 #include "device/archiver/stock_7z.h"
 #include "device/archiver/switches.h"
@@ -67,6 +67,25 @@ std::vector<std::string> Filter(const std::vector<std::string>& sources, IsWante
   std::vector<std::string> result;
   std::copy_if(sources.begin(), sources.end(), std::back_inserter(result), is_wanted);
   return result;
+}
+
+// An unnamed file that holds the text, positioned at its start.
+Device::FileDescriptor UnnamedFile(const std::string& text) {
+  Device::FileDescriptor fd(memfd_create("kavo-7z", MFD_CLOEXEC));
+  if (!fd || !Device::WriteAll(fd.Get(), text) || lseek(fd.Get(), 0, SEEK_SET) != 0) {
+    throw SystemFailure("cannot write", "unnamed file for 7z", errno);
+  }
+  return fd;
+}
+
+// A standard input for 7z that answers its questions for the password; invalid when there is none.
+Device::FileDescriptor PasswordInput(const Request& request) {
+  if (request.password.empty()) {
+    return Device::FileDescriptor();
+  }
+  // It asks once to open an old archive and once to encrypt new files.
+  const std::string answer = request.password + '\n';
+  return UnnamedFile(answer + answer);
 }
 
 void Pack(const Request& request, PackRun run, const std::string& folder, const Cancel& cancel,

@@ -1,5 +1,6 @@
 #include "device/archiver/command_line.h"
 
+#include <algorithm>
 #include <cstring>
 
 #include "device/archiver/failure.h"
@@ -82,6 +83,18 @@ Request ParseCommandLine(const std::vector<std::string>& arguments) {
     throw Failure(request.archive.empty() ? "no archive named" : "no list of files named");
   }
   return request;
+}
+
+void CheckPassword(const Request& request) {
+  const std::string& password = request.password;
+  if (password.find('\n') != std::string::npos) {
+    throw Failure("the password holds a line break");
+  }
+  const bool plain =
+      std::all_of(password.begin(), password.end(), [](char c) { return c >= ' ' && c <= '~'; });
+  if (request.zip && !plain) {
+    throw Failure("the password of a zip archive can hold printable ASCII characters only");
+  }
 }
 
 void HidePassword(int argc, char** argv) {

@@ -10,9 +10,8 @@
 #include <cstring>
 #include <system_error>
 
-#include "device/archiver/error_text.h"
 #include "device/archiver/failure.h"
-#include "device/archiver/progress.h"
+#include "device/archiver/output_of_7z.h"
 #include "device/base/child_process.h"
 #include "device/base/file_descriptor.h"
 

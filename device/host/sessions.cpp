@@ -17,7 +17,7 @@ namespace Device {
 
 namespace {
 
-constexpr std::size_t kSessionIdBytes = 16;
+constexpr int kSessionIdWords = 4;
 constexpr std::ptrdiff_t kMostSessions = 16;  // of one user
 constexpr int kFreeTries = 10;
 constexpr std::chrono::seconds kLongestWait(60);
@@ -69,7 +69,7 @@ void EndOldestOf(const std::string& user) {
 std::string SignIn(const std::string& user) {
   EndOldestOf(user);
   static std::uint64_t number = 0;
-  std::string id = RandomId(kSessionIdBytes);
+  std::string id = RandomId(kSessionIdWords);
   Sessions().emplace(id, Session{user, ++number});
   return id;
 }

@@ -11,17 +11,18 @@
 #include <cctype>
 #include <cerrno>
 #include <chrono>
+#include <cinttypes>
 #include <csignal>
+#include <cstdio>
 #include <cstdlib>
 #include <ctime>
-#include <fstream>
 #include <iterator>
 #include <memory>
 #include <optional>
-#include <sstream>
 #include <stdexcept>
 
 #include "device/base/file_descriptor.h"
+#include "device/base/file_io.h"
 #include "device/tasks/task_store.h"
 
 namespace Device {
@@ -41,23 +42,19 @@ struct ProcessStat {
 };
 
 std::optional<ProcessStat> ReadStat(pid_t pid) {
-  std::ifstream file("/proc/" + std::to_string(pid) + "/stat");
-  std::string text;
-  if (!std::getline(file, text, '\0')) {
-    return std::nullopt;
+  constexpr char kFields[] =
+      ") %c %*d %d %*d %*d %*d %*u %*u %*u %*u %*u %*u %*u %*d %*d %*d %*d %*d %*d %" SCNu64;
+  try {
+    const std::string text = ReadTextFile("/proc/" + std::to_string(pid) + "/stat");
+    const std::size_t name_end = text.rfind(')');  // the program's name may hold brackets too
+    ProcessStat stat;
+    if (name_end != std::string::npos && std::sscanf(text.c_str() + name_end, kFields, &stat.state,
+                                                     &stat.group, &stat.start_time) == 3) {
+      return stat;
+    }
+  } catch (const std::runtime_error&) {  // no such process
   }
-  // The second field, the program's name, may hold blanks and brackets.
-  std::istringstream fields(text.substr(std::min(text.rfind(')'), text.size() - 1) + 1));
-  constexpr int kFieldsBetween = 16;  // from session to the one before start_time
-  ProcessStat stat;
-  pid_t parent = 0;
-  fields >> stat.state >> parent >> stat.group;
-  std::string skipped;
-  for (int field = 0; field < kFieldsBetween; ++field) {
-    fields >> skipped;
-  }
-  fields >> stat.start_time;
-  return fields ? std::optional<ProcessStat>(stat) : std::nullopt;
+  return std::nullopt;
 }
 
 bool HasEnded(const ProcessStat& stat) { return stat.state == 'Z' || stat.state == 'X'; }

@@ -9,6 +9,7 @@
 #include "device/base/json_text.h"
 #include "device/web/body.h"
 #include "device/web/connection_threads.h"
+#include "device/web/request_head.h"
 
 namespace Web {
 
@@ -24,8 +25,6 @@ constexpr int kReadTimeout = 10;  // seconds without a byte from a client
 constexpr int kHeartbeatMs = 5000;
 constexpr std::chrono::seconds kEndGrace(5);
 constexpr char kJson[] = "application/json";
-constexpr char kSession[] = "/session";
-constexpr char kWebApi[] = "/webapi";
 constexpr char kPolicy[] =
     "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self'; connect-src 'self'; "
     "base-uri 'none'; form-action 'none'; frame-ancestors 'none'";
@@ -42,38 +41,6 @@ void Respond(Response& response, const Device::Answer& answer) {
 
 void Refuse(Response& response, int status, const std::string& reason) {
   Respond(response, Device::Refusal(status, reason));
-}
-
-// The cookie's value; empty when there is none.
-std::string SessionOf(const Request& request) {
-  const std::string cookies = "; " + request.get_header_value("Cookie");
-  const std::string name = std::string("; ") + Device::kSessionCookie + "=";
-  const std::size_t begin = cookies.find(name);
-  if (begin == std::string::npos) {
-    return "";
-  }
-  const std::size_t value = begin + name.size();
-  return cookies.substr(value, cookies.find(';', value) - value);
-}
-
-// True when the name that the client knows the device by is not this machine's own, though it came
-// in over the loopback address: another site's name may lead here.
-bool IsForeignHost(const Request& request) {
-  const std::string host = request.get_header_value("Host");
-  const std::string name = host.substr(0, host.find(':', host.rfind(']') + 1));
-  const bool is_loopback =
-      request.local_addr.compare(0, 4, "127.") == 0 || request.local_addr == "::1";
-  return is_loopback && name != "localhost" && name != "127.0.0.1" && name != "[::1]" &&
-         name != request.local_addr;
-}
-
-// Browsers name the page that a request comes from; others leave it out.
-bool IsForeign(const Request& request) {
-  const std::string origin = request.get_header_value("Origin");
-  const std::string host = "://" + request.get_header_value("Host");
-  return !origin.empty() && (origin.size() < host.size() ||
-                             origin.compare(origin.size() - host.size(), host.size(), host) != 0 ||
-                             origin.find("://") != origin.size() - host.size());
 }
 
 Json::Value Asked(const Request& request, const char* kind) {
@@ -99,14 +66,6 @@ const char* ReasonFor(int status) {
     default:
       return "not a request that is understood";
   }
-}
-
-// False where the library would read a body, of any length, to find no route for it.
-bool HasBodyRoute(const Request& request) {
-  const std::string& path = request.path;
-  return request.method == "POST"     ? path == kSession || path == kWebApi
-         : request.method == "DELETE" ? path == kSession
-                                      : request.method == "GET" || request.method == "HEAD";
 }
 
 // The body as it came: the library would cut a long form. False, with the response's status, when

@@ -10,9 +10,9 @@
 #include "device/base/json_text.h"
 #include "device/model/device.h"
 #include "device/platform/kavo/request.h"
-#include "platform/kavo/api_table.h"
 #include "device/platform/operations.h"
 #include "device/tasks/user_tasks.h"
+#include "platform/kavo/api_table.h"
 #include "tests/fuzz/targets.h"
 
 extern "C" void* GetAPITable();

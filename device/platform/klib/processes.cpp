@@ -85,8 +85,8 @@ ssize_t ReadOutput(void* cookie, char* buffer, std::size_t size) {
   return static_cast<ssize_t>(copied);
 }
 
-// The streams that KLIBCPopenv has returned and KLIBCPclose not closed yet. Not destroyed at the end
-// of the process: an archiver whose worker is told to end is told too, and cleans up by itself.
+// The streams that KLIBCPopenv has returned and KLIBCPclose not closed yet. Not destroyed at the
+// end of the process: an archiver whose worker is told to end is told too, and cleans up by itself.
 std::map<FILE*, std::unique_ptr<ProgramOutput>>& Streams() {
   static auto& streams = *new std::map<FILE*, std::unique_ptr<ProgramOutput>>;
   return streams;

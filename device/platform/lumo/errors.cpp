@@ -1,8 +1,6 @@
 #include "device/platform/lumo/errors.h"
 
-#include <algorithm>
 #include <cerrno>
-#include <iterator>
 
 #include "device/platform/operations.h"
 #include "platform/lumo/file_manager.h"
@@ -13,11 +11,7 @@ namespace {
 
 int last_error = 0;
 
-struct TextRow {
-  int code;
-  const char* text;
-};
-constexpr TextRow kTexts[] = {
+const std::map<int, std::string> kTexts = {
     {KAVO::kErrInternal, "the request failed without an answer"},
     {KAVO::kErrBadParameter, "bad or missing parameter"},
     {KAVO::kErrNoApi, "no such API"},
@@ -40,11 +34,7 @@ constexpr TextRow kTexts[] = {
     {KAVO::kErrArchiveNameTooLong, "the archive's name is longer than 255 bytes"},
 };
 
-struct ErrnoRow {
-  int error_number;
-  int code;
-};
-constexpr ErrnoRow kErrnos[] = {
+const std::map<int, int> kErrnos = {
     {0, 0},
     {EACCES, KAVO::kErrNoPrivilege},
     {EPERM, KAVO::kErrNoPrivilege},
@@ -58,10 +48,8 @@ constexpr ErrnoRow kErrnos[] = {
 };
 
 int FromErrno(int error_number) {
-  const auto* const row =
-      std::find_if(std::begin(kErrnos), std::end(kErrnos),
-                   [&](const ErrnoRow& each) { return each.error_number == error_number; });
-  return row == std::end(kErrnos) ? static_cast<int>(KAVO::kErrSystem) : row->code;
+  const auto row = kErrnos.find(error_number);
+  return row == kErrnos.end() ? static_cast<int>(KAVO::kErrSystem) : row->second;
 }
 
 }  // namespace
@@ -70,18 +58,11 @@ void SetLastError(int code) { last_error = code; }
 void SetLastErrno(int error_number) { SetLastError(FromErrno(error_number)); }
 
 const char* ErrorText(int code) {
-  const auto* const row = std::find_if(std::begin(kTexts), std::end(kTexts),
-                                       [&](const TextRow& each) { return each.code == code; });
-  return row == std::end(kTexts) ? "unknown error" : row->text;
+  const auto row = kTexts.find(code);
+  return row == kTexts.end() ? "unknown error" : row->second.c_str();
 }
 
-std::map<int, std::string> ErrorTexts() {
-  std::map<int, std::string> texts;
-  for (const TextRow& row : kTexts) {
-    texts[row.code] = row.text;
-  }
-  return texts;
-}
+const std::map<int, std::string>& ErrorTexts() { return kTexts; }
 
 }  // namespace Device
 

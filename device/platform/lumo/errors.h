@@ -16,6 +16,6 @@ void SetLastErrno(int error_number);
 // What a web API error code means, in English. Never null.
 const char* ErrorText(int code);
 // All of them.
-std::map<int, std::string> ErrorTexts();
+const std::map<int, std::string>& ErrorTexts();
 
 }  // namespace Device

@@ -25,7 +25,7 @@ struct TaskMgr::State {
 
 namespace {
 
-constexpr std::size_t kTaskIdBytes = 8;
+constexpr int kTaskIdWords = 2;
 constexpr char kPropNotify[] = "blMsg";
 
 // How many arguments follow a message key.
@@ -230,7 +230,7 @@ std::string TaskMgr::getUniqueTaskId(const char* prefix) {
     return LogAndThrow("make task id", [&] {
       std::string id;
       do {
-        id = prefix + Device::RandomId(kTaskIdBytes);
+        id = prefix + Device::RandomId(kTaskIdWords);
       } while (Device::StoreOf(state_->user).FindTask(id));
       return id;
     });

@@ -1,0 +1,46 @@
+#include "device/web/request_head.h"
+
+#include <string>
+
+#include "device/host/wire.h"
+
+namespace Web {
+
+using httplib::Request;
+
+std::string SessionOf(const Request& request) {
+  const std::string cookies = "; " + request.get_header_value("Cookie");
+  const std::string name = std::string("; ") + Device::kSessionCookie + "=";
+  const std::size_t begin = cookies.find(name);
+  if (begin == std::string::npos) {
+    return "";
+  }
+  const std::size_t value = begin + name.size();
+  return cookies.substr(value, cookies.find(';', value) - value);
+}
+
+bool IsForeignHost(const Request& request) {
+  const std::string host = request.get_header_value("Host");
+  const std::string name = host.substr(0, host.find(':', host.rfind(']') + 1));
+  const bool is_loopback =
+      request.local_addr.compare(0, 4, "127.") == 0 || request.local_addr == "::1";
+  return is_loopback && name != "localhost" && name != "127.0.0.1" && name != "[::1]" &&
+         name != request.local_addr;
+}
+
+bool IsForeign(const Request& request) {
+  const std::string origin = request.get_header_value("Origin");
+  const std::string host = "://" + request.get_header_value("Host");
+  return !origin.empty() && (origin.size() < host.size() ||
+                             origin.compare(origin.size() - host.size(), host.size(), host) != 0 ||
+                             origin.find("://") != origin.size() - host.size());
+}
+
+bool HasBodyRoute(const Request& request) {
+  const std::string& path = request.path;
+  return request.method == "POST"     ? path == kSession || path == kWebApi
+         : request.method == "DELETE" ? path == kSession
+                                      : request.method == "GET" || request.method == "HEAD";
+}
+
+}  // namespace Web

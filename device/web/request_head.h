@@ -1,0 +1,27 @@
+// What the head of an HTTP request tells before its body is read. No I/O.
+#pragma once
+
+#include <httplib.h>
+
+#include <string>
+
+namespace Web {
+
+inline constexpr char kSession[] = "/session";
+inline constexpr char kWebApi[] = "/webapi";
+
+// The session cookie's value; empty when there is none.
+std::string SessionOf(const httplib::Request& request);
+
+// True when the name that the client knows the device by is not this machine's own, though it came
+// in over the loopback address: another site's name may lead here.
+bool IsForeignHost(const httplib::Request& request);
+
+// True when the request comes from another site's page. Browsers name the page; others leave it
+// out.
+bool IsForeign(const httplib::Request& request);
+
+// False where the library would read a body, of any length, to find no route for it.
+bool HasBodyRoute(const httplib::Request& request);
+
+}  // namespace Web
