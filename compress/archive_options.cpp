@@ -20,7 +20,7 @@ struct ModeRow {
 constexpr ModeRow kModes[] = {
     {"update", "u", ""},
     {"freshen", "u", "-up1q1r0x1y2z1w2"},
-    {"synchroize", "u", "-up1q0r2x1y2z1w2"},  // spelt so, deliberately
+    {"synchroize", "u", "-up1q0r2x1y2z1w2"},  // clients spell it so
 };
 constexpr ModeRow kOtherMode = {"", "a", ""};
 

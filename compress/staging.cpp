@@ -5,7 +5,7 @@
 // holds one folder for each of them.
 //
 // While this step runs the record's dest_path is still empty, and so is the path of the error items
-// that name it; deliberate.
+// that name it, as clients of the device know them.
 #include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -33,7 +33,7 @@ class FileDescriptor {
  public:
   explicit FileDescriptor(int fd) : fd_(fd) {}
   ~FileDescriptor() {
-    if (fd_ > 0) {  // 0 is left open, deliberately
+    if (fd_ > 0) {  // 0 is left open: it stands for a closed standard input, not for a list
       close(fd_);
     }
   }
@@ -161,7 +161,8 @@ bool ZantroCompressHandler::GenerateZipList(_tag_CompressInfo_& info, const std:
   return true;
 }
 
-// On success the directory and its links are left behind, deliberately; the process stays in it.
+// On success the directory and its links are left behind, as on the device, where others clear
+// /tmp; the process stays in the directory.
 bool ZantroCompressHandler::GenerateZipListWithShare(_tag_CompressInfo_& info) {
   std::string directory = kTempTemplate;
   if (mkdtemp(directory.data()) == nullptr) {

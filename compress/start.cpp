@@ -52,8 +52,7 @@ int ReadDestination(const KAVO::APIRequest& request, std::string& dest) {
     return KAVO::kErrBadParameter;
   }
   dest = destinations[0].asString();
-  // basename cuts slashes at the end in place; deliberate, the worker is to see the text without
-  // them too.
+  // basename cuts slashes at the end in place, so that the worker sees the text without them too.
   char* const name = basename(dest.data());
   if (name == nullptr) {
     syslog(LOG_ERR, "%s:%d Bad parameter: no archive name", kLogSource, __LINE__);
@@ -116,7 +115,7 @@ Json::Value MakeTaskData(const KAVO::APIRequest& request, pid_t worker) {
   }
   for (const char* name : kParamsStoredRaw) {
     if (request.HasParam(name)) {
-      // The password as well: deliberately as it was given, for the task's readers.
+      // The password as well, as it was given: the task's readers expect the request unmasked.
       params[name] = request.GetParam(name, Json::Value());
     }
   }

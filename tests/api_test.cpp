@@ -92,7 +92,7 @@ TEST_F(ApiTest, HostRefusesWhatNoRowServes) {
 // A request that fails early must not free the task of the one before it.
 TEST_F(ApiTest, OneProcessImageServesManyRequestsAlike) {
   Add("vol1/photo/a.txt", "a");
-  Device::StopWatching();
+  Device::StopTracing();
   const auto serve = [&](const std::string& method, const Json::Value& params, int code) {
     const Outcome outcome = launcher_->CallHere(MakeRequest(method, params));
     EXPECT_EQ(outcome.code, code) << method;

@@ -29,7 +29,8 @@ class FileWebAPI {
   int GetError() const { return error_code; }
 
  protected:
-  // Not virtual, deliberately: a handler is destroyed under its own type, never through its base.
+  // Not virtual, for the host's sake, which knows the two slots alone: a handler is destroyed under
+  // its own type, never through its base.
   ~FileWebAPI();
 
   // Does the request's work and records its outcome with the operations below; what is recorded

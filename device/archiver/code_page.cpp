@@ -15,7 +15,7 @@ constexpr char kUtf8[] = "UTF-8";
 iconv_t Unopened() { return reinterpret_cast<iconv_t>(-1); }  // NOLINT(performance-no-int-to-ptr)
 
 // iconv takes options after a slash, more charsets after a comma, and nothing for the locale's.
-bool IsPlain(const std::string& name) {
+bool IsCharsetName(const std::string& name) {
   return std::isalnum(static_cast<unsigned char>(name[0])) != 0 &&
          std::all_of(name.begin(), name.end(), [](unsigned char c) {
            return std::isalnum(c) != 0 || c == '-' || c == '_' || c == '.' || c == ':';
@@ -23,7 +23,7 @@ bool IsPlain(const std::string& name) {
 }
 
 std::string IconvName(const std::string& name) {
-  if (!IsPlain(name)) {
+  if (!IsCharsetName(name)) {
     return "none such";
   }
   const bool number = name.find_first_not_of("0123456789") == std::string::npos;

@@ -53,7 +53,7 @@ std::string ReadSome(Device::FileDescriptor& fd) {
   return {buffer.data(), static_cast<size_t>(size)};
 }
 
-void PassOn(const std::vector<Event>& events, Report& report) {
+void ReportEvents(const std::vector<Event>& events, Report& report) {
   for (const Event& event : events) {
     switch (event.kind) {
       case Event::Kind::kTotal:
@@ -85,7 +85,7 @@ void Drain(Device::FileDescriptor& output, Device::FileDescriptor& errors, Error
       text->Feed(ReadSome(errors));
     }
     if (watched[0].revents != 0) {
-      PassOn(parser.Feed(ReadSome(output)), report);
+      ReportEvents(parser.Feed(ReadSome(output)), report);
     }
   }
 }

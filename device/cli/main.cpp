@@ -37,7 +37,7 @@ void AddUserOptions(CLI::App& command, CommandLine& line) {
   command.add_option("--user", line.user, "The signed-in user")->required();
 }
 
-void AddWatchOptions(CLI::App& command, CommandLine& line) {
+void AddTraceOptions(CLI::App& command, CommandLine& line) {
   command.add_option("--trace", line.trace_file, "Append one JSON line per platform operation");
   command
       .add_option("--fault", line.fault_rules,
@@ -60,7 +60,7 @@ CLI::App* AddCall(CLI::App& app, CommandLine& line) {
   command->add_option("params", line.call.params, "Parameters: NAME=TEXT or NAME:=JSON");
   command->add_option("--version", line.call.version, "API version")->capture_default_str();
   command->add_option("--api", line.call.api, "API name")->capture_default_str();
-  AddWatchOptions(*command, line);
+  AddTraceOptions(*command, line);
   return command;
 }
 
@@ -80,7 +80,7 @@ CLI::App* AddCompress(CLI::App& app, CommandLine& line) {
   command->add_option("--password-file", options.password_file,
                       "File whose first line is the archive's password");
   command->add_option("--codepage", options.codepage, "Code page of names in a zip, such as CP932");
-  AddWatchOptions(*command, line);
+  AddTraceOptions(*command, line);
   return command;
 }
 
@@ -88,7 +88,7 @@ CLI::App* AddServe(CLI::App& app, CommandLine& line) {
   CLI::App* const command = app.add_subcommand("serve", "Serve the device over HTTP");
   AddDeviceOption(*command, line);
   command->add_option("--listen", line.listen, "ADDRESS:PORT")->capture_default_str();
-  AddWatchOptions(*command, line);
+  AddTraceOptions(*command, line);
   return command;
 }
 

@@ -135,7 +135,7 @@ std::vector<std::string> OperationNames() {
   return {std::begin(kOperations), std::end(kOperations)};
 }
 
-void StopWatching() {
+void StopTracing() {
   TraceFile().Close();
   Faults().clear();
   Counts().fill(0);
@@ -161,7 +161,7 @@ Json::Value ToJson(char* const* argument_vector) {
   return array;
 }
 
-bool Operation::IsWatched() { return TraceFile() || !Faults().empty(); }
+bool Operation::IsTracedOrFaulty() { return TraceFile() || !Faults().empty(); }
 
 const Fault* Operation::CountAndMatch(const char* name) {
   const std::uint64_t number = ++Counts().at(IndexOf(name));

@@ -1,4 +1,4 @@
-// Watching and breaking the platform's operations, in every process of the device.
+// Tracing the platform's operations and making them fail, in every process of the device.
 //
 // Each body behind platform/ runs inside an Operation, which writes a trace line and lets a fault
 // rule answer in the body's place. Calls are counted per request: a worker goes on counting where
@@ -32,7 +32,7 @@ void AddFault(const std::string& rule);
 std::vector<std::string> OperationNames();
 
 // Ends tracing and forgets the rules.
-void StopWatching();
+void StopTracing();
 
 struct Fault {
   std::string call;
@@ -96,7 +96,7 @@ class Operation {
   // `name` is the operation's name in platform/, with its class.
   template <typename... Args>
   explicit Operation(const char* name, const Args&... arguments) : name_(name) {
-    if (IsWatched()) {
+    if (IsTracedOrFaulty()) {
       fault_ = CountAndMatch(name);
       (arguments_.append(ToJson(arguments)), ...);
     }
@@ -120,7 +120,7 @@ class Operation {
   template <typename Body>
   auto Run(Body body) -> decltype(body()) {
     using Result = decltype(body());
-    if (!IsWatched()) {
+    if (!IsTracedOrFaulty()) {
       return body();
     }
     if (fault_ != nullptr) {
@@ -147,7 +147,7 @@ class Operation {
   bool HasOutput(const char* name) const {
     return fault_ != nullptr && fault_->outputs.isMember(name);
   }
-  static bool IsWatched();
+  static bool IsTracedOrFaulty();
   static const Fault* CountAndMatch(const char* name);
   // Leaves the rule's code, and throws when the rule says so.
   void ApplyFault();

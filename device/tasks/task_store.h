@@ -77,7 +77,7 @@ class TaskStore {
   void RemoveWorker(pid_t pid);
 
   void AddNotification(const NotificationRow& row);
-  // Those behind the one of that number; all behind 0.
+  // The ones after that number, all for 0.
   std::vector<NotificationRow> NotificationsAfter(std::int64_t number);
   std::int64_t LastNotification();
 

@@ -16,7 +16,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <ctime>
-#include <iterator>
 #include <memory>
 #include <optional>
 #include <stdexcept>
@@ -131,17 +130,11 @@ void YieldIfCrowded(const std::string& user, pid_t newest) {
       jobs.insert(worker);
     }
   }
-  if (jobs.size() <= kJobsAtOnce) {
-    return;
-  }
-  // It may not lead its group yet; what it starts will yield like itself.
-  const sched_param none{};
-  sched_setscheduler(newest, SCHED_IDLE, &none);
-  std::set<pid_t> pressing;
-  std::copy_if(jobs.begin(), jobs.end(), std::inserter(pressing, pressing.end()),
-               [](pid_t worker) { return !IsYielding(worker); });
-  if (!pressing.empty()) {
-    Schedule(pressing, SCHED_IDLE);
+  if (jobs.size() > kJobsAtOnce) {
+    // It may not lead its group yet; what it starts will yield like itself.
+    const sched_param none{};
+    sched_setscheduler(newest, SCHED_IDLE, &none);
+    Schedule(jobs, SCHED_IDLE);
   }
 }
 

@@ -98,8 +98,8 @@ int WaitForTaskDataKeyReady(Vesk::Task* task, const char* property, const char* 
 Json::Value LumoLibBkgTaskInfoCreate(const Json::Value& data, const std::string& kind);
 
 // Removes the task from the store if, as this process last read it, it has finished or holds
-// "errors", or if its process, the worker `pid`, ended without a result. `task` may be null:
-// nothing happens then. `pid` is -1 when unknown. The last argument is false.
+// "errors". `task` may be null: nothing happens then. `pid` is the worker's, -1 when unknown; the
+// library may look whether that process has ended. The last argument is false.
 void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved);
 
 // Removes the user's stale tasks.

@@ -1,11 +1,5 @@
 #include "device/platform/lumo/paths.h"
 
-#include <fcntl.h>
-#include <linux/openat2.h>
-#include <sys/stat.h>
-#include <sys/syscall.h>
-#include <unistd.h>
-
 #include <algorithm>
 #include <climits>
 #include <cstdlib>
@@ -14,7 +8,6 @@
 #include <string_view>
 #include <utility>
 
-#include "device/base/file_descriptor.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
@@ -88,26 +81,8 @@ bool IsOnVolumes(const std::string& path) {
                      [&](const std::string& volume) { return IsWithin(path, volume); });
 }
 
-// True of a file or folder that is there and has no link on the way to it: what its path says is
-// where it lies. One call of the kernel's, where following takes one for each part of the path.
-// False where the kernel does not know it.
-bool HasNoLinks(const std::string& path) {
-  open_how how{};
-  how.flags = O_PATH | O_CLOEXEC;
-  how.resolve = RESOLVE_NO_SYMLINKS;
-  return static_cast<bool>(FileDescriptor(
-      static_cast<int>(syscall(SYS_openat2, AT_FDCWD, path.c_str(), &how, sizeof how))));
-}
-
-// True of an absolute path without ".", ".." and doubled slashes: with no links on the way, it is
-// what following it would give. Names that begin with a dot are left to following.
-bool IsNormal(const std::string& path) {
-  return path[0] == '/' && path.find("/.") == std::string::npos &&
-         path.find("//") == std::string::npos;
-}
-
 int CheckPath(const char* path) {
-  const std::string followed = IsNormal(path) && HasNoLinks(path) ? path : FollowLinks(path);
+  const std::string followed = FollowLinks(path);
   if (followed.empty()) {
     SetLastErrno(errno);
     return -1;

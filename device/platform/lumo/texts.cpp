@@ -1,5 +1,6 @@
 // Splitting and encoding texts.
 #include <algorithm>
+#include <map>
 #include <utility>
 
 #include "device/base/json_text.h"
@@ -57,30 +58,14 @@ Json::Value Explode(const Json::Value& value, const std::string& separator, int 
 }
 
 std::string EncodeHtml(const std::string& text, bool encode_blanks) {
+  static const std::map<char, std::string> kReferences = {
+      {'&', "&amp;"}, {'<', "&lt;"}, {'>', "&gt;"}, {'"', "&quot;"}, {'\'', "&#39;"}};
   std::string encoded;
   for (const char each : text) {
-    switch (each) {
-      case '&':
-        encoded += "&amp;";
-        break;
-      case '<':
-        encoded += "&lt;";
-        break;
-      case '>':
-        encoded += "&gt;";
-        break;
-      case '"':
-        encoded += "&quot;";
-        break;
-      case '\'':
-        encoded += "&#39;";
-        break;
-      case ' ':
-        encoded += encode_blanks ? "&nbsp;" : " ";
-        break;
-      default:
-        encoded += each;
-    }
+    const auto reference = kReferences.find(each);
+    encoded += reference != kReferences.end() ? reference->second
+               : each == ' ' && encode_blanks ? "&nbsp;"
+                                              : std::string(1, each);
   }
   return encoded;
 }
