@@ -108,7 +108,7 @@ DeviceTest::~DeviceTest() {
   }
   while (waitpid(-1, nullptr, 0) > 0) {
   }
-  Device::StopWatching();
+  Device::StopTracing();
   for (const std::string& path : StagedPaths()) {
     fs::remove_all(path);
   }
@@ -275,7 +275,7 @@ std::string DeviceTest::Plain(std::string text) const {
 }
 
 void DeviceTest::Watch() {
-  Device::StopWatching();
+  Device::StopTracing();
   SetLibcFault({});
   for (const char* name : {"/log", "/trace"}) {
     std::ofstream(temp_.Path() + name, std::ios::trunc).flush();

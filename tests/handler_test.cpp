@@ -52,7 +52,7 @@ std::string OutcomeOf(const std::function<void(Handler&)>& process,
   } else {
     Zantro::ZantroCompressHandler(&api_request, &api_response).Run();
   }
-  Device::StopWatching();
+  Device::StopTracing();
   return std::to_string(response_state.outcome.code) + " " +
          Device::ToText(response_state.outcome.data);
 }
@@ -83,7 +83,7 @@ TEST(BaseHandler, LeavesErrorNumbersToThePlatform) {
   Device::OpenTrace(temp.Path() + "/trace");
   EXPECT_EQ(Handler::ParseErrnoToError(ENOSPC, "from", "to"), 416);
   EXPECT_NE(ReadFile(temp.Path() + "/trace").find(R"([28,"from","to"])"), std::string::npos);
-  Device::StopWatching();
+  Device::StopTracing();
 }
 
 TEST(Escape, QuotesForAShellOrAnswersNothing) {
@@ -96,7 +96,7 @@ TEST(Escape, QuotesForAShellOrAnswersNothing) {
   EXPECT_EQ(last_line, "");
   Device::AddFault("KLIBCEncShParam=-1");
   EXPECT_EQ(escape("a b"), "");
-  Device::StopWatching();
+  Device::StopTracing();
   EXPECT_EQ(last_line, "Failed to escape string: a b");
 #if !defined(__SANITIZE_ADDRESS__) && __SIZEOF_POINTER__ == 8  // elsewhere the limit has no effect
   const std::string text(64U << 20U, 'a');

@@ -140,7 +140,7 @@ TEST_F(JobTest, TenThousandSources) {
     Add("vol1/photo/" + name, name);
     sources.push_back("/photo/" + name);
   }
-  Device::StopWatching();
+  Device::StopTracing();
   RunJob(JobParams(sources, "/photo/z.zip", R"({"level":"store"})"));
   const Tree tree = Unpacked(At("vol1/photo/z.zip"));
   EXPECT_EQ(tree.size(), 10000U);

@@ -71,7 +71,7 @@ unsigned Faults(const Json::Value& scene) {
 // INT_MIN as the code when an exception for the host left the module.
 Device::Outcome Serve(const Json::Value& scene, const std::string& method,
                       const std::set<int>& codes) {
-  Device::StopWatching();
+  Device::StopTracing();
   for (std::size_t rule = 0; rule < std::size(kRules); ++rule) {
     if ((Faults(scene) >> rule & 1U) != 0) {
       Device::AddFault(kRules[rule]);
