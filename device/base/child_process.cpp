@@ -18,10 +18,6 @@ namespace {
 
 constexpr int kCannotStart = 127;
 
-[[noreturn]] void FailFor(const char* what, int error) {
-  throw std::system_error(error, std::generic_category(), what);
-}
-
 // Holds every signal back, so that no handler of the caller's runs in a child that is to become
 // another program.
 class SignalsHeldBack {
@@ -106,7 +102,7 @@ ChildProcess ChildProcess::Start(const ProgramStart& start) {
   failure.writer.Close();
   int error = 0;
   if (read(failure.reader.Get(), &error, sizeof error) == sizeof error) {
-    FailFor(start.program.c_str(), error);
+    throw std::system_error(error, std::generic_category(), start.program);
   }
   return child;
 }
@@ -128,7 +124,7 @@ ChildProcess ChildProcess::Run(const std::function<int()>& body) {
 ChildProcess ChildProcess::Fork() {
   const pid_t pid = fork();
   if (pid < 0) {
-    FailFor("fork", errno);
+    ThrowErrno("fork");
   }
   return ChildProcess(pid);
 }

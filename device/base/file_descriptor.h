@@ -5,10 +5,16 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <string>
 #include <system_error>
 #include <utility>
 
 namespace Device {
+
+// Throws what errno says of an operation: "WHAT: REASON".
+[[noreturn]] inline void ThrowErrno(const std::string& what) {
+  throw std::system_error(errno, std::generic_category(), what);
+}
 
 class FileDescriptor {
  public:
@@ -41,7 +47,7 @@ struct Pipe {
   Pipe() {
     int ends[2];
     if (pipe2(ends, O_CLOEXEC) != 0) {
-      throw std::system_error(errno, std::generic_category(), "pipe");
+      ThrowErrno("pipe");
     }
     reader = FileDescriptor(ends[0]);
     writer = FileDescriptor(ends[1]);

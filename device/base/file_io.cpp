@@ -5,12 +5,19 @@
 
 #include <array>
 #include <cerrno>
-#include <cstring>
-#include <stdexcept>
-
-#include "device/base/file_descriptor.h"
+#include <filesystem>
 
 namespace Device {
+
+FileDescriptor OpenBesideProgram(const std::string& name, int flags) {
+  const std::filesystem::path path =
+      std::filesystem::read_symlink("/proc/self/exe").parent_path() / name;
+  FileDescriptor file(open(path.c_str(), flags | O_CLOEXEC));
+  if (!file) {
+    ThrowErrno(path.string());
+  }
+  return file;
+}
 
 std::string ReadTextFile(const std::string& path) {
   const FileDescriptor file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
@@ -22,7 +29,7 @@ std::string ReadTextFile(const std::string& path) {
     text.append(block.data(), got > 0 ? static_cast<std::size_t>(got) : 0);
   }
   if (got < 0) {
-    throw std::runtime_error(path + ": " + std::strerror(errno));
+    ThrowErrno(path);
   }
   return text;
 }

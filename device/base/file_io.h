@@ -5,7 +5,12 @@
 #include <string>
 #include <string_view>
 
+#include "device/base/file_descriptor.h"
+
 namespace Device {
+
+// A file beside the program's own, opened with the flags. Throws std::system_error that names it.
+FileDescriptor OpenBesideProgram(const std::string& name, int flags);
 
 // A file's text. Throws std::runtime_error that names the file and the reason.
 std::string ReadTextFile(const std::string& path);

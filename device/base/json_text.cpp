@@ -75,6 +75,22 @@ void CheckBytes(const std::string& text, int most_depth) {
 
 }  // namespace
 
+Json::Value JsonObject(std::initializer_list<std::pair<const char*, Json::Value>> members) {
+  Json::Value object(Json::objectValue);
+  for (const auto& [name, value] : members) {
+    object[name] = value;
+  }
+  return object;
+}
+
+Json::Value JsonArray(const std::vector<std::string>& texts) {
+  Json::Value array(Json::arrayValue);
+  for (const std::string& text : texts) {
+    array.append(text);
+  }
+  return array;
+}
+
 std::string ToText(const Json::Value& value) { return Json::writeString(LineWriter(), value); }
 
 std::string ToUtf8Text(const Json::Value& value) {

@@ -3,9 +3,15 @@
 
 #include <json/json.h>
 
+#include <initializer_list>
 #include <string>
+#include <utility>
+#include <vector>
 
 namespace Device {
+
+Json::Value JsonObject(std::initializer_list<std::pair<const char*, Json::Value>> members);
+Json::Value JsonArray(const std::vector<std::string>& texts);
 
 // Integers of 64 bits and doubles read back as they were.
 std::string ToText(const Json::Value& value);

@@ -1,5 +1,5 @@
 // "compress": one job from start to end, with its progress.
-#include <unistd.h>
+#include <poll.h>
 
 #include <algorithm>
 #include <chrono>
@@ -28,14 +28,16 @@ constexpr std::chrono::milliseconds kLongestPause(250);
 
 volatile std::sig_atomic_t is_interrupted = 0;
 
-void NoteInterrupt(int /*signal_number*/) { is_interrupted = 1; }
+void NoteInterrupt(int signal_number) {
+  if (signal_number != SIGCHLD) {
+    is_interrupted = 1;
+  }
+}
 
 // Paths as the text of a JSON array, so that a name may hold a comma.
 std::string ListText(std::vector<std::string>::const_iterator begin,
                      std::vector<std::string>::const_iterator end) {
-  Json::Value list(Json::arrayValue);
-  std::for_each(begin, end, [&](const std::string& path) { list.append(path); });
-  return ToText(list);
+  return ToText(JsonArray({begin, end}));
 }
 
 bool EndsWith(const std::string& text, const std::string& ending) {
@@ -45,12 +47,11 @@ bool EndsWith(const std::string& text, const std::string& ending) {
 
 Json::Value StartParams(const CompressOptions& options) {
   const auto dest = options.paths.end() - 1;
-  Json::Value params(Json::objectValue);
-  params["path"] = ListText(options.paths.begin(), dest);
-  params["dest_file_path"] = ListText(dest, options.paths.end());
-  params["format"] = !options.format.empty()  ? options.format
-                     : EndsWith(*dest, ".7z") ? "7z"
-                                              : "zip";
+  Json::Value params = JsonObject({{"path", ListText(options.paths.begin(), dest)},
+                                   {"dest_file_path", ListText(dest, options.paths.end())},
+                                   {"format", !options.format.empty()  ? options.format
+                                              : EndsWith(*dest, ".7z") ? "7z"
+                                                                       : "zip"}});
   if (!options.level.empty()) {
     params["level"] = options.level;
   }
@@ -107,9 +108,7 @@ class Job {
   }
 
   Outcome AskAboutTask(const std::string& method) {
-    Json::Value params(Json::objectValue);
-    params["taskid"] = task_id_;
-    return Ask(method, params);
+    return Ask(method, JsonObject({{"taskid", task_id_}}));
   }
 
   int Follow() {
@@ -127,7 +126,8 @@ class Job {
         return Report(outcome);
       }
       display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
-      Launcher::AwaitWorker(pause);
+      poll(nullptr, 0, static_cast<int>(pause.count()));  // a worker's end, a signal, ends it early
+      Launcher::Reap();
       pause = std::min(2 * pause, kLongestPause);
     }
   }
@@ -176,7 +176,7 @@ class Job {
 int CompressCommand(const CompressOptions& options) {
   Open(options.folder);
   Job job(options);
-  for (const int signal_number : {SIGINT, SIGTERM, SIGHUP}) {
+  for (const int signal_number : {SIGINT, SIGTERM, SIGHUP, SIGCHLD}) {
     std::signal(signal_number, NoteInterrupt);
   }
   return job.Run();

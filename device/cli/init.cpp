@@ -3,8 +3,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cerrno>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <iostream>
@@ -89,7 +87,7 @@ void WriteNoise(const fs::path& path, std::size_t size) {
     file.write(reinterpret_cast<const char*>(&word), std::min(sizeof word, size - at));
   }
   if (!file.flush()) {
-    throw std::runtime_error("sample file '" + path.string() + "': " + std::strerror(errno));
+    ThrowErrno("sample file '" + path.string() + "'");
   }
 }
 
@@ -102,7 +100,7 @@ void GiveToOwner(const fs::path& folder) {
   }
   for (const fs::directory_entry& entry : fs::recursive_directory_iterator(folder)) {
     if (lchown(entry.path().c_str(), owner->uid, kUsersGroup) != 0) {
-      throw std::runtime_error("owner of '" + entry.path().string() + "': " + std::strerror(errno));
+      ThrowErrno("owner of '" + entry.path().string() + "'");
     }
   }
 }

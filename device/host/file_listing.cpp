@@ -10,6 +10,7 @@
 #include <map>
 #include <memory>
 
+#include "device/base/json_text.h"
 #include "device/model/device.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/lumo/paths.h"
@@ -26,24 +27,19 @@ const char* KindOf(mode_t mode) {
 }
 
 Json::Value Entry(const std::string& name, const struct stat& status) {
-  Json::Value entry(Json::objectValue);
-  entry["name"] = name;
-  entry["kind"] = KindOf(status.st_mode);
-  entry["size"] = static_cast<Json::Int64>(S_ISDIR(status.st_mode) ? 0 : status.st_size);
-  entry["modified"] = static_cast<Json::Int64>(status.st_mtime);
-  return entry;
+  return JsonObject({{"name", name},
+                     {"kind", KindOf(status.st_mode)},
+                     {"size", Json::Int64{S_ISDIR(status.st_mode) ? 0 : status.st_size}},
+                     {"modified", Json::Int64{status.st_mtime}}});
 }
 
 Json::Value Body(const std::string& path, bool is_writable,
                  const std::map<std::string, Json::Value>& entries) {
-  Json::Value body(Json::objectValue);
-  body["path"] = path;
-  body["writable"] = is_writable;
-  body["entries"] = Json::Value(Json::arrayValue);
+  Json::Value list(Json::arrayValue);
   for (const auto& [name, entry] : entries) {
-    body["entries"].append(entry);
+    list.append(entry);
   }
-  return body;
+  return JsonObject({{"path", path}, {"writable", is_writable}, {"entries", list}});
 }
 
 // What the user has no access to at all is not shown.

@@ -7,9 +7,6 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <cerrno>
-#include <csignal>
-#include <ctime>
 #include <optional>
 #include <stdexcept>
 #include <system_error>
@@ -59,10 +56,7 @@ bool IsStandardErrorRead() {
 
 // False when the other side is gone.
 bool SendOutcome(int fd, const Outcome& outcome) {
-  Json::Value frame(Json::objectValue);
-  frame["code"] = outcome.code;
-  frame["data"] = outcome.data;
-  return WriteFrame(fd, ToText(frame));
+  return WriteFrame(fd, ToText(JsonObject({{"code", outcome.code}, {"data", outcome.data}})));
 }
 
 // False when the other side is gone without one.
@@ -163,29 +157,9 @@ Outcome Launcher::Call(const Request& request) {
   return outcome;
 }
 
-bool Launcher::Reap() {
-  bool has_reaped = false;
+void Launcher::Reap() {
   while (waitpid(-1, nullptr, WNOHANG) > 0) {
-    has_reaped = true;
   }
-  return has_reaped;
-}
-
-void Launcher::AwaitWorker(std::chrono::milliseconds pause) {
-  constexpr long kMilli = 1000;
-  sigset_t child_ended;
-  sigset_t saved;
-  sigemptyset(&child_ended);
-  sigaddset(&child_ended, SIGCHLD);
-  // Held back, the signal of one that ends from now on is not missed.
-  sigprocmask(SIG_BLOCK, &child_ended, &saved);
-  if (!Reap()) {
-    const timespec time = {static_cast<std::time_t>(pause.count() / kMilli),
-                           static_cast<long>(pause.count() % kMilli) * kMilli * kMilli};
-    sigtimedwait(&child_ended, nullptr, &time);
-    Reap();
-  }
-  sigprocmask(SIG_SETMASK, &saved, nullptr);
 }
 
 }  // namespace Device

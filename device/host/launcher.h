@@ -2,7 +2,6 @@
 // one that crashes costs that request alone.
 #pragma once
 
-#include <chrono>
 #include <memory>
 #include <string>
 
@@ -43,11 +42,8 @@ class Launcher {
   // not wait for one.
   FileDescriptor& AnswerStream() { return answer_; }
 
-  // Takes leave of workers that have ended. False when none has.
-  static bool Reap();
-
-  // The same, but waits for one, for `pause` at the most; a signal ends the waiting too.
-  static void AwaitWorker(std::chrono::milliseconds pause);
+  // Takes leave of workers that have ended.
+  static void Reap();
 
  private:
   // Null, and the host's error code in `code`, when no row serves the request.

@@ -5,11 +5,10 @@
 
 #include <algorithm>
 #include <atomic>
-#include <cerrno>
 #include <memory>
 #include <new>
-#include <system_error>
 
+#include "device/base/file_descriptor.h"
 #include "device/base/random_id.h"
 #include "device/model/device.h"
 
@@ -32,7 +31,7 @@ std::shared_ptr<Flag> MakeSharedFlag() {
   void* const memory =
       mmap(nullptr, sizeof(Flag), PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
   if (memory == MAP_FAILED) {
-    throw std::system_error(errno, std::generic_category(), "shared memory");
+    ThrowErrno("shared memory");
   }
   return {new (memory) Flag(false), [](Flag* flag) { munmap(flag, sizeof(Flag)); }};
 }

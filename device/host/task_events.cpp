@@ -76,9 +76,7 @@ class Watcher {
     }
     for (const auto& [id, task] : tasks_) {
       if (tasks.count(id) == 0) {
-        Json::Value gone(Json::objectValue);
-        gone["taskid"] = id;
-        Send("gone", gone);
+        Send("gone", JsonObject({{"taskid", id}}));
       }
     }
     tasks_ = std::move(tasks);
@@ -86,16 +84,11 @@ class Watcher {
 
   void SendNotifications() {
     for (const NotificationRow& row : StoreOf(user_).NotificationsAfter(last_)) {
-      Json::Value data(Json::objectValue);
-      data["time"] = static_cast<Json::Int64>(row.time);
-      data["taskid"] = row.task;
-      data["title"] = row.title;
-      data["message"] = row.message;
-      data["arguments"] = Json::Value(Json::arrayValue);
-      for (const std::string& argument : row.arguments) {
-        data["arguments"].append(argument);
-      }
-      Send("notification", data);
+      Send("notification", JsonObject({{"time", Json::Int64{row.time}},
+                                       {"taskid", row.task},
+                                       {"title", row.title},
+                                       {"message", row.message},
+                                       {"arguments", JsonArray(row.arguments)}}));
       last_ = row.number;
     }
   }

@@ -10,13 +10,13 @@
 #include <cerrno>
 #include <chrono>
 #include <cstring>
-#include <filesystem>
 #include <iostream>
 #include <stdexcept>
 #include <system_error>
 #include <utility>
 
 #include "device/base/child_process.h"
+#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/host/web_request.h"
 #include "device/model/device.h"
@@ -31,16 +31,6 @@ constexpr char kLockFile[] = "serve.lock";
 constexpr std::size_t kMostRequests = 384;  // at the same time; further ones wait
 constexpr int kRestartPauseMs = 500;
 constexpr std::chrono::seconds kFrontEndGrace(6);
-
-FileDescriptor OpenBeside(const char* name) {
-  const std::string path =
-      (std::filesystem::read_symlink("/proc/self/exe").parent_path() / name).string();
-  FileDescriptor file(open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!file) {
-    throw std::runtime_error(path + ": " + std::strerror(errno));
-  }
-  return file;
-}
 
 // A lock that belongs to this process alone: no worker takes it along.
 FileDescriptor LockDevice() {
@@ -66,7 +56,8 @@ std::pair<std::string, std::string> SessionCookie(const std::string& value) {
 }  // namespace
 
 FrontEndFiles::FrontEndFiles()
-    : program(OpenBeside(kFrontEndProgram)), page(OpenBeside(kPageFolder)) {}
+    : program(OpenBesideProgram(kFrontEndProgram, O_RDONLY)),
+      page(OpenBesideProgram(kPageFolder, O_RDONLY)) {}
 
 WebHost::WebHost(const FrontEndFiles& files, std::string listen)
     : files_(files), listen_(std::move(listen)), lock_(LockDevice()) {
@@ -105,7 +96,7 @@ bool WebHost::Run() {
 void WebHost::StartFrontEnd() {
   int ends[2];
   if (socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, ends) != 0) {
-    throw std::runtime_error(std::string("socket pair: ") + std::strerror(errno));
+    ThrowErrno("socket pair");
   }
   control_ = FileDescriptor(ends[0]);
   const FileDescriptor front_end_side(ends[1]);

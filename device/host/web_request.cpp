@@ -35,10 +35,7 @@ Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& a
   request.user = user;
   request.session_id = asked["session"].asString();
   const Outcome outcome = launcher.CallSafely(request);
-  Json::Value body(Json::objectValue);
-  body["code"] = outcome.code;
-  body["data"] = outcome.data;
-  return Answer(kHttpOk, body);
+  return Answer(kHttpOk, JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
 }
 
 Answer ListFiles(const std::string& user, const std::string& path) {
@@ -46,23 +43,20 @@ Answer ListFiles(const std::string& user, const std::string& path) {
   if (listing.error == 0) {
     return Answer(kHttpOk, listing.body);
   }
-  Json::Value body(Json::objectValue);
-  body["code"] = listing.error;
-  body["error"] = ErrorText(listing.error);
   const bool is_forbidden =
       listing.error == KAVO::kErrNoPrivilege || listing.error == KAVO::kErrOutsideShare;
-  return Answer(is_forbidden ? kHttpForbidden : kHttpNotFound, body);
+  return Answer(is_forbidden ? kHttpForbidden : kHttpNotFound,
+                JsonObject({{"code", listing.error}, {"error", ErrorText(listing.error)}}));
 }
 
 Answer ListTasks(const std::string& user) {
-  Json::Value body(Json::objectValue);
-  body["tasks"] = Json::Value(Json::arrayValue);
+  Json::Value tasks(Json::arrayValue);
   for (const TaskRow& row : AllTasks(user)) {
     if (HasData(row)) {
-      body["tasks"].append(TaskView(row));
+      tasks.append(TaskView(row));
     }
   }
-  return Answer(kHttpOk, body);
+  return Answer(kHttpOk, JsonObject({{"tasks", tasks}}));
 }
 
 Answer ListCodes() {
@@ -113,10 +107,7 @@ void Serve(Launcher& launcher, const Json::Value& asked) {
 }  // namespace
 
 Json::Value SessionBody(const std::string& user) {
-  Json::Value body(Json::objectValue);
-  body["user"] = user;
-  body["codepage"] = TheDevice().config.FindUser(user)->codepage;
-  return body;
+  return JsonObject({{"user", user}, {"codepage", TheDevice().config.FindUser(user)->codepage}});
 }
 
 void ServeWebRequest(Launcher& launcher, FileDescriptor stream) {

@@ -76,9 +76,7 @@ Answer::Answer(int status, const Json::Value& json)
     : status(status), body(json.isNull() ? "" : ToUtf8Text(json) + "\n") {}
 
 Answer Refusal(int status, const std::string& reason) {
-  Json::Value body(Json::objectValue);
-  body["error"] = reason;
-  return Answer(status, body);
+  return Answer(status, JsonObject({{"error", reason}}));
 }
 
 bool SendAnswer(int stream, const Answer& answer) {

@@ -4,8 +4,6 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cerrno>
-#include <cstring>
 #include <filesystem>
 #include <iostream>
 #include <memory>
@@ -26,17 +24,6 @@ constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
 std::unique_ptr<OpenDevice>& Instance() {
   static std::unique_ptr<OpenDevice> device;
   return device;
-}
-
-// What the device needs beside its executable is opened at once: later there may be no way to walk
-// there.
-FileDescriptor OpenBesideExecutable(const char* name, int flags) {
-  const fs::path path = fs::read_symlink("/proc/self/exe").parent_path() / name;
-  FileDescriptor file(open(path.c_str(), flags | O_CLOEXEC));
-  if (!file) {
-    throw std::runtime_error(path.string() + ": " + std::strerror(errno));
-  }
-  return file;
 }
 
 Config ReadConfig(const fs::path& root) {
@@ -62,8 +49,9 @@ std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
     }
     device->real_volumes.push_back(fs::canonical(device->VolumePath(volume)).string());
   }
-  device->archiver = OpenBesideExecutable(kArchiverName, O_PATH);
-  device->module = OpenBesideExecutable(kModuleName, O_RDONLY);
+  // Opened at once: later there may be no way to walk there.
+  device->archiver = OpenBesideProgram(kArchiverName, O_PATH);
+  device->module = OpenBesideProgram(kModuleName, O_RDONLY);
   device->switches_identity = geteuid() == 0;
   if (device->switches_identity) {
     MakeReachable(device->root);

@@ -4,12 +4,12 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <memory>
 #include <stdexcept>
 
+#include "device/base/file_descriptor.h"
 #include "device/model/device.h"
 
 namespace Device {
@@ -22,19 +22,15 @@ constexpr mode_t kFolderMode = 0755;
 constexpr mode_t kPrivateMode = 0700;
 constexpr mode_t kConfigMode = 0600;  // it holds password hashes
 
-[[noreturn]] void FailFor(const std::string& what) {
-  throw std::runtime_error(what + ": " + std::strerror(errno));
-}
-
 void MakeFolder(const std::string& path, mode_t mode) {
   if ((mkdir(path.c_str(), mode) != 0 && errno != EEXIST) || chmod(path.c_str(), mode) != 0) {
-    FailFor("folder '" + path + "'");
+    ThrowErrno("folder '" + path + "'");
   }
 }
 
 void GiveTo(const std::string& path, const User& user) {
   if (geteuid() == 0 && chown(path.c_str(), user.uid, kUsersGroup) != 0) {
-    FailFor("owner of '" + path + "'");
+    ThrowErrno("owner of '" + path + "'");
   }
 }
 
@@ -68,7 +64,7 @@ std::string AclText(const Config& config, const Share& share, acl_type_t type) {
 void SetAcl(const std::string& path, const std::string& text, acl_type_t type) {
   const std::unique_ptr<void, int (*)(void*)> acl(acl_from_text(text.c_str()), acl_free);
   if (acl == nullptr || acl_set_file(path.c_str(), type, static_cast<acl_t>(acl.get())) != 0) {
-    FailFor("access list of '" + path + "'");
+    ThrowErrno("access list of '" + path + "'");
   }
 }
 
@@ -110,7 +106,7 @@ void MakeFolders(const std::string& root, const Config& config, const std::strin
   std::ofstream file(root + "/" + kConfigFile);
   if (!(file << config_text << std::flush) ||
       chmod((root + "/" + kConfigFile).c_str(), kConfigMode) != 0) {
-    FailFor(kConfigFile);
+    ThrowErrno(kConfigFile);
   }
 }
 

@@ -101,7 +101,7 @@ void OpenTrace(const std::string& path) {
   constexpr mode_t kTraceMode = 0600;  // arguments may hold passwords
   FileDescriptor file(open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, kTraceMode));
   if (!file) {
-    throw std::runtime_error("cannot open trace file '" + path + "': " + std::strerror(errno));
+    ThrowErrno("cannot open trace file '" + path + "'");
   }
   TraceFile() = std::move(file);
 }
@@ -145,13 +145,7 @@ Json::Value ToJson(const char* text) { return text == nullptr ? Json::Value() : 
 Json::Value ToJson(const std::string& text) { return {text}; }
 Json::Value ToJson(const Json::Value& value) { return value; }
 
-Json::Value ToJson(const std::vector<std::string>& texts) {
-  Json::Value array(Json::arrayValue);
-  for (const std::string& text : texts) {
-    array.append(text);
-  }
-  return array;
-}
+Json::Value ToJson(const std::vector<std::string>& texts) { return JsonArray(texts); }
 
 Json::Value ToJson(char* const* argument_vector) {
   Json::Value array(Json::arrayValue);
@@ -191,12 +185,12 @@ void Operation::Trace(const Json::Value& result) const {
     return;
   }
   const int saved_errno = errno;
-  Json::Value line(Json::objectValue);
-  line["pid"] = getpid();
-  line["call"] = name_;
-  line["args"] = arguments_.isNull() ? Json::Value(Json::arrayValue) : arguments_;
-  line["result"] = result;
-  const std::string text = ToText(line) + "\n";
+  const std::string text =
+      ToText(JsonObject({{"pid", getpid()},
+                         {"call", name_},
+                         {"args", arguments_.isNull() ? Json::arrayValue : arguments_},
+                         {"result", result}})) +
+      "\n";
   // One write per line, so that processes do not mix theirs. A trace that cannot be written is
   // lost.
   if (write(TraceFile().Get(), text.data(), text.size()) < 0) {

@@ -217,17 +217,13 @@ void TaskStore::RemoveWorker(pid_t pid) {
 }
 
 void TaskStore::AddNotification(const NotificationRow& row) {
-  Json::Value arguments(Json::arrayValue);
-  for (const std::string& argument : row.arguments) {
-    arguments.append(argument);
-  }
   Statement(database_, "INSERT INTO notifications VALUES (?, ?, ?, ?, ?, ?)")
       .Bind(row.time)
       .Bind(row.app)
       .Bind(row.task)
       .Bind(row.title)
       .Bind(row.message)
-      .Bind(ToText(arguments))
+      .Bind(ToText(JsonArray(row.arguments)))
       .Step();
 }
 

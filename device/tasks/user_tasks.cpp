@@ -46,11 +46,8 @@ Json::Value Destination(const TaskRow& row) {
 }
 
 void StoreFailure(const std::string& user, TaskRow& row) {
-  Json::Value item(Json::objectValue);
-  item["path"] = Destination(row);
-  item["code"] = KAVO::kErrGeneral;
   Json::Value errors(Json::arrayValue);
-  errors.append(item);
+  errors.append(JsonObject({{"path", Destination(row)}, {"code", KAVO::kErrGeneral}}));
   StoredValue data = Property(row, kPropData);
   data.members[kDataErrors] = ToText(errors);
   const std::int64_t version = row.version;
@@ -113,13 +110,14 @@ Json::Value TaskView(const TaskRow& row) {
   const StoredValue& data = Property(row, kPropData);
   const Json::Value progress = Property(row, "progress").Value();
   const Json::Value total_size = data.Member("total_size");
-  Json::Value view(Json::objectValue);
-  view["taskid"] = row.id;
-  view["dest_file_path"] = Destination(row);
-  view["state"] = HasFailed(row) ? "failed" : row.finished ? "finished" : "running";
-  view["progress"] = progress.isNumeric() ? progress.asDouble() : 0.0;
-  view["total_size"] = total_size.isNull() ? Json::Value(0U) : total_size;
-  view["started"] = InfoOf(row).get("started", 0);
+  Json::Value view = JsonObject({{"taskid", row.id},
+                                 {"dest_file_path", Destination(row)},
+                                 {"state", HasFailed(row) ? "failed"
+                                           : row.finished ? "finished"
+                                                          : "running"},
+                                 {"progress", progress.isNumeric() ? progress.asDouble() : 0.0},
+                                 {"total_size", total_size.isNull() ? Json::Value(0U) : total_size},
+                                 {"started", InfoOf(row).get("started", 0)}});
   if (HasFailed(row)) {
     view[kDataErrors] = data.Member(kDataErrors);
   }

@@ -87,11 +87,10 @@ Json::Value ParseBody(const std::string& content_type, const std::string& body) 
 }
 
 Json::Value ApiRequest(const Json::Value& body) {
-  Json::Value request(Json::objectValue);
-  request["api"] = TextField(body, "api");
-  request["method"] = TextField(body, "method");
-  request["version"] = VersionOf(body["version"]);
-  request["params"] = body.get("params", body);
+  Json::Value request = Device::JsonObject({{"api", TextField(body, "api")},
+                                            {"method", TextField(body, "method")},
+                                            {"version", VersionOf(body["version"])},
+                                            {"params", body.get("params", body)}});
   if (!request["params"].isObject()) {
     throw std::runtime_error("'params' is not an object");
   }

@@ -44,10 +44,7 @@ void Refuse(Response& response, int status, const std::string& reason) {
 }
 
 Json::Value Asked(const Request& request, const char* kind) {
-  Json::Value asked(Json::objectValue);
-  asked["kind"] = kind;
-  asked["session"] = SessionOf(request);
-  return asked;
+  return Device::JsonObject({{"kind", kind}, {"session", SessionOf(request)}});
 }
 
 // Has the request served by a process of the launcher's.
@@ -213,10 +210,8 @@ void FrontEnd::Post(const char* route,
 }
 
 void FrontEnd::SignIn(const Request& /*request*/, const Json::Value& body, Response& response) {
-  Json::Value asked(Json::objectValue);
-  asked["user"] = TextField(body, "user");
-  asked["password"] = TextField(body, "password");
-  const std::string text = Device::ToText(asked);
+  const std::string text = Device::ToText(Device::JsonObject(
+      {{"user", TextField(body, "user")}, {"password", TextField(body, "password")}}));
   if (text.size() > Device::kMostControlBytes) {
     Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
     return;

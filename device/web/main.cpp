@@ -10,7 +10,6 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
-#include <cstring>
 #include <iostream>
 #include <stdexcept>
 #include <string>
@@ -23,17 +22,13 @@ namespace {
 
 constexpr uid_t kNobody = 65534;
 
-[[noreturn]] void FailFor(const std::string& what) {
-  throw std::runtime_error(what + ": " + std::strerror(errno));
-}
-
 void GiveUpRights() {
   if (geteuid() == 0 && (setgroups(0, nullptr) != 0 || setresgid(kNobody, kNobody, kNobody) != 0 ||
                          setresuid(kNobody, kNobody, kNobody) != 0)) {
-    FailFor("cannot give up root's rights");
+    Device::ThrowErrno("cannot give up root's rights");
   }
   if (prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
-    FailFor("cannot give up new rights");
+    Device::ThrowErrno("cannot give up new rights");
   }
 }
 
@@ -87,7 +82,7 @@ void Serve(const std::string& listen, int page) {
     throw std::runtime_error("cannot listen on " + listen + ": no such address");
   }
   if (port < 0) {
-    FailFor("cannot listen on " + listen);
+    Device::ThrowErrno("cannot listen on " + listen);
   }
   GiveUpRights();
   sigset_t ending;

@@ -104,7 +104,7 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
         ProgramOutput{std::move(pipe.reader), std::move(child), false, 0, {}});
     FILE* const stream = fopencookie(source.get(), mode, {ReadOutput, nullptr, nullptr, nullptr});
     if (stream == nullptr) {
-      throw std::system_error(errno, std::generic_category(), "stream");
+      ThrowErrno("stream");
     }
     Streams().emplace(stream, std::move(source));
     return stream;

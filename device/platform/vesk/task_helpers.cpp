@@ -113,12 +113,10 @@ int WaitForTaskDataKeyReady(Vesk::Task* task, const char* property, const char* 
 
 Json::Value LumoLibBkgTaskInfoCreate(const Json::Value& data, const std::string& kind) {
   return Operation("LumoLibBkgTaskInfoCreate", data, kind).Run([&] {
-    Json::Value info(Json::objectValue);
-    info["kind"] = kind;
-    info["task"] = data["taskid"];
-    info["title"] = data["params"]["dest_file_path"];
-    info["started"] = static_cast<Json::Int64>(std::time(nullptr));
-    return info;
+    return Device::JsonObject({{"kind", kind},
+                               {"task", data["taskid"]},
+                               {"title", data["params"]["dest_file_path"]},
+                               {"started", Json::Int64{std::time(nullptr)}}});
   });
 }
 
