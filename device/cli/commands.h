@@ -41,9 +41,6 @@ struct CompressOptions {
 // Runs one compress job to its end, showing its progress.
 int CompressCommand(const CompressOptions& options);
 
-// Serves the device over HTTP on ADDRESS:PORT until it is told to end.
-int ServeCommand(const std::string& folder, const std::string& listen);
-
 // List a user's tasks or desktop notifications, a line each.
 int TasksCommand(const std::string& folder, const std::string& user);
 int NotificationsCommand(const std::string& folder, const std::string& user);

@@ -1,5 +1,6 @@
 // "compress": one job from start to end, with its progress.
 #include <poll.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
@@ -11,7 +12,6 @@
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/cli/commands.h"
-#include "device/cli/progress_display.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
 #include "device/model/device.h"
@@ -25,6 +25,9 @@ constexpr char kApi[] = "KAVO.Zantro.Compress";
 constexpr int kApiVersion = 3;
 constexpr std::chrono::milliseconds kFirstPause(10);
 constexpr std::chrono::milliseconds kLongestPause(250);
+
+constexpr int kBarWidth = 40;
+constexpr char kEraseLine[] = "\r\x1b[K";
 
 volatile std::sig_atomic_t is_interrupted = 0;
 
@@ -74,6 +77,43 @@ Json::Value StartParams(const CompressOptions& options) {
 
 void PrintError(const std::string& path, int code) {
   std::cout << path << ": " << code << ' ' << ErrorText(code) << '\n';
+}
+
+// A job's progress on standard output: a bar on a terminal, a line per change elsewhere.
+class ProgressDisplay {
+ public:
+  ProgressDisplay();
+
+  // `percent` from 0 to 100. Draws nothing when it has not changed.
+  void Show(int percent);
+  // Takes the bar off the terminal.
+  void Clear() const;
+
+ private:
+  bool is_terminal_;
+  int shown_ = -1;
+};
+
+ProgressDisplay::ProgressDisplay() : is_terminal_(isatty(STDOUT_FILENO) != 0) {}
+
+void ProgressDisplay::Show(int percent) {
+  if (percent == shown_) {
+    return;
+  }
+  shown_ = percent;
+  if (!is_terminal_) {
+    std::cout << percent << " %" << std::endl;
+    return;
+  }
+  const int filled = std::clamp(percent, 0, 100) * kBarWidth / 100;
+  std::cout << kEraseLine << '[' << std::string(filled, '#') << std::string(kBarWidth - filled, ' ')
+            << "] " << percent << " %" << std::flush;
+}
+
+void ProgressDisplay::Clear() const {
+  if (is_terminal_) {
+    std::cout << kEraseLine << std::flush;
+  }
 }
 
 // One job: the requests that a client of the API makes.

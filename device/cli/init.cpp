@@ -1,5 +1,4 @@
 // "init": makes a device, with sample files when nothing else is asked for.
-#include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 

@@ -8,6 +8,8 @@
 #include <iostream>
 
 #include "device/cli/commands.h"
+#include "device/host/web_host.h"
+#include "device/model/device.h"
 #include "device/platform/operations.h"
 
 namespace {
@@ -141,7 +143,9 @@ int Run(int argc, char** argv) {
     return Device::CompressCommand(line.compress);
   }
   if (serve->parsed()) {
-    return Device::ServeCommand(line.folder, line.listen);
+    const Device::FrontEndFiles files;
+    Device::Open(line.folder);
+    return Device::WebHost(files, line.listen).Run() ? Device::kExitDone : Device::kExitUsage;
   }
   if (tasks->parsed()) {
     return Device::TasksCommand(line.folder, line.user);

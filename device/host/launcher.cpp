@@ -18,8 +18,8 @@
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
 #include "device/platform/kavo/request.h"
-#include "device/platform/lumo/errors.h"
 #include "device/tasks/task_store.h"
+#include "platform/kavo/error_codes.h"
 
 namespace Device {
 

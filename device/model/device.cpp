@@ -1,7 +1,6 @@
 #include "device/model/device.h"
 
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <filesystem>

@@ -7,7 +7,6 @@
 #include <array>
 #include <cerrno>
 #include <csignal>
-#include <cstring>
 #include <stdexcept>
 
 #include "device/base/file_descriptor.h"

@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <iterator>
-#include <stdexcept>
 #include <utility>
 
 #include "device/base/json_text.h"

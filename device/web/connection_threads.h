@@ -4,26 +4,21 @@
 #include <httplib.h>
 
 #include <condition_variable>
-#include <deque>
 #include <functional>
 #include <mutex>
 
 namespace Web {
 
-// The threads end with the process.
+// Further connections wait to be accepted. The threads end with the process.
 class ConnectionThreads : public httplib::TaskQueue {
  public:
   void enqueue(std::function<void()> connection) override;
   void shutdown() override {}
 
  private:
-  void Work();
-
   std::mutex mutex_;
-  std::condition_variable is_waiting_;
-  std::deque<std::function<void()>> connections_;
-  std::size_t threads_ = 0;
-  std::size_t idle_ = 0;
+  std::condition_variable has_room_;
+  int threads_ = 0;
 };
 
 }  // namespace Web

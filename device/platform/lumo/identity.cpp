@@ -11,7 +11,6 @@
 #include "device/platform/host_services.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/operations.h"
-#include "platform/klib/system.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {

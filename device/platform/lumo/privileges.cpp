@@ -10,7 +10,6 @@
 #include "device/platform/lumo/identity.h"
 #include "device/platform/lumo/paths.h"
 #include "device/platform/operations.h"
-#include "platform/klib/system.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {

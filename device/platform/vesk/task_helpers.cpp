@@ -12,7 +12,6 @@
 #include <thread>
 
 #include "device/base/json_text.h"
-#include "device/model/device.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
 #include "device/platform/vesk/task_state.h"

@@ -2,13 +2,11 @@
 #include <syslog.h>
 
 #include <cstdarg>
-#include <cstdint>
 #include <ctime>
 #include <memory>
 #include <stdexcept>
 #include <utility>
 
-#include "device/base/json_text.h"
 #include "device/base/random_id.h"
 #include "device/platform/host_services.h"
 #include "device/platform/operations.h"
