@@ -122,23 +122,6 @@ TEST_F(ArchiverTest, KeepsEveryNameWhateverItHolds) {
   }
 }
 
-TEST_F(ArchiverTest, PacksNamedFilesOfEverySize) {
-  for (const size_t size : {1, 255, 256, 20000}) {
-    Strings sources;
-    Tree expected;
-    for (int number = 0; number < 64; ++number) {
-      const std::string name = std::to_string(size) + "-" + std::to_string(number);
-      const std::string text(size, static_cast<char>('0' + number));
-      WriteFile(share / name, text);
-      sources.push_back(name);
-      expected.insert(name + "=" + text);
-    }
-    const std::string archive = std::to_string(size);
-    Good(archive, sources, {"a", "", "", ""});
-    EXPECT_EQ(Unpacked(out / archive), expected);
-  }
-}
-
 TEST_F(ArchiverTest, StoresTimesInTheZoneThatHolds) {
   constexpr std::time_t kTime = 1'700'000'000;  // 7z rounds odd seconds
   const timespec times[] = {{kTime, 0}, {kTime, 0}};
@@ -332,6 +315,13 @@ TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
     EXPECT_EQ(ReadFile(out / "new"), other);
     EXPECT_EQ(InOut(), Strings{"new"});
   }
+}
+
+TEST_F(ArchiverTest, SaysAHundredPercentWhenTheArchiveIsThere) {
+  const auto run = Pack({}, 100 << 20);
+  EXPECT_FALSE(fs::exists(out / "new"));
+  EXPECT_TRUE(run->ReadUntil("Progress: 100\n"));
+  EXPECT_TRUE(fs::exists(out / "new"));
 }
 
 TEST_F(ArchiverTest, HidesThePasswordFromOtherUsers) {

@@ -34,18 +34,6 @@ TEST_F(SessionTest, ItsEndReachesProcessesThatAreOnTheirWay) {
   }
 }
 
-TEST_F(SessionTest, AUsersOldestEndsWhenThereAreTooMany) {
-  const std::string bobs = Device::SignIn("bob");
-  const std::string first = Device::SignIn("alice");
-  const std::string second = Device::SignIn("alice");
-  for (int more = 0; more < 15; ++more) {
-    Device::SignIn("alice");
-  }
-  EXPECT_EQ(Device::UserOfSession(first), "");
-  EXPECT_EQ(Device::UserOfSession(second), "alice");
-  EXPECT_EQ(Device::UserOfSession(bobs), "bob");
-}
-
 TEST_F(SessionTest, EachWrongPasswordAfterTheTenthDoublesTheWait) {
   using std::chrono::seconds;
   Device::SignInGate gate;

@@ -1,5 +1,4 @@
 // Following a job and ending it, from requests of their own.
-#include <sched.h>
 #include <sqlite3.h>
 #include <sys/stat.h>
 #include <unistd.h>
@@ -109,33 +108,6 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
   }
   EXPECT_EQ(Ask("stop", task_id).code, 0);
   EXPECT_TRUE(Group(Worker()).empty());
-}
-
-TEST_F(TaskTest, FromTheFifthJobAtOnceOnAllYield) {
-  Strings tasks;
-  std::vector<pid_t> workers;
-  const auto expect_policy = [&](int policy) {
-    for (const pid_t worker : workers) {
-      std::set<pid_t> processes = Group(worker);
-      processes.insert(worker);
-      for (const pid_t pid : processes) {
-        EXPECT_EQ(sched_getscheduler(pid), policy) << tasks.size();
-      }
-    }
-  };
-  for (int job = 1; job <= 4; ++job) {
-    Watch();
-    tasks.push_back(StartEndlessJob(R"({"format":"7z","level":"fastest"})"));
-    ASSERT_TRUE(IsPacking());
-    workers.push_back(Worker());
-  }
-  expect_policy(SCHED_OTHER);
-  tasks.push_back(StartEndlessJob());
-  workers.push_back(Worker());
-  expect_policy(SCHED_IDLE);
-  for (const std::string& task_id : tasks) {
-    EXPECT_EQ(Ask("stop", task_id).code, 0);
-  }
 }
 
 TEST_F(TaskTest, AKilledJobIsReportedAsFailed) {

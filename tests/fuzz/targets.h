@@ -9,8 +9,6 @@
 
 #include "tests/programs.h"
 
-void FuzzArchiverCommandLine(const std::string& input);
-void FuzzArchiverOutput(const std::string& input);
 void FuzzDeviceConfig(const std::string& input);
 void FuzzStagingList(const std::string& input);
 void FuzzStartRequest(const std::string& input);
@@ -21,8 +19,6 @@ struct FuzzTarget {
   void (*run)(const std::string& input);
 };
 inline constexpr FuzzTarget kFuzzTargets[] = {
-    {"archiver_command_line", FuzzArchiverCommandLine},
-    {"archiver_output", FuzzArchiverOutput},
     {"device_config", FuzzDeviceConfig},
     {"staging_list", FuzzStagingList},
     {"start_request", FuzzStartRequest},
