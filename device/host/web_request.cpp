@@ -2,7 +2,9 @@
 
 #include <syslog.h>
 
+#include <optional>
 #include <stdexcept>
+#include <utility>
 
 #include "device/base/frame.h"
 #include "device/base/json_text.h"
@@ -25,12 +27,12 @@ void TakeIdentity(const std::string& session_id, const std::string& user) {
   }
 }
 
-Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& asked) {
+Answer CallApi(Launcher& launcher, const std::string& user, Json::Value& asked) {
   Request request;
   request.api = asked["api"].asString();
   request.method = asked["method"].asString();
   request.version = asked["version"].asInt();
-  request.params = asked["params"];
+  request.params = std::move(asked["params"]);  // may be large, and a worker inherits it
   request.is_followed = asked["followed"].asBool();
   request.user = user;
   request.session_id = asked["session"].asString();
@@ -79,7 +81,7 @@ void StreamEvents(int stream, const std::string& user, const std::string& sessio
   }
 }
 
-void Serve(Launcher& launcher, const Json::Value& asked) {
+void Serve(Launcher& launcher, Json::Value asked) {
   const int stream = launcher.AnswerStream().Get();
   const std::string kind = asked["kind"].asString();
   const std::string session_id = asked["session"].asString();
@@ -114,8 +116,10 @@ void ServeWebRequest(Launcher& launcher, FileDescriptor stream) {
   launcher.AnswerStream() = std::move(stream);
   const int answer = launcher.AnswerStream().Get();
   try {
-    if (const std::optional<std::string> text = ReadFrame(answer)) {
-      Serve(launcher, ParseJson(*text));
+    if (std::optional<std::string> text = ReadFrame(answer)) {
+      Json::Value asked = ParseJson(*text);
+      text.reset();  // it may be large
+      Serve(launcher, std::move(asked));
     }
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "web request: %s", error.what());

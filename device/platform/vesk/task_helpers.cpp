@@ -1,4 +1,5 @@
 // What the task manager's library offers beside its classes: waiting, saving, removing, killing.
+#include <malloc.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -92,7 +93,10 @@ int SaveTaskData(Vesk::Task* task, Json::Value& data, float progress) {
     std::map<std::string, Device::StoredValue> properties;
     properties.emplace(Device::kPropData, data);
     properties.emplace(Device::kPropProgress, Json::Value(static_cast<double>(progress)));
-    return task->state->StoreNow(std::move(properties), false) ? 1 : 0;
+    const bool is_stored = task->state->StoreNow(std::move(properties), false);
+    // The data of a job of many sources is large, and it may be long until the next progress.
+    malloc_trim(0);
+    return is_stored ? 1 : 0;
   });
 }
 
