@@ -4,8 +4,7 @@
 #include <sys/stat.h>
 
 #include <cerrno>
-#include <cstdlib>
-#include <memory>
+#include <filesystem>
 #include <set>
 #include <string_view>
 
@@ -17,21 +16,20 @@ namespace {
 
 constexpr char kCannotPack[] = "cannot pack";
 
-struct Free {
-  void operator()(char* text) const { std::free(text); }
-};
+namespace fs = std::filesystem;
 
 std::string RealPath(const std::string& path) {
-  const std::unique_ptr<char, Free> resolved(realpath(path.c_str(), nullptr));
-  if (!resolved) {
-    throw SystemFailure("cannot resolve", path, errno);
+  std::error_code error;
+  const std::string resolved = fs::canonical(path, error);
+  if (error) {
+    throw SystemFailure("cannot resolve", path, error.value());
   }
-  return resolved.get();
+  return resolved;
 }
 
 std::string Parent(const std::string& path) {
-  const size_t slash = path.rfind('/');
-  return slash == 0 ? "/" : slash == std::string::npos ? "." : path.substr(0, slash);
+  const std::string parent = fs::path(path).parent_path();
+  return parent.empty() ? "." : parent;
 }
 
 bool IsStagingFolder(const std::string& list_path) {

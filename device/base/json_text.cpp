@@ -1,6 +1,7 @@
 #include "device/base/json_text.h"
 
 #include <algorithm>
+#include <charconv>
 #include <cstdio>
 #include <memory>
 #include <stdexcept>
@@ -11,13 +12,8 @@ namespace Device {
 
 namespace {
 
-constexpr char kHexDigits[] = "0123456789abcdefABCDEF";
+constexpr char kHexDigits[] = "0123456789abcdef";
 constexpr int kHexBase = 16;
-constexpr unsigned long kFirstHighSurrogate = 0xD800;
-constexpr unsigned long kLastHighSurrogate = 0xDBFF;
-constexpr unsigned long kFirstByteEscape = 0xDC80;
-constexpr unsigned long kLastByteEscape = 0xDCFF;
-constexpr unsigned long kFirstByte = 0x80;
 
 const Json::StreamWriterBuilder& LineWriter() {
   static const Json::StreamWriterBuilder kWriter = [] {
@@ -127,28 +123,22 @@ Json::Value ParseJson(const std::string& text, int depth) {
   return value;
 }
 
-std::string DecodeByteEscapes(std::string json) {
-  constexpr std::size_t kEscape = sizeof "\\udc80" - 1;
-  if (json.find("\\u") == std::string::npos) {
-    return json;
-  }
-  const auto code_at = [&](std::size_t at) {
-    const bool is_escape = at + kEscape <= json.size() && json[at] == '\\' && json[at + 1] == 'u';
-    const std::string digits = is_escape ? json.substr(at + 2, kEscape - 2) : "";
-    const bool is_code = is_escape && digits.find_first_not_of(kHexDigits) == std::string::npos;
-    return is_code ? std::stoul(digits, nullptr, kHexBase) : 0;
-  };
+std::string DecodeByteEscapes(const std::string& json) {
+  constexpr std::size_t kDigits = 4;
+  constexpr std::size_t kEscape = 2 + kDigits;  // "\\udc80"
   std::string decoded;
   for (std::size_t at = 0; at < json.size();) {
-    const unsigned long code = code_at(at);
     std::size_t length = json[at] == '\\' ? 2 : 1;  // as it stands
-    if (code >= kFirstByteEscape && code <= kLastByteEscape) {
-      decoded += static_cast<char>(code - kFirstByteEscape + kFirstByte);
-      at += kEscape;
-      continue;
-    }
-    if (code >= kFirstHighSurrogate && code <= kLastHighSurrogate) {
-      length = 2 * kEscape;  // with the other half of the pair
+    if (json.compare(at, 2, "\\u") == 0 && at + kEscape <= json.size()) {
+      const char* const digits = json.data() + at + 2;
+      unsigned code = 0;
+      const auto [end, error] = std::from_chars(digits, digits + kDigits, code, kHexBase);
+      if (end == digits + kDigits && code >= 0xDC80 && code <= 0xDCFF) {
+        decoded += static_cast<char>(code - 0xDC00);
+        at += kEscape;
+        continue;
+      }
+      length = code >= 0xD800 && code <= 0xDBFF ? 2 * kEscape : kEscape;  // a pair stays together
     }
     decoded.append(json, at, length);
     at += length;

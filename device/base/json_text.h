@@ -32,6 +32,6 @@ Json::Value ParseJson(const std::string& text, int depth = kTextDepth);
 
 // Takes the escapes \udc80 to \udcff, where they stand alone, for the bytes 0x80 to 0xFF, so that a
 // JSON text in UTF-8 can hold any file name.
-std::string DecodeByteEscapes(std::string json);
+std::string DecodeByteEscapes(const std::string& json);
 
 }  // namespace Device

@@ -27,32 +27,26 @@ class Watcher {
   // False when nobody reads any more.
   bool Look() {
     const std::int64_t version = StoreOf(user_).Version();
-    if (version != version_ || HasLostWorker()) {
-      FindWorkers();
+    std::vector<pid_t> workers = WorkersAtWork();
+    // All tasks are read only when there is something new: they can be large.
+    if (version != version_ || workers != workers_) {
       SendTasks();
       SendNotifications();
     }
     version_ = version;
+    workers_ = std::move(workers);
     return is_read_;
   }
 
  private:
-  void FindWorkers() {
-    workers_.clear();
-    for (const pid_t pid : StoreOf(user_).AllWorkers()) {
-      if (IsAtWork(pid)) {
-        workers_.push_back(pid);
-      }
-    }
-  }
-
-  // One that is being stopped is looked at until its task is gone: the request may have died.
-  bool IsAtWork(pid_t pid) const { return IsWorkerAlive(user_, pid) || IsBeingStopped(user_, pid); }
-
-  // All tasks are read only when a worker has gone: they can be large.
-  bool HasLostWorker() const {
-    return !std::all_of(workers_.begin(), workers_.end(),
-                        [this](pid_t pid) { return IsAtWork(pid); });
+  // One that is being stopped counts until its task is gone: the request may have died.
+  std::vector<pid_t> WorkersAtWork() const {
+    std::vector<pid_t> workers = StoreOf(user_).AllWorkers();
+    const auto has_gone = [this](pid_t pid) {
+      return !IsWorkerAlive(user_, pid) && !IsBeingStopped(user_, pid);
+    };
+    workers.erase(std::remove_if(workers.begin(), workers.end(), has_gone), workers.end());
+    return workers;
   }
 
   void Send(const char* event, const Json::Value& data) {

@@ -35,17 +35,10 @@ void GiveTo(const std::string& path, const User& user) {
 }
 
 const char* Permissions(Access access, bool is_writable) {
-  switch (access) {
-    case Access::kReadWrite:
-      return is_writable ? "rwx" : "r-x";
-    case Access::kReadOnly:
-      return "r-x";
-    case Access::kListDenied:
-      return "--x";
-    case Access::kNone:
-      break;
-  }
-  return "---";
+  return access == Access::kNone                       ? "---"
+         : access == Access::kListDenied               ? "--x"
+         : access == Access::kReadWrite && is_writable ? "rwx"
+                                                       : "r-x";
 }
 
 // The access list of a shared folder in the form of acl_from_text. Those who may not list the

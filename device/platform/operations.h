@@ -10,10 +10,12 @@
 #include <cstdint>
 #include <cstdlib>
 #include <exception>
-#include <memory>
+#include <stdexcept>
 #include <string>
 #include <type_traits>
 #include <vector>
+
+#include "device/base/json_text.h"
 
 namespace Device {
 
@@ -80,12 +82,11 @@ T FromFault(const Fault& fault) {
   } else if constexpr (std::is_same_v<T, bool>) {
     return fault.result != "0" && fault.result != "false" && fault.result != "null";
   } else if constexpr (std::is_same_v<T, Json::Value>) {
-    Json::Value value;
-    Json::CharReaderBuilder builder;
-    const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
-    const char* const begin = fault.result.data();
-    return reader->parse(begin, begin + fault.result.size(), &value, nullptr) ? value
-                                                                              : fault.result;
+    try {
+      return ParseJson(fault.result);
+    } catch (const std::runtime_error&) {
+      return fault.result;  // a plain text
+    }
   } else {
     return static_cast<T>(std::strtoll(fault.result.c_str(), nullptr, 0));
   }

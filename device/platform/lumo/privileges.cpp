@@ -26,16 +26,9 @@ constexpr int kLevelWrite = 2;
 constexpr int kFlagWriteSuspended = 0x2;
 
 int LevelOf(Access access) {
-  switch (access) {
-    case Access::kReadWrite:
-      return kLevelWrite;
-    case Access::kReadOnly:
-    case Access::kListDenied:
-      return kLevelRead;
-    case Access::kNone:
-      break;
-  }
-  return kLevelNone;
+  return access == Access::kNone        ? kLevelNone
+         : access == Access::kReadWrite ? kLevelWrite
+                                        : kLevelRead;
 }
 
 int GetPrivilege(const char* path, const std::string& user, int* level, int* flags) {
