@@ -1,7 +1,8 @@
-// Whole reads and writes.
+// Whole reads and writes, and frames.
 #pragma once
 
 #include <cstddef>
+#include <optional>
 #include <string>
 #include <string_view>
 
@@ -20,5 +21,15 @@ bool WriteAll(int fd, std::string_view bytes);
 
 // Fills the buffer. False, with errno, when the input ends before (errno is 0 then) or fails.
 bool ReadAll(int fd, char* to, std::size_t size);
+
+// Frames on a stream: a length, then so many bytes. Who else still holds the stream's other end
+// does not matter to a reader then.
+inline constexpr std::size_t kMostFrameBytes = std::size_t{256} << 20U;
+
+// False when the other side is gone.
+bool WriteFrame(int fd, const std::string& text);
+
+// Nothing when the other side is gone without a whole frame, or the frame is too long.
+std::optional<std::string> ReadFrame(int fd);
 
 }  // namespace Device

@@ -12,7 +12,7 @@
 #include <system_error>
 
 #include "device/base/child_process.h"
-#include "device/base/frame.h"
+#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/host/sessions.h"
 #include "device/model/device.h"

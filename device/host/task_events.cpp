@@ -6,7 +6,7 @@
 #include <map>
 #include <vector>
 
-#include "device/base/frame.h"
+#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/host/sessions.h"
 #include "device/tasks/task_store.h"

@@ -6,7 +6,7 @@
 #include <stdexcept>
 #include <utility>
 
-#include "device/base/frame.h"
+#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/host/file_listing.h"
 #include "device/host/sessions.h"

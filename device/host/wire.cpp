@@ -7,7 +7,7 @@
 #include <cstring>
 #include <sstream>
 
-#include "device/base/frame.h"
+#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 
 namespace Device {

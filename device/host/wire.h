@@ -2,7 +2,7 @@
 //
 // The front end sends the launcher control messages over a socket of sequenced packets (its
 // standard input): a kind, a text, and the end of a stream for the answer. Everything on that
-// stream is a frame (base/frame.h). A request goes there as a frame of JSON, {"kind", "session",
+// stream is a frame (base/file_io.h). A request goes there as a frame of JSON, {"kind", "session",
 // ...}; what comes back is an answer, made into text by who knows it and passed through to the
 // client:
 //

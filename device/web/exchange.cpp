@@ -4,7 +4,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include "device/base/frame.h"
+#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 
 namespace Web {

@@ -3,9 +3,7 @@
 
 namespace Device {
 
-void SetKlibError(int error_number, const char* file, int line);
+// Leaves an error number with the place where it arose, and returns -1.
+int KlibError(int error_number, const char* file = __builtin_FILE(), int line = __builtin_LINE());
 
 }  // namespace Device
-
-// Leaves an error number with the place where it arose.
-#define KLIB_ERROR(error_number) Device::SetKlibError((error_number), __FILE__, __LINE__)

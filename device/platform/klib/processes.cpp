@@ -94,7 +94,7 @@ std::map<FILE*, std::unique_ptr<ProgramOutput>>& Streams() {
 
 FILE* OpenProgram(const char* program, const char* mode, char* const* arguments) {
   if (std::strcmp(mode, "r") != 0) {
-    KLIB_ERROR(EINVAL);
+    KlibError(EINVAL);
     return nullptr;
   }
   try {
@@ -109,7 +109,7 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     Streams().emplace(stream, std::move(source));
     return stream;
   } catch (const std::system_error& error) {
-    KLIB_ERROR(error.code().value());
+    KlibError(error.code().value());
     return nullptr;
   }
 }
@@ -117,8 +117,7 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
 int CloseProgram(FILE* stream) {
   const auto found = Streams().find(stream);
   if (found == Streams().end()) {
-    KLIB_ERROR(EBADF);
-    return -1;
+    return KlibError(EBADF);
   }
   const std::unique_ptr<ProgramOutput> source = std::move(found->second);
   Streams().erase(found);
@@ -153,22 +152,19 @@ pid_t ForkWorker() {
     return worker.Release();
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "fork worker: %s", error.what());
-    KLIB_ERROR(EIO);
-    return -1;
+    return KlibError(EIO);
   }
 }
 
 int RunProgram(const char* program, unsigned int flags, const char* const* arguments) {
   if (flags != kRunAndWait) {
-    KLIB_ERROR(EINVAL);
-    return -1;
+    return KlibError(EINVAL);
   }
   try {
     const int status = StartProgram(program, arguments, -1).Wait();
     return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
   } catch (const std::system_error& error) {
-    KLIB_ERROR(error.code().value());
-    return -1;
+    return KlibError(error.code().value());
   }
 }
 

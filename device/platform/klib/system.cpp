@@ -19,20 +19,18 @@ namespace Device {
 
 namespace {
 
-struct KlibError {
+struct KlibErrorState {
   int error_number = 0;
   const char* file = "";
   int line = 0;
-};
-KlibError klib_error;
+} klib_error;
 
 constexpr int kByPath = -1;
 
 int IsAdmin(const char* name) {
   const User* const user = TheDevice().config.FindUser(name);
   if (user == nullptr) {
-    KLIB_ERROR(ENOENT);
-    return -1;
+    return KlibError(ENOENT);
   }
   return user->admin ? 1 : 0;
 }
@@ -43,8 +41,7 @@ int AddToIndex(const char* path) {
     return 0;
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "file index: %s", error.what());
-    KLIB_ERROR(EIO);
-    return -1;
+    return KlibError(EIO);
   }
 }
 
@@ -69,8 +66,9 @@ std::string QuoteForShell(const std::string& text) {
 
 }  // namespace
 
-void SetKlibError(int error_number, const char* file, int line) {
+int KlibError(int error_number, const char* file, int line) {
   klib_error = {error_number, file, line};
+  return -1;
 }
 
 }  // namespace Device
