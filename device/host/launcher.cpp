@@ -129,6 +129,9 @@ Outcome Launcher::CallSafely(const Request& request) {
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
     return {KAVO::kErrInternal, Json::Value()};
+  } catch (...) {
+    syslog(LOG_ERR, "%s: unexpected failure", request.method.c_str());
+    return {KAVO::kErrInternal, Json::Value()};
   }
 }
 

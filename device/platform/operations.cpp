@@ -173,8 +173,12 @@ void Operation::ApplyFault() {
   if (fault_->result == "crash") {
     raise(SIGKILL);
   }
-  if (fault_->result == "throw") {
+  const bool is_int = fault_->result == "throw-int";
+  if (is_int || fault_->result == "throw") {
     Trace(Json::Value("throws"));
+    if (is_int) {
+      throw fault_->code;
+    }
     throw std::runtime_error("fault rule");
   }
 }

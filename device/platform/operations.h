@@ -25,9 +25,9 @@ void OpenTrace(const std::string& path);
 
 // Adds a rule CALL[#N]=RESULT[:CODE]. The Nth call, or every call, answers RESULT instead of doing
 // its work and leaves CODE as the library's last error. RESULT is a number, a text, `null`,
-// `throw`, or `crash`, by which the process is killed; or an object {"result": RESULT, NAME:
-// VALUE...} that also fills the operation's outputs of those names. Throws std::invalid_argument
-// for a rule that is none or names no operation.
+// `throw`, `throw-int`, which is no std::exception, or `crash`, by which the process is killed; or
+// an object {"result": RESULT, NAME: VALUE...} that also fills the operation's outputs of those
+// names. Throws std::invalid_argument for a rule that is none or names no operation.
 void AddFault(const std::string& rule);
 
 // The names of all operations, as rules and trace lines have them.
@@ -140,6 +140,9 @@ class Operation {
       }
     } catch (const std::exception& error) {
       Trace(Json::Value(std::string("throws: ") + error.what()));
+      throw;
+    } catch (...) {
+      Trace(Json::Value("throws"));
       throw;
     }
   }

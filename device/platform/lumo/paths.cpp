@@ -207,6 +207,7 @@ int LumoFullPathGet(const char* path, std::string* full_path, std::string* home_
                     const char* charset) {
   return Operation("LumoFullPathGet", path, *user, charset)
       .Output("full_path", *full_path)
+      .Output("home_test_path", *home_test_path)
       .Run([&] {
         const Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), *user, path);
         if (resolved.error != 0) {
