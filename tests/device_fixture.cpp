@@ -215,7 +215,9 @@ Strings DeviceTest::Log() const {
 
 std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
   std::vector<TracedCall> calls;
-  for (const std::string& line : Lines(ReadFile(temp_.Path() + "/trace"))) {
+  const std::string text = ReadFile(temp_.Path() + "/trace");
+  // The last line may be in the middle of being written.
+  for (const std::string& line : Lines(text.substr(0, text.rfind('\n') + 1))) {
     const Json::Value row = Device::ParseJson(line);
     if (call.empty() || row["call"] == call) {
       calls.push_back({row["pid"].asInt(), row["call"].asString(), row["args"], row["result"]});
