@@ -93,11 +93,10 @@ TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
-// In the arguments "DEV" stands for the device.
 class CliRefuses : public CliTest, public testing::WithParamInterface<TableRow> {};
 
 TEST_P(CliRefuses, WithStatusTwoAndOneLine) {
-  Strings arguments = GetParam().All("argument");
+  Strings arguments = Words(GetParam().Get("command"));
   std::replace(arguments.begin(), arguments.end(), std::string("DEV"), device_);
   const Ran ran = Kavo(arguments);
   EXPECT_EQ(ran.status, 2);
@@ -105,7 +104,7 @@ TEST_P(CliRefuses, WithStatusTwoAndOneLine) {
   EXPECT_THAT(ran.err, HasSubstr(GetParam().Get("words")));
 }
 
-INSTANTIATE_TABLE(CliRefuses, wrong_usage);
+INSTANTIATE_TABLE(CliRefuses, wrong_usage, "command", "words");
 
 class ConfigRefuses : public testing::TestWithParam<TableRow> {};
 
@@ -118,7 +117,7 @@ TEST_P(ConfigRefuses, NamingLineAndReason) {
   }
 }
 
-INSTANTIATE_TABLE(ConfigRefuses, wrong_configs);
+INSTANTIATE_TABLE(ConfigRefuses, wrong_configs, "text", "error");
 
 // A device below a folder that is closed to its users works all the same, and the folder stays
 // shut.

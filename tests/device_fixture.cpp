@@ -65,12 +65,14 @@ Strings NamesOf(Strings sequence) {
   return sequence;
 }
 
-Strings UpTo(const Strings& names, const std::string& call) {
+Strings UpTo(const Strings& names, const std::string& calls) {
+  const std::string call = calls.substr(0, calls.find(" + "));
   const std::size_t hash = call.find('#');
   int left = hash == std::string::npos ? 1 : std::stoi(call.substr(hash + 1));
   for (auto at = names.begin(); at != names.end(); ++at) {
     if (*at == call.substr(0, hash) && --left == 0) {
-      return {names.begin(), at + 1};
+      return Strings(names.begin(), at + 1) +
+             Words(calls.substr(std::min(calls.size(), call.size() + 3)));
     }
   }
   ADD_FAILURE() << "no call " << call;
@@ -253,7 +255,8 @@ int DeviceTest::Worker() const {
 Strings DeviceTest::Sequence(int pid, bool with_arguments) const {
   std::string text;
   for (const TracedCall& call : Calls()) {
-    if (call.pid == pid && call.call != "Vesk::Task::getTaskId") {
+    const bool is_getter = call.call.rfind("KAVO::APIRequest::", 0) == 0;
+    if (call.pid == pid && !is_getter && call.call != "Vesk::Task::getTaskId") {
       const std::string arguments = Device::ToText(call.args);
       text += call.call + (call.args.empty() ? "" : " ");
       text += arguments.substr(1, arguments.size() - 2) + "\n";

@@ -22,8 +22,10 @@ std::string ModulePath();
 // The calls that stand in tests/sequences under that name, one a line; the names alone.
 Strings ExpectedSequence(const std::string& name);
 Strings NamesOf(Strings sequence);
-// Their beginning up to and with CALL or CALL#N, the Nth one; their end behind the last CALL.
-Strings UpTo(const Strings& names, const std::string& call);
+// Of "CALL#N + CALL...", their beginning up to and with the Nth such call, the first without "#N",
+// and the other calls.
+Strings UpTo(const Strings& names, const std::string& calls);
+// Their end behind the last CALL.
 Strings Behind(const Strings& names, const std::string& call);
 Strings operator+(Strings first, const Strings& second);
 
@@ -73,7 +75,8 @@ class DeviceTest : public testing::Test {
   // The living processes of the worker's group: itself, the archiver, the stock 7z.
   static std::set<pid_t> Group(pid_t worker);
   // What a process called, libc's calls by the module among it: one line for each, the name and,
-  // if asked for, the arguments as Plain has them. Getters of the task's id are left out.
+  // if asked for, the arguments as Plain has them. Getters of the request and of the task's id are
+  // left out: nothing depends on when they are called.
   Strings Sequence(int pid, bool with_arguments = false) const;
   // What is not the same in every run replaced: DEV the device's folder, SID, PID the last worker's
   // process id, and * for a time and the rest of a task's id or a temporary name.

@@ -51,7 +51,8 @@ TEST_F(RunTest, ModeLevelFormatAndPasswordBecomeArguments) {
 TEST_F(RunTest, ProgressLinesReachTheTask) {
   const Json::Value answer =
       Run("Progress: 08\nTotal: 05000000000\nCompressing Error: No space left on device\n"
-          "Progress: 42 Error:\nTotal:7\n Progress: 8\nCompressing \nProgress: 43\nProgress: 99");
+          "Progress: 42 Error:\nTotal:7\n Progress: 8\nCompressing \nTotal: 6\n"
+          "Progress: 43\nProgress: 99");
   Strings saved;
   for (const TracedCall& call : Calls("SaveTaskData")) {
     saved.push_back(Device::ToText(call.args[1]["file"]) + call.args[1]["total_size"].asString() +
@@ -59,7 +60,7 @@ TEST_F(RunTest, ProgressLinesReachTheTask) {
   }
   EXPECT_EQ(saved,
             (Strings{"\"\"0 0.080000", "\"\"5000000000 0.000000", "\"\\n\"5000000000 0.420000",
-                     "\"\\n\"5000000000 0.430000", "\"\\n\"5000000000 0.990000"}));
+                     "\"\"6 0.000000", "\"\\n\"6 0.430000", "\"\\n\"6 0.990000"}));
   // The last fraction stands, also when it is not 1.
   EXPECT_FLOAT_EQ(answer["progress"].asFloat(), 0.99F);
   EXPECT_FALSE(answer.isMember("errors"));

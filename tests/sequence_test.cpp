@@ -47,6 +47,7 @@ TEST_F(SequenceTest, StartAndAJobOfOneShare) {
 }
 
 TEST_F(SequenceTest, AJobOfTwoSharesThatNotifies) {
+  ScriptArchiver("");
   Add("vol1/homes/alice/<z>.7z", "an archive");
   // Odd results that are no failures.
   AddFaults({"Vesk::Task::getBoolProperty=1", "KLIBGroupIsAdminGroupMem=0", "IsDirUserHome=3",
@@ -59,7 +60,8 @@ TEST_F(SequenceTest, AJobOfTwoSharesThatNotifies) {
 
 TEST_F(SequenceTest, AJobThatFails) {
   RunJob(JobParams({"/photo/none"}, "/photo/<b>.zip"));
-  ExpectWorker("failed_job");
+  EXPECT_THAT(Behind(Sequence(Worker(), true), "syslog"),
+              ElementsAreArray(ExpectedSequence("failed_job")));
   EXPECT_EQ(Log(), Strings{"Can't access source files"});
 }
 

@@ -1,5 +1,7 @@
-// Tables of cases in tests/tables: a row is a line with its name and lines of "key: value"; a key
-// may stand several times; an empty line ends the row. In values \n is a line feed and \s a blank.
+// Tables of cases in tests/tables. A line that begins with a name begins a row; " | " or an
+// indented line begins a field, "key: value"; a key may stand several times. Fields behind "----"
+// belong to each row from there to the next "----" that has none of their keys itself. "#" begins a
+// comment. In values \n is a line feed, \s a blank, {n*256} as many times n.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -12,19 +14,25 @@
 #include "tests/programs.h"
 
 struct TableRow {
-  // The first value of the key, or the fallback.
-  std::string Get(const std::string& key, const std::string& fallback = "") const;
-  Strings All(const std::string& key, const Strings& fallback = {}) const;
   bool Has(const std::string& key) const { return fields.count(key) != 0; }
+  Strings All(const std::string& key, const Strings& fallback = {}) const {
+    return Has(key) ? fields.at(key) : fallback;
+  }
+  // The first value of the key, or the fallback.
+  std::string Get(const std::string& key, const std::string& fallback = "") const {
+    return All(key, {fallback}).front();
+  }
 
   std::string name;
   std::map<std::string, Strings> fields;
 };
 void PrintTo(const TableRow& row, std::ostream* out);
 
-std::vector<TableRow> ReadTable(const std::string& name);
+// Ends the program, naming the line, when a key is none of these.
+std::vector<TableRow> ReadTable(const std::string& name, const Strings& keys);
 
 // One test for each row of the table of that name, for a fixture with TableRow as its parameter.
-#define INSTANTIATE_TABLE(fixture, table)                                        \
-  INSTANTIATE_TEST_SUITE_P(Table, fixture, testing::ValuesIn(ReadTable(#table)), \
+// The keys that rows may have follow.
+#define INSTANTIATE_TABLE(fixture, table, ...)                                                  \
+  INSTANTIATE_TEST_SUITE_P(Table, fixture, testing::ValuesIn(ReadTable(#table, {__VA_ARGS__})), \
                            [](const auto& row) { return row.param.name; })
