@@ -1,15 +1,22 @@
 // Every way in which a job fails: items, log lines, and every call between the one that fails and
 // the storing of the outcome. The way of a job that succeeds stands in tests/sequences.
+#include <dlfcn.h>
 #include <fcntl.h>
+#include <sqlite3.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <filesystem>
 #include <regex>
 #include <sstream>
 
 #include "device/base/json_text.h"
 #include "device/platform/operations.h"
+#include "device/tasks/task_store.h"
+#include "device/tasks/workers.h"
 #include "tests/device_fixture.h"
+#include "tests/emulation.h"
 #include "tests/libc_calls.h"
 
 namespace {
@@ -64,9 +71,22 @@ class WorkerTest : public DeviceTest {
  protected:
   WorkerTest() { Add("vol1/photo/a.txt", "a"); }
   Json::Value LastData() const { return Calls("Vesk::Task::setProperty").back().args[1]; }
+  // Of each row of alice's store that the statement answers, the first column.
+  Strings Store(const std::string& statement) const {
+    Strings rows;
+    sqlite3* database = nullptr;
+    EXPECT_EQ(sqlite3_open(At("users/alice/store.db").c_str(), &database), SQLITE_OK);
+    const auto add = [](void* to, int /*columns*/, char** values, char** /*names*/) {
+      static_cast<Strings*>(to)->emplace_back(values[0]);
+      return 0;
+    };
+    EXPECT_EQ(sqlite3_exec(database, statement.c_str(), add, &rows, nullptr), SQLITE_OK);
+    EXPECT_EQ(sqlite3_close(database), SQLITE_OK);
+    return rows;
+  }
 };
 
-TEST_F(WorkerTest, NotifiesOfAFailureWithTwoArguments) {
+TEST_F(WorkerTest, NotifiesOnceOfAFailureWithTwoArguments) {
   AddFaults({"Vesk::Task::getBoolProperty=1", "LumoLibGetPrivilege=-1:402"});
   RunJob(JobParams({"/photo/a.txt"}, "/photo/<b>.zip"));
   const Json::Value sent = Calls("Vesk::Task::sendNotifyMessageNoEncode").front().args;
@@ -74,6 +94,7 @@ TEST_F(WorkerTest, NotifiesOfAFailureWithTwoArguments) {
             R"(["KAVO.Nolo.App.Zantro3.Instance","Zantro_*","tree:leaf_filebrowser",)"
             R"("filebrowser:filebrowser_compress_failed",["/photo/&lt;b&gt;.zip",)"
             R"("the session has ended"]])");
+  EXPECT_EQ(Store("SELECT app FROM notifications"), Strings{"KAVO.Nolo.App.Zantro3.Instance"});
   EXPECT_EQ(LastData()["errors"].size(), 1U);
   EXPECT_FALSE(LastData().isMember("notification_arg1"));
 }
@@ -85,6 +106,78 @@ TEST_F(WorkerTest, TakesAnArchiveOfItselfForDone) {
   EXPECT_EQ(Sequence(Worker()), Words("KLIBCProcFork signal WaitForTaskDataReady") + end);
   RunJob(JobParams({"/photo/z.zip", "/photo/z.zip"}, "/photo/z.zip"));
   EXPECT_EQ(LastData()["errors"].size(), 2U);
+}
+
+TEST_F(WorkerTest, LeavesYoungTasksAndLivingWorkersAlone) {
+  RunJob(JobParams({"/photo/z.zip"}, "/photo/z.zip"));  // makes the store
+  constexpr int kDead = 1 << 30;                        // more than any process id
+  const struct {
+    std::string id;
+    int age;
+    bool is_finished;
+    int worker;
+  } rows[] = {{"finished_yesterday", 24 * 3600 + 60, true, kDead},
+              {"finished_today", 24 * 3600 - 60, true, kDead + 1},
+              {"died_long_ago", 3600 + 60, false, kDead + 2},
+              {"died_just_now", 3600 - 60, false, kDead + 3},
+              {"runs", 48 * 3600, false, getpid()}};
+  Device::RegisterWorker("alice", getpid());
+  for (const auto& row : rows) {
+    Device::TaskRow task;
+    task.id = row.id;
+    task.properties["data"] = Device::ParseJson(R"({"pid":)" + std::to_string(row.worker) + "}");
+    Device::StoreOf("alice").AddTask(task);
+    Device::StoreOf("alice").UpdateTask(task, {}, row.is_finished);
+    row.worker != getpid() ? Device::StoreOf("alice").AddWorker(row.worker, 1) : void();
+    Store("UPDATE tasks SET updated = updated - " + std::to_string(row.age) + " WHERE id = '" +
+          row.id + "'");
+  }
+  Device::CloseStores();
+  RunJob(JobParams({"/photo/z.zip"}, "/photo/z.zip"));
+  const std::string tasks = "SELECT id FROM tasks UNION SELECT task FROM members";
+  const std::string workers = "SELECT pid FROM workers ORDER BY pid";
+  EXPECT_EQ(Store(tasks), (Strings{"died_just_now", "finished_today", "runs"}));
+  EXPECT_EQ(Store(workers), (Strings{std::to_string(getpid()), std::to_string(kDead + 1),
+                                     std::to_string(kDead + 3)}));
+  Ask("status", "finished_today");
+  Ask("stop", "died_just_now");
+  EXPECT_EQ(Store(tasks), Strings{"runs"});
+  EXPECT_EQ(Store(workers), Strings{std::to_string(getpid())});
+}
+
+// The archiver's line about it looks like a failure.
+TEST_F(WorkerTest, PacksASourceNamedLikeAnError) {
+  const std::string name = "Error: No space left on device";
+  std::filesystem::resize_file(Add("vol1/photo/" + name, ""), 30 << 20);
+  EXPECT_FALSE(RunJob(JobParams({"/photo/" + name}, "/photo/z.zip")).isMember("errors"));
+  EXPECT_EQ(Calls("SaveTaskData").back().args[1]["file"], "\n");  // it was there
+  const Ran listing = RunProgram({"/usr/bin/7z", "l", "-ba", At("vol1/photo/z.zip")});
+  EXPECT_NE(listing.out.find(name), std::string::npos);
+}
+
+TEST_F(WorkerTest, HoldsNoSourcesWhileTheArchiverRuns) {
+  if (kIsEmulated || dlsym(RTLD_DEFAULT, "__asan_init") != nullptr) {
+    GTEST_SKIP() << "an emulator's memory is among the worker's, and sanitizers keep what is freed";
+  }
+  const std::string folder = "/" + std::string(200, 'n');
+  const std::string path = "/photo" + folder + folder + folder + folder + folder;
+  const Strings sources(5000, path);
+  Add("vol1" + path, "n");
+  ScriptArchiver("");
+  const std::string output = temp_.Path() + "/output";
+  std::filesystem::remove(output);
+  ASSERT_EQ(mkfifo(output.c_str(), 0644), 0);  // the archiver runs until somebody has opened it
+  Device::StopWatching();
+  const Device::Outcome started = Call("start", JobParams(sources, "/photo/z.zip"));
+  int file = -1;
+  ASSERT_TRUE(WaitUntil(
+      [&] { return (file = open(output.c_str(), O_WRONLY | O_NONBLOCK | O_CLOEXEC)) >= 0; }));
+  const std::string memory = "/proc/" + Store("SELECT pid FROM workers").at(0) + "/smaps_rollup";
+  const std::string text = ReadFile(memory);
+  const std::size_t kilobytes = std::stoul(text.substr(text.find("Private_Dirty:") + 14));
+  EXPECT_LT(kilobytes, 6 * sources.size() * path.size() / 1024);  // twice as much with them
+  close(file);
+  Follow(started.data["taskid"].asString());
 }
 
 TEST_F(WorkerTest, DoesNotFinishATaskItCannotRead) {
