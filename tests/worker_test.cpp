@@ -167,7 +167,7 @@ TEST_F(WorkerTest, HoldsNoSourcesWhileTheArchiverRuns) {
   const std::string output = temp_.Path() + "/output";
   std::filesystem::remove(output);
   ASSERT_EQ(mkfifo(output.c_str(), 0644), 0);  // the archiver runs until somebody has opened it
-  Device::StopWatching();
+  Device::StopTracing();
   const Device::Outcome started = Call("start", JobParams(sources, "/photo/z.zip"));
   int file = -1;
   ASSERT_TRUE(WaitUntil(
