@@ -1,5 +1,6 @@
 // Starting processes: the worker's fork, and programs by argument vector.
 #include <fcntl.h>
+#include <malloc.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
@@ -98,6 +99,7 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     return nullptr;
   }
   try {
+    malloc_trim(0);  // the caller is going to wait for the program, for hours maybe
     Pipe pipe;
     ChildProcess child = StartProgram(program, arguments, pipe.writer.Get());
     auto source = std::make_unique<ProgramOutput>(
