@@ -23,7 +23,7 @@ namespace {
 
 constexpr char kApi[] = "KAVO.Zantro.Compress";
 constexpr int kApiVersion = 3;
-constexpr std::chrono::milliseconds kFirstPause(10);
+constexpr std::chrono::milliseconds kFirstPause(50);
 constexpr std::chrono::milliseconds kLongestPause(250);
 
 constexpr int kBarWidth = 40;
@@ -155,6 +155,10 @@ class Job {
     ProgressDisplay display;
     std::chrono::milliseconds pause = kFirstPause;
     for (;;) {
+      poll(nullptr, 0,
+           static_cast<int>(pause.count()));  // the worker's end, a signal, ends it early
+      Launcher::Reap();
+      pause = std::min(2 * pause, kLongestPause);
       if (is_interrupted != 0) {
         display.Clear();
         return Stop();
@@ -162,13 +166,9 @@ class Job {
       const Outcome outcome = AskAboutTask("status");
       if (outcome.code != 0 || outcome.data["finished"].asBool()) {
         display.Clear();
-        Launcher::Reap();
         return Report(outcome);
       }
       display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
-      poll(nullptr, 0, static_cast<int>(pause.count()));  // a worker's end, a signal, ends it early
-      Launcher::Reap();
-      pause = std::min(2 * pause, kLongestPause);
     }
   }
 
