@@ -48,14 +48,6 @@ TEST(ModuleSymbols, ThreeAreExportedAndThePlatformAloneIsLeftToTheHost) {
   EXPECT_EQ(undefined, expected);
 }
 
-// As another program reads it from the file: ten rows of four words.
-TEST(ModuleSymbols, TableHasTheSizeOfItsRows) {
-  const std::string symbols =
-      RunProgram({"/usr/bin/readelf", "-W", "--dyn-syms", ModulePath()}).out;
-  std::smatch parts;
-  ASSERT_TRUE(std::regex_search(symbols, parts, std::regex(" ([0-9]+) OBJECT .* gTable\n")));
-  EXPECT_EQ(parts[1], sizeof(void*) == 4 ? "160" : "320");
-}
 #endif
 
 class ApiTest : public DeviceTest {

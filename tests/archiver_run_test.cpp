@@ -9,7 +9,6 @@
 #include <csignal>
 #include <cstdint>
 #include <cstdlib>
-#include <cstring>
 #include <ctime>
 #include <filesystem>
 #include <memory>
@@ -123,22 +122,16 @@ TEST_F(ArchiverTest, KeepsEveryNameWhateverItHolds) {
 }
 
 TEST_F(ArchiverTest, StoresTimesInTheZoneThatHolds) {
-  constexpr std::time_t kTime = 1'700'000'000;  // 7z rounds odd seconds
+  constexpr std::time_t kTime = 1'700'000'000;
   const timespec times[] = {{kTime, 0}, {kTime, 0}};
   ASSERT_EQ(utimensat(AT_FDCWD, (share / "a").c_str(), times, 0), 0);
   for (const char* zone : {static_cast<const char*>(nullptr), "UTC-9"}) {
     zone == nullptr ? unsetenv("TZ") : setenv("TZ", zone, 1);
-    tzset();
-    std::tm local{};
-    localtime_r(&kTime, &local);
     Good("a.zip", {"a"}, {"a", "", "", ""});
-    constexpr size_t kTimeOffset = 10;  // in the first entry's header
-    std::uint32_t stored = 0;
-    std::memcpy(&stored, ReadFile(out / "a.zip").data() + kTimeOffset, sizeof stored);
-    EXPECT_EQ(stored >> 11U & 31U, static_cast<unsigned>(local.tm_hour))
-        << (zone == nullptr ? "none" : zone);
-    EXPECT_EQ(stored >> 16U & 31U, static_cast<unsigned>(local.tm_mday))
-        << (zone == nullptr ? "none" : zone);
+    char local[sizeof "2000-01-01 00:00:00"];
+    std::strftime(local, sizeof local, "%F %T", std::localtime(&kTime));
+    const Ran listing = RunProgram({"/usr/bin/7z", "l", "-ba", out / "a.zip"});
+    EXPECT_EQ(listing.out.rfind(local, 0), 0U) << listing.out;
   }
   unsetenv("TZ");
 }
@@ -207,14 +200,6 @@ TEST_F(ArchiverTest, EncryptsWithThePasswordWhateverItHolds) {
       EXPECT_EQ(RunProgram({"/usr/bin/7z", "t", "-p" + password, out / "z"}).status, 0) << password;
       EXPECT_NE(RunProgram({"/usr/bin/7z", "t", "-pother", out / "z"}).status, 0) << password;
     }
-  }
-}
-
-TEST_F(ArchiverTest, MakesAnArchiveOfTheUmasksMode) {
-  for (const mode_t mask : {077U, 022U}) {
-    umask(mask);
-    Good(std::to_string(mask), {"a"});
-    EXPECT_EQ(fs::status(out / std::to_string(mask)).permissions(), fs::perms(0666 & ~mask));
   }
 }
 

@@ -87,17 +87,6 @@ TEST_F(JobTest, SourcesOfSeveralSharesAreNamedFromTheirShareWithLinksKept) {
   }
 }
 
-TEST_F(JobTest, LevelsReachTheArchive) {
-  const std::string text(300000, 'x');
-  Add("vol1/photo/a.txt", text);
-  for (const std::string level : {"store", "best"}) {
-    Succeed(JobParams({"/photo/a.txt"}, "/photo/" + level, R"({"level":")" + level + "\"}"));
-    EXPECT_EQ(Unpacked(At("vol1/photo/" + level)), Tree{"a.txt=" + text});
-  }
-  EXPECT_GT(fs::file_size(At("vol1/photo/store")), text.size());
-  EXPECT_LT(fs::file_size(At("vol1/photo/best")), text.size() / 10);
-}
-
 TEST_F(JobTest, ArchiveOfTheLongestNameLiesInASourceAndDoesNotHoldItself) {
   Add("vol1/photo/trip/a.txt", "a");
   const std::string archive = "photo/trip/" + std::string(255, 'n');

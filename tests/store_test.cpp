@@ -94,12 +94,4 @@ TEST_F(StoreTest, ARowSeesWhatAnotherHasChangedMemberByMember) {
   EXPECT_TRUE(rows.empty());
 }
 
-TEST_F(StoreTest, AValueThatIsDamagedIsNullAndSaidInALine) {
-  Device::StoredValue value(Device::ParseJson(R"({"whole":1,"torn":[2]})"));
-  value.members["torn"].resize(1);
-  Watch();
-  EXPECT_EQ(value.Value(), Device::ParseJson(R"({"whole":1,"torn":null})"));
-  EXPECT_EQ(Log().size(), 1U);
-}
-
 }  // namespace
