@@ -29,25 +29,6 @@ void OccupyStandardStreams() {
   close(fd);
 }
 
-// The exit status.
-int RunJob(const std::vector<std::string>& arguments) {
-  try {
-    const Archiver::Cancel cancel(STDOUT_FILENO);
-    Archiver::Report report(cancel);
-    try {
-      Archiver::PackArchive(Archiver::ParseCommandLine(arguments), cancel, report);
-      return 0;
-    } catch (const Archiver::Cancelled&) {
-      report.CancelledRun();
-    } catch (const std::exception& e) {
-      report.Error(e.what());
-    }
-  } catch (const std::exception&) {
-    // There is nobody left to tell.
-  }
-  return 1;
-}
-
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -57,5 +38,19 @@ int main(int argc, char** argv) {
     return 1;  // nobody to report to
   }
   OccupyStandardStreams();
-  return RunJob(arguments);
+  try {
+    const Archiver::Cancel cancel(STDOUT_FILENO);
+    Archiver::Report report(cancel);
+    try {
+      Archiver::PackArchive(Archiver::ParseCommandLine(arguments), cancel, report);
+      return 0;
+    } catch (const Archiver::Cancelled&) {
+      report.CancelledRun();
+    } catch (const std::exception& error) {
+      report.Error(error.what());
+    }
+  } catch (const std::exception&) {
+    // There is nobody left to tell.
+  }
+  return 1;
 }

@@ -42,10 +42,7 @@ std::vector<std::string> Environment() {
 
 std::string ReadSome(Device::FileDescriptor& fd) {
   std::array<char, 65536> buffer{};
-  ssize_t size = 0;
-  do {
-    size = read(fd.Get(), buffer.data(), buffer.size());
-  } while (size < 0 && errno == EINTR);
+  const ssize_t size = TEMP_FAILURE_RETRY(read(fd.Get(), buffer.data(), buffer.size()));
   if (size <= 0) {
     fd.Close();
     return {};

@@ -139,12 +139,7 @@ ChildProcess::~ChildProcess() {
 int ChildProcess::Wait() {
   const pid_t pid = Release();
   int status = 0;
-  while (waitpid(pid, &status, 0) < 0) {
-    if (errno != EINTR) {
-      return -1;
-    }
-  }
-  return status;
+  return TEMP_FAILURE_RETRY(waitpid(pid, &status, 0)) < 0 ? -1 : status;
 }
 
 }  // namespace Device

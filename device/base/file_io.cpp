@@ -37,28 +37,23 @@ std::string ReadTextFile(const std::string& path) {
 
 bool WriteAll(int fd, std::string_view bytes) {
   while (!bytes.empty()) {
-    const ssize_t written = write(fd, bytes.data(), bytes.size());
-    if (written < 0 && errno != EINTR) {
+    const ssize_t written = TEMP_FAILURE_RETRY(write(fd, bytes.data(), bytes.size()));
+    if (written < 0) {
       return false;
     }
-    bytes.remove_prefix(written < 0 ? 0 : static_cast<std::size_t>(written));
+    bytes.remove_prefix(static_cast<std::size_t>(written));
   }
   return true;
 }
 
 bool ReadAll(int fd, char* to, std::size_t size) {
   while (size > 0) {
-    const ssize_t got = read(fd, to, size);
-    if (got == 0) {
-      errno = 0;
+    const ssize_t got = TEMP_FAILURE_RETRY(read(fd, to, size));
+    if (got <= 0) {
       return false;
     }
-    if (got < 0 && errno != EINTR) {
-      return false;
-    }
-    const std::size_t done = got < 0 ? 0 : static_cast<std::size_t>(got);
-    to += done;
-    size -= done;
+    to += got;
+    size -= static_cast<std::size_t>(got);
   }
   return true;
 }

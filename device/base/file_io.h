@@ -19,7 +19,7 @@ std::string ReadTextFile(const std::string& path);
 // Writes all of the bytes, waiting where that takes long. False, with errno, when it cannot.
 bool WriteAll(int fd, std::string_view bytes);
 
-// Fills the buffer. False, with errno, when the input ends before (errno is 0 then) or fails.
+// Fills the buffer. False when the input ends before, or fails.
 bool ReadAll(int fd, char* to, std::size_t size);
 
 // Frames on a stream: a length, then so many bytes. Who else still holds the stream's other end

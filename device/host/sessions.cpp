@@ -17,7 +17,7 @@ namespace Device {
 namespace {
 
 constexpr int kSessionIdWords = 4;
-constexpr std::ptrdiff_t kMostSessions = 16;  // of one user
+constexpr std::size_t kMostSessions = 16;  // of one user
 constexpr int kFreeTries = 10;
 constexpr std::chrono::seconds kLongestWait(60);
 // In place of that of a user who is not there; no password has it.
@@ -49,18 +49,15 @@ std::map<std::string, Session>& Sessions() {
 }
 
 void EndOldestOf(const std::string& user) {
-  auto& sessions = Sessions();
-  const auto is_users = [&](const auto& entry) { return entry.second.user == user; };
-  if (std::count_if(sessions.begin(), sessions.end(), is_users) < kMostSessions) {
-    return;
-  }
-  auto oldest = sessions.end();
-  for (auto at = sessions.begin(); at != sessions.end(); ++at) {
-    if (is_users(*at) && (oldest == sessions.end() || at->second.number < oldest->second.number)) {
-      oldest = at;
+  std::map<std::uint64_t, std::string> ids;  // of the user's sessions, by number
+  for (const auto& [id, session] : Sessions()) {
+    if (session.user == user) {
+      ids.emplace(session.number, id);
     }
   }
-  SignOut(std::string(oldest->first));
+  if (ids.size() >= kMostSessions) {
+    SignOut(ids.begin()->second);
+  }
 }
 
 }  // namespace

@@ -1,9 +1,9 @@
 #include "device/host/wire.h"
 
 #include <sys/socket.h>
+#include <unistd.h>
 
 #include <array>
-#include <cerrno>
 #include <cstring>
 #include <sstream>
 
@@ -37,11 +37,7 @@ bool SendControl(int socket, ControlKind kind, const std::string& text, int stre
     ancillary.header.cmsg_len = CMSG_LEN(sizeof stream);
     std::memcpy(CMSG_DATA(&ancillary.header), &stream, sizeof stream);
   }
-  ssize_t sent = 0;
-  do {
-    sent = sendmsg(socket, &message, MSG_NOSIGNAL);
-  } while (sent < 0 && errno == EINTR);
-  return sent >= 0;
+  return TEMP_FAILURE_RETRY(sendmsg(socket, &message, MSG_NOSIGNAL)) >= 0;
 }
 
 std::optional<ControlMessage> ReceiveControl(int socket) {
@@ -53,10 +49,7 @@ std::optional<ControlMessage> ReceiveControl(int socket) {
   message.msg_iovlen = 1;
   message.msg_control = &ancillary;
   message.msg_controllen = CMSG_LEN(sizeof(int));  // rounded up there would be room for two
-  ssize_t got = 0;
-  do {
-    got = recvmsg(socket, &message, MSG_CMSG_CLOEXEC);
-  } while (got < 0 && errno == EINTR);
+  const ssize_t got = TEMP_FAILURE_RETRY(recvmsg(socket, &message, MSG_CMSG_CLOEXEC));
   if (got < 1) {
     return std::nullopt;
   }
@@ -72,8 +65,8 @@ std::optional<ControlMessage> ReceiveControl(int socket) {
   return received;
 }
 
-Answer::Answer(int status, const Json::Value& json)
-    : status(status), body(json.isNull() ? "" : ToUtf8Text(json) + "\n") {}
+Answer::Answer(int http_status, const Json::Value& json)
+    : status(http_status), body(json.isNull() ? "" : ToUtf8Text(json) + "\n") {}
 
 Answer Refusal(int status, const std::string& reason) {
   return Answer(status, JsonObject({{"error", reason}}));

@@ -72,7 +72,7 @@ inline constexpr char kKindCodes[] = "codes";  // no session needed
 
 struct Answer {
   // Body in JSON, a line in UTF-8; none for null.
-  explicit Answer(int status, const Json::Value& json = {});
+  explicit Answer(int http_status, const Json::Value& json = {});
 
   int status;
   std::vector<std::pair<std::string, std::string>> headers;

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <functional>
 #include <limits>
+#include <set>
 #include <stdexcept>
 
 #include "device/base/json_text.h"
@@ -13,13 +14,8 @@ namespace Device {
 
 namespace {
 
-constexpr const char* kReservedShares[] = {"home", "homes"};          // every user's own, and all
-constexpr const char* kReservedVolumes[] = {"users", "device.json"};  // beside the volumes
-
-template <std::size_t kCount>
-bool IsOneOf(const std::string& name, const char* const (&names)[kCount]) {
-  return std::find(std::begin(names), std::end(names), name) != std::end(names);
-}
+const std::set<std::string> kReservedShares = {"home", "homes"};  // every user's own, and all
+const std::set<std::string> kReservedVolumes = {"users", "device.json"};  // beside the volumes
 
 // Reads members of JSON objects and says on which line of the text something is wrong.
 class ConfigReader {
@@ -162,7 +158,7 @@ void CheckVolume(const ConfigReader& reader, const Json::Value& where, const Con
 
 void AddVolume(const ConfigReader& reader, const Json::Value& value, Config& config) {
   std::string name = reader.Name(value);
-  if (IsOneOf(name, kReservedVolumes) ||
+  if (kReservedVolumes.count(name) != 0 ||
       std::find(config.volumes.begin(), config.volumes.end(), name) != config.volumes.end()) {
     reader.Fail(value, std::string("the name '").append(name).append("' is taken"));
   }
@@ -183,7 +179,7 @@ void AddUser(const ConfigReader& reader, const Json::Value& value, Config& confi
 void AddShare(const ConfigReader& reader, const Json::Value& value, Config& config) {
   Share share = ReadShare(reader, value, config);
   CheckVolume(reader, value, config, share.volume);
-  if (config.FindShare(share.name) != nullptr || IsOneOf(share.name, kReservedShares)) {
+  if (config.FindShare(share.name) != nullptr || kReservedShares.count(share.name) != 0) {
     reader.Fail(value, "the name '" + share.name + "' is taken");
   }
   config.shares.push_back(std::move(share));

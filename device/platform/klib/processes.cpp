@@ -72,10 +72,7 @@ struct ProgramOutput {
 ssize_t ReadOutput(void* cookie, char* buffer, std::size_t size) {
   auto& source = *static_cast<ProgramOutput*>(cookie);
   if (!source.has_ended) {
-    ssize_t got = 0;
-    do {
-      got = read(source.output.Get(), buffer, size);
-    } while (got < 0 && errno == EINTR);
+    const ssize_t got = TEMP_FAILURE_RETRY(read(source.output.Get(), buffer, size));
     if (got != 0) {
       return got;
     }

@@ -126,13 +126,9 @@ Json::Value LumoLibBkgTaskInfoCreate(const Json::Value& data, const std::string&
 void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved) {
   Operation("LumoLibRemoveFinishedTask", task, pid, reserved).Run([&] {
     Vesk::Task::State* const state = task == nullptr ? nullptr : task->state;
-    try {
-      // As the answer has it: of a worker that has ended since, the next one reports the end.
-      if (state != nullptr && (state->row.finished || Device::HoldsErrors(*state))) {
-        state->Remove();
-      }
-    } catch (const std::exception& error) {
-      syslog(LOG_ERR, "remove finished task: %s", error.what());
+    // As the answer has it: of a worker that has ended since, the next one reports the end.
+    if (state != nullptr && (state->row.finished || Device::HoldsErrors(*state))) {
+      state->Remove();
     }
   });
 }

@@ -3,6 +3,7 @@
 
 #include <cstdarg>
 #include <ctime>
+#include <map>
 #include <memory>
 #include <stdexcept>
 #include <utility>
@@ -26,24 +27,10 @@ namespace {
 constexpr int kTaskIdWords = 2;
 constexpr char kPropNotify[] = "blMsg";
 
-// How many arguments follow a message key.
-struct MessageRow {
-  const char* key;
-  std::size_t arguments;
-};
-constexpr MessageRow kMessages[] = {
+// How many arguments follow a message key; none follow others.
+const std::map<std::string, std::size_t> kArgumentCounts = {
     {"filebrowser:filebrowser_compress_completed", 1},
-    {"filebrowser:filebrowser_compress_failed", 2},
-};
-
-std::size_t ArgumentCount(const std::string& message) {
-  for (const MessageRow& row : kMessages) {
-    if (message == row.key) {
-      return row.arguments;
-    }
-  }
-  return 0;
-}
+    {"filebrowser:filebrowser_compress_failed", 2}};
 
 void LogFailure(const char* operation, const std::exception& error) {
   syslog(LOG_ERR, "%s: %s", operation, error.what());
@@ -202,7 +189,8 @@ void Task::sendNotifyMessageNoEncode(const char* app, const char* task_id, const
   Device::NotificationRow row{0, std::time(nullptr), app, task_id, title, message, {}};
   va_list arguments;
   va_start(arguments, message);
-  for (std::size_t count = ArgumentCount(message); count > 0; --count) {
+  const auto found = kArgumentCounts.find(message);
+  for (std::size_t left = found == kArgumentCounts.end() ? 0 : found->second; left > 0; --left) {
     const char* const argument = va_arg(arguments, const char*);
     row.arguments.emplace_back(argument == nullptr ? "" : argument);
   }
