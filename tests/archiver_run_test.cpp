@@ -1,99 +1,16 @@
-// The archiver as a program: what it packs, and what it leaves behind when it cannot.
+// What the archiver packs, and what it says when it cannot.
 #include <fcntl.h>
-#include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <zip.h>
 
-#include <algorithm>
 #include <chrono>
-#include <csignal>
-#include <cstdint>
 #include <cstdlib>
 #include <ctime>
-#include <filesystem>
-#include <memory>
 
-#include "tests/emulation.h"
+#include "tests/archiver_fixture.h"
 #include "tests/unpacked.h"
 
 namespace {
-
-namespace fs = std::filesystem;
-
-struct Options {
-  std::string command = "a", actions, password;
-  const char* code_page = nullptr;  // set for a zip
-};
-
-// A share to pack from, a folder for archives and the caller's list file, all of the test's own.
-class ArchiverTest : public testing::Test {
- protected:
-  ArchiverTest() {
-    WriteFile(share / "a", "a");
-    fs::create_directories(out);
-  }
-
-  Strings CommandLine(const std::string& archive, const Strings& sources, const Options& options) {
-    std::string list;
-    for (const std::string& source : sources) {
-      list += "./" + source + '\n';
-    }
-    WriteFile(root / "list", list);
-    Strings argv = {KAVO_7Z_PATH, options.command, "-utf16", out / archive, options.actions, ""};
-    if (options.code_page != nullptr) {
-      argv.push_back(std::string("-lang") + options.code_page);
-    }
-    if (!options.password.empty()) {
-      argv.push_back("-p" + options.password);
-    }
-    argv.insert(argv.end(), {"-xr!@eaDir", "@" + (root / "list").string(), "-progress"});
-    return argv;
-  }
-
-  Strings Good(const std::string& archive, const Strings& sources, const Options& options = {}) {
-    const Ran ran = RunProgram(CommandLine(archive, sources, options), share);
-    Strings lines = Lines(ran.out);
-    EXPECT_EQ(ran.status, 0) << ran.out;
-    EXPECT_EQ(lines.back(), "Progress: 100");
-    for (const std::string& line : lines) {
-      EXPECT_TRUE(line.find("Error:") == line.npos || line.rfind("Compressing ", 0) == 0) << line;
-    }
-    return lines;
-  }
-
-  void Bad(const std::string& archive, const Strings& sources, const std::string& cause,
-           const Options& options = {}) {
-    const Ran ran = RunProgram(CommandLine(archive, sources, options), share);
-    EXPECT_NE(ran.status, 0);
-    const std::string last = Lines(ran.out).back();
-    EXPECT_EQ(last.rfind("Error: ", 0), 0U) << ran.out;
-    EXPECT_NE(last.find(cause), std::string::npos) << ran.out;
-    EXPECT_EQ(ran.out.find("Error:"), ran.out.rfind("Error:")) << ran.out;
-    EXPECT_EQ(ran.out.find("Progress: 100"), std::string::npos);
-  }
-
-  // A run that packs a sparse file of that size, to "new".
-  std::unique_ptr<Program> Pack(const Options& options = {}, std::uintmax_t size = kHuge) {
-    WriteFile(share / "huge", "");
-    fs::resize_file(share / "huge", size);
-    auto run = std::make_unique<Program>(CommandLine("new", {"huge"}, options), share);
-    EXPECT_TRUE(run->ReadUntil("Progress: 0\n")) << run->Seen();
-    return run;
-  }
-
-  Strings InOut() {
-    Strings names;
-    for (const auto& entry : fs::directory_iterator(out)) {
-      names.push_back(entry.path().filename());
-    }
-    std::sort(names.begin(), names.end());
-    return names;
-  }
-
-  static constexpr std::uintmax_t kHuge = 5ULL << 30U;  // it takes seconds to pack
-  const TempFolder temp;
-  const fs::path root = temp.Path(), share = root / "share", out = root / "out";
-};
 
 TEST_F(ArchiverTest, KeepsEveryNameWhateverItHolds) {
   Strings names = {"*",         "a?[b]",  "\"q\"",     "\"",   "-p",     "@at",
@@ -249,78 +166,6 @@ TEST_F(ArchiverTest, SaysWhyARequestCannotBeMet) {
   }
   Bad("new", {"a"}, "command", {"x", "", "", nullptr});
   EXPECT_EQ(InOut(), Strings{});
-}
-
-TEST_F(ArchiverTest, StopsWhenToldAndLeavesNothing) {
-  for (const int signal : {SIGTERM, SIGINT, SIGHUP, 0}) {  // 0: nobody reads any more
-    const auto run = Pack();
-    EXPECT_NE(run->Seen().find("Total: 5368709120\n"), std::string::npos) << run->Seen();
-    EXPECT_EQ(InOut().size(), 1U);
-    EXPECT_FALSE(fs::exists(out / "new"));
-    if (signal == 0) {
-      run->CloseOutput();
-    } else {
-      kill(-run->Pid(), signal);
-      EXPECT_TRUE(run->ReadUntil("\nError: cancelled\n"));
-    }
-    EXPECT_EQ(run->Wait(), 1);
-    EXPECT_EQ(InOut(), Strings{});
-  }
-}
-
-TEST_F(ArchiverTest, SparesTheFolderOfARunThatIsAliveAndSweepsThatOfOneThatWasKilled) {
-  const auto run = Pack();
-  Strings before = InOut();
-  ASSERT_EQ(before.size(), 1U);
-  Good("other", {"a"});
-  EXPECT_EQ(InOut(), (Strings{before.front(), "other"}));
-
-  ASSERT_EQ(kill(run->Pid(), SIGKILL), 0);
-  EXPECT_EQ(run->Wait(), -SIGKILL);
-  EXPECT_EQ(InOut().size(), 2U);
-  // The stock 7z dies with its parent, in its own time; then nothing holds the lock.
-  for (int tries = 0; tries < 1000 && InOut() != Strings{"other"}; ++tries) {
-    Good("other", {"a"});
-  }
-  EXPECT_EQ(InOut(), Strings{"other"});
-}
-
-TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
-  for (const bool exists : {false, true}) {
-    if (exists) {
-      WriteFile(share / "b", "b");
-      Good("new", {"b"});
-    }
-    const auto run = Pack({}, 200 << 20);
-    Good("new", {"a"});
-    const std::string other = ReadFile(out / "new");
-    EXPECT_EQ(run->Wait(), 1);
-    EXPECT_TRUE(run->ReadUntil("\nCompressing huge\nProgress: "));
-    EXPECT_TRUE(run->ReadUntil("it has changed meanwhile"));
-    EXPECT_EQ(ReadFile(out / "new"), other);
-    EXPECT_EQ(InOut(), Strings{"new"});
-  }
-}
-
-TEST_F(ArchiverTest, SaysAHundredPercentWhenTheArchiveIsThere) {
-  const auto run = Pack({}, 100 << 20);
-  EXPECT_FALSE(fs::exists(out / "new"));
-  EXPECT_TRUE(run->ReadUntil("Progress: 100\n"));
-  EXPECT_TRUE(fs::exists(out / "new"));
-}
-
-TEST_F(ArchiverTest, HidesThePasswordFromOtherUsers) {
-  if (kIsEmulated) {
-    GTEST_SKIP() << "what a program makes of its arguments is the emulator's own memory";
-  }
-  const auto run = Pack({"a", "", "geheim", nullptr});
-  bool is_seen = false;
-  for (const auto& entry : fs::directory_iterator("/proc")) {
-    const std::string command = ReadFile(entry.path() / "cmdline");
-    is_seen = is_seen || command.find(root.string()) != std::string::npos;
-    EXPECT_EQ(command.find("geheim"), std::string::npos) << command;
-  }
-  EXPECT_TRUE(is_seen);
 }
 
 }  // namespace

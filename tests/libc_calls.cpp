@@ -27,7 +27,6 @@ LibcFault armed;
 int log_file = -1;
 int trace_file = -1;
 const void* module_base = nullptr;
-void (*dump_coverage)() = nullptr;
 std::string made_path;
 
 const void* BaseOf(const void* address) {
@@ -114,7 +113,6 @@ void Reopen(int& file, const std::string& path) {
 
 void WatchModule(void* module) {
   module_base = BaseOf(dlsym(module, "gTable"));
-  dump_coverage = reinterpret_cast<void (*)()>(dlsym(module, "KavoDumpCoverage"));
 }
 
 void SetLibcFiles(const std::string& folder) {
@@ -228,7 +226,6 @@ void exit(int status) noexcept {
 
 void _exit(int status) {  // NOLINT: the system's name
   IS_MODULES("_exit", status) && Fails("_exit", "");
-  dump_coverage != nullptr ? dump_coverage() : void();
   Real<void(int)>("_exit")(status);
   abort();
 }

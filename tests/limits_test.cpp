@@ -57,24 +57,6 @@ TEST_F(LimitTest, ReadOnlyVolume) {
   EXPECT_EQ(Fail("big"), Strings{folder_ + ": 411"});
 }
 
-TEST_F(LimitTest, VolumeOfTheTaskStore) {
-  const std::string store = At("users/alice");
-  for (const bool is_full : {true, false}) {
-    ASSERT_EQ(mount("tmpfs", store.c_str(), "tmpfs", 0, "mode=0777,size=100k"), 0);
-    if (is_full) {
-      RunProgram({"/bin/dd", "if=/dev/zero", "of=" + store + "/filler", "bs=1k"});
-    } else {
-      ASSERT_EQ(mount(nullptr, store.c_str(), nullptr, MS_REMOUNT | MS_RDONLY, nullptr), 0);
-    }
-    Watch();
-    EXPECT_EQ(Call("start", JobParams({"/photo/big"}, "/photo/z.zip")).code, 401);
-    EXPECT_EQ(Ask("status", "Zantro_x").code, 599);
-    EXPECT_TRUE(Calls("KLIBCProcFork").empty());
-    EXPECT_NE(ReadFile(temp_.Path() + "/log").find("task store "), std::string::npos);
-    ASSERT_EQ(umount(store.c_str()), 0);
-  }
-}
-
 TEST_F(LimitTest, Quota) {
   const std::string image = temp_.Path() + "/image";
   WriteFile(image, "");

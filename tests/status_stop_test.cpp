@@ -1,5 +1,4 @@
 // Following a job and ending it, from requests of their own.
-#include <sqlite3.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -126,20 +125,6 @@ TEST_F(TaskTest, AKilledJobIsReportedAsFailed) {
     EXPECT_EQ(Device::ToText(answer["errors"]), R"([{"code":1300,"path":"/photo/z.7z"}])");
     EXPECT_EQ(Ask("status", task_id).code, 599);
   }
-}
-
-// Of a "stop" that has died in the middle, in a time that the clock says is yet to come.
-TEST_F(TaskTest, AClockThatIsSetBackStopsNoJob) {
-  Device::TaskStore store("alice");
-  store.AddWorker(1, 1);
-  store.NoteStop(1);
-  EXPECT_TRUE(Device::IsBeingStopped("alice", 1));
-  sqlite3* database = nullptr;
-  ASSERT_EQ(sqlite3_open(At("users/alice/store.db").c_str(), &database), SQLITE_OK);
-  sqlite3_exec(database, "UPDATE workers SET stopped = stopped + 9", nullptr, nullptr, nullptr);
-  ASSERT_EQ(sqlite3_close(database), SQLITE_OK);
-  EXPECT_FALSE(Device::IsBeingStopped("alice", 1));
-  Device::CloseStores();
 }
 
 TEST_F(TaskTest, StopNeverKillsAProcessThatIsNoWorker) {
