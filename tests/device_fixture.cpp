@@ -79,7 +79,7 @@ Strings UpTo(const Strings& names, const std::string& calls) {
   return {};
 }
 
-Strings Behind(const Strings& names, const std::string& call) {
+Strings After(const Strings& names, const std::string& call) {
   return {std::find(names.rbegin(), names.rend(), call).base(), names.end()};
 }
 
@@ -94,7 +94,7 @@ DeviceTest::DeviceTest() {
   Device::Open(device_);
   SetLibcFiles(temp_.Path());
   chmod(temp_.Path().c_str(), 01777);  // the users' processes add files of their own
-  Watch();
+  StartOver();
   launcher_.emplace();
   const std::unique_ptr<void, int (*)(void*)> module(dlopen(ModulePath().c_str(), RTLD_NOW),
                                                      dlclose);
@@ -212,7 +212,7 @@ Strings DeviceTest::Log() const {
   static const std::regex kPlace("(^|\n)(KAVO\\.Zantro\\.Compress|lumo_webapi):[0-9]+ ");
   static const std::regex kError("(errno: |set UGID, ).*");
   const std::string text = std::regex_replace(ReadFile(temp_.Path() + "/log"), kPlace, "$1");
-  return Lines(Plain(std::regex_replace(text, kError, "$1*")));
+  return Lines(WithPlaceholders(std::regex_replace(text, kError, "$1*")));
 }
 
 std::vector<TracedCall> DeviceTest::Calls(const std::string& call) const {
@@ -262,11 +262,11 @@ Strings DeviceTest::Sequence(int pid, bool with_arguments) const {
       text += arguments.substr(1, arguments.size() - 2) + "\n";
     }
   }
-  const Strings lines = Lines(Plain(text));
+  const Strings lines = Lines(WithPlaceholders(text));
   return with_arguments ? lines : NamesOf(lines);
 }
 
-std::string DeviceTest::Plain(std::string text) const {
+std::string DeviceTest::WithPlaceholders(std::string text) const {
   const std::string worker =
       "(\"pid\":|\nDoKill |RemoveFinishedTask \"object\",)" + std::to_string(Worker()) + "\\b";
   text = std::regex_replace(text, std::regex(worker), "$1PID");
@@ -279,7 +279,7 @@ std::string DeviceTest::Plain(std::string text) const {
   return text;
 }
 
-void DeviceTest::Watch() {
+void DeviceTest::StartOver() {
   Device::StopTracing();
   SetLibcFault({});
   for (const char* name : {"/log", "/trace"}) {

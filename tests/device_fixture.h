@@ -26,7 +26,7 @@ Strings NamesOf(Strings sequence);
 // and the other calls.
 Strings UpTo(const Strings& names, const std::string& calls);
 // Their end behind the last CALL.
-Strings Behind(const Strings& names, const std::string& call);
+Strings After(const Strings& names, const std::string& call);
 Strings operator+(Strings first, const Strings& second);
 
 struct TracedCall {
@@ -66,7 +66,7 @@ class DeviceTest : public testing::Test {
   // Waits, for a while, until the condition holds.
   static bool WaitUntil(const std::function<bool()>& condition);
 
-  // The module's log lines without their file and line, as Plain has them.
+  // The module's log lines without their file and line, with placeholders.
   Strings Log() const;
   // The calls of one operation, or of all.
   std::vector<TracedCall> Calls(const std::string& call = "") const;
@@ -75,15 +75,15 @@ class DeviceTest : public testing::Test {
   // The living processes of the worker's group: itself, the archiver, the stock 7z.
   static std::set<pid_t> Group(pid_t worker);
   // What a process called, libc's calls by the module among it: one line for each, the name and,
-  // if asked for, the arguments as Plain has them. Getters of the request and of the task's id are
+  // if asked for, the arguments with placeholders. Getters of the request and of the task's id are
   // left out: nothing depends on when they are called.
   Strings Sequence(int pid, bool with_arguments = false) const;
   // What is not the same in every run replaced: DEV the device's folder, SID, PID the last worker's
   // process id, and * for a time and the rest of a task's id or a temporary name.
-  std::string Plain(std::string text) const;
+  std::string WithPlaceholders(std::string text) const;
 
   // Forgets fault rules, trace and log so far, and watches on.
-  void Watch();
+  void StartOver();
   // The archiver prints this text and ends well, from now on.
   void ScriptArchiver(const std::string& text);
 

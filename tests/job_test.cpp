@@ -73,7 +73,7 @@ TEST_F(JobTest, SourcesOfSeveralSharesAreNamedFromTheirShareWithLinksKept) {
                    "photo/trip/broken -> nowhere",
                    "photo/trip/out\xFF -> ../../../outside"};
   for (const std::string format : {"7z", "zip"}) {
-    Watch();
+    StartOver();
     Succeed(JobParams(sources, "/photo/z." + format, R"({"format":")" + format + "\"}"));
     EXPECT_EQ(Unpacked(At("vol1/photo/z." + format)), expected);
     const Ran listing =

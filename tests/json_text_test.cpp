@@ -3,8 +3,6 @@
 
 #include <gtest/gtest.h>
 
-#include <algorithm>
-#include <limits>
 #include <stdexcept>
 #include <string>
 
@@ -34,16 +32,6 @@ TEST(JsonTextTest, NumbersHaveTheTypesOfValuesMadeInTheProgram) {
   for (const double number : {0.1, 1e-300, 1.7976931348623157e308, 5e-324, 0.28999999165534973}) {
     EXPECT_EQ(ParseJson(ToText(number)).asDouble(), number);
   }
-}
-
-TEST(JsonTextTest, ValuesKnowTheirLine) {
-  const std::string text = "{\"list\":\n[\n1]}";
-  const Json::Value list = ParseJson(text)["list"];
-  const auto line_of = [&](const Json::Value& value) {
-    return std::count(text.begin(), text.begin() + value.getOffsetStart(), '\n');
-  };
-  EXPECT_EQ(line_of(list), 1);
-  EXPECT_EQ(line_of(list[0]), 2);
 }
 
 TEST(JsonTextTest, WhatIsNoJsonIsRefusedWithItsPlace) {

@@ -111,9 +111,7 @@ void Reopen(int& file, const std::string& path) {
 
 }  // namespace
 
-void WatchModule(void* module) {
-  module_base = BaseOf(dlsym(module, "gTable"));
-}
+void WatchModule(void* module) { module_base = BaseOf(dlsym(module, "gTable")); }
 
 void SetLibcFiles(const std::string& folder) {
   Reopen(trace_file, folder + "/trace");

@@ -30,7 +30,7 @@ TEST_P(RequestTest, AnswersWithItsCodeAndLinesAndNoFurtherCall) {
   AddFaults(row.All("fault"));
   const Json::Value params = Device::ParseJson(row.Get("params", R"({"taskid":"Zantro_test"})"));
   const Device::Outcome outcome = Call(method, params, "alice", std::stoi(row.Get("version", "3")));
-  EXPECT_EQ(Plain(std::to_string(outcome.code) + " " + Device::ToText(outcome.data)),
+  EXPECT_EQ(WithPlaceholders(std::to_string(outcome.code) + " " + Device::ToText(outcome.data)),
             row.Get("answer"));
   EXPECT_EQ(Log(), row.All("log"));
 

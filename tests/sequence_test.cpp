@@ -18,7 +18,7 @@ class SequenceTest : public DeviceTest {
     }
     Add("vol1/photo/out.zip", "an archive");
     ScriptArchiver("Total: 9\nCompressing trip/a.txt\nProgress: 50\n");
-    Watch();
+    StartOver();
   }
 
   // The processes of the last request and of its worker.
@@ -60,7 +60,7 @@ TEST_F(SequenceTest, AJobOfTwoSharesThatNotifies) {
 
 TEST_F(SequenceTest, AJobThatFails) {
   RunJob(JobParams({"/photo/none"}, "/photo/<b>.zip"));
-  EXPECT_THAT(Behind(Sequence(Worker(), true), "syslog"),
+  EXPECT_THAT(After(Sequence(Worker(), true), "syslog"),
               ElementsAreArray(ExpectedSequence("failed_job")));
   EXPECT_EQ(Log(), Strings{"Can't access source files"});
 }

@@ -67,7 +67,7 @@ TEST_F(TaskTest, AStopWhileTheListIsStagedLeavesNoList) {
     const char *call, *part;
   } rows[] = {{"mkstemp", "lumozip"}, {"write", "a.txt"}, {"stat", "a.txt"}};
   for (const auto& row : rows) {
-    Watch();
+    StartOver();
     SetLibcFault({row.call, row.part, 0, SIGTERM});
     EXPECT_EQ(Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip")).code, 0);
     ASSERT_TRUE(WaitUntil([&] { return !Calls("exit").empty(); })) << row.call;
@@ -82,7 +82,7 @@ TEST_F(TaskTest, AStopAtTheVeryEndRemovesNoFile) {
   Add("vol1/photo/a.txt", "a");
   SetLibcFault({"_exit", "", 0, SIGTERM});
   RunJob(JobParams({"/photo/a.txt"}, "/photo/z.zip"));
-  EXPECT_EQ(Behind(Sequence(Worker()), "_exit"), Words("kill exit"));
+  EXPECT_EQ(After(Sequence(Worker()), "_exit"), Words("kill exit"));
 }
 
 TEST_F(TaskTest, AFinishedTaskIsReportedOnce) {
@@ -111,7 +111,7 @@ TEST_F(TaskTest, AnotherUserSeesNoTaskAndStopsNone) {
 
 TEST_F(TaskTest, AKilledJobIsReportedAsFailed) {
   for (const bool is_worker_killed : {true, false}) {
-    Watch();
+    StartOver();
     const std::string task_id = StartEndlessJob();
     ASSERT_TRUE(IsPacking());
     for (const pid_t pid : Group(Worker())) {

@@ -45,7 +45,7 @@ TEST_F(StoreTest, ADamagedStoreIsSetAsideAndTheDeviceGoesOn) {
     }
     fs::resize_file(file_, 0);
     WriteFile(file_, content);
-    Watch();
+    StartOver();
     RunJobs();  // may meet the damage on its way
     EXPECT_EQ(RunJobs(), 0);
     Strings said;

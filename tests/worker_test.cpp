@@ -45,7 +45,7 @@ TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
                 row.Get("params", R"({"mode":"x","level":"x","password":"x"})"));
   Strings items = FailJob(params, row.Get("user", "alice"));
   std::transform(items.begin(), items.end(), items.begin(),
-                 [&](const std::string& item) { return Plain(item); });
+                 [&](const std::string& item) { return WithPlaceholders(item); });
   EXPECT_EQ(items, row.All("item"));
   Strings log = Log();
   for (std::string& line : log) {
@@ -57,7 +57,8 @@ TEST_P(JobFails, WithItsItemsAndLinesAndNoFurtherCall) {
   EXPECT_EQ(Sequence(Worker()),
             UpTo(job, row.Get("calls")) + NamesOf(ExpectedSequence("failed_job")));
   for (const TracedCall& removal : Calls("KLIBCExecl")) {
-    EXPECT_EQ(Plain(Device::ToText(removal.args)), R"(["/bin/rm",187,["-rf","/tmp/lumozip*"]])");
+    EXPECT_EQ(WithPlaceholders(Device::ToText(removal.args)),
+              R"(["/bin/rm",187,["-rf","/tmp/lumozip*"]])");
   }
   for (const std::string& path : StagedPaths()) {
     EXPECT_EQ(row.name, "ParentLongerThanSource") << path;
@@ -90,7 +91,7 @@ TEST_F(WorkerTest, NotifiesOnceOfAFailureWithTwoArguments) {
   AddFaults({"Vesk::Task::getBoolProperty=1", "LumoLibGetPrivilege=-1:402"});
   RunJob(JobParams({"/photo/a.txt"}, "/photo/<b>.zip"));
   const Json::Value sent = Calls("Vesk::Task::sendNotifyMessageNoEncode").front().args;
-  EXPECT_EQ(Plain(Device::ToText(sent)),
+  EXPECT_EQ(WithPlaceholders(Device::ToText(sent)),
             R"(["KAVO.Nolo.App.Zantro3.Instance","Zantro_*","tree:leaf_filebrowser",)"
             R"("filebrowser:filebrowser_compress_failed",["/photo/&lt;b&gt;.zip",)"
             R"("the session has ended"]])");
@@ -102,7 +103,7 @@ TEST_F(WorkerTest, NotifiesOnceOfAFailureWithTwoArguments) {
 TEST_F(WorkerTest, TakesAnArchiveOfItselfForDone) {
   const Json::Value answer = RunJob(JobParams({"/photo/z.zip"}, "/photo/z.zip/"));
   EXPECT_FALSE(answer.isMember("errors"));
-  const Strings end = Behind(NamesOf(ExpectedSequence("job_of_one_share")), "unlink");
+  const Strings end = After(NamesOf(ExpectedSequence("job_of_one_share")), "unlink");
   EXPECT_EQ(Sequence(Worker()), Words("KLIBCProcFork signal WaitForTaskDataReady") + end);
   RunJob(JobParams({"/photo/z.zip", "/photo/z.zip"}, "/photo/z.zip"));
   EXPECT_EQ(LastData()["errors"].size(), 2U);
@@ -186,10 +187,10 @@ TEST_F(WorkerTest, DoesNotFinishATaskItCannotRead) {
   ASSERT_TRUE(WaitUntil([&] { return !Calls("_exit").empty(); }));
   EXPECT_EQ(Log().front(), "Failed to get task data");
   EXPECT_EQ(Log().back(), "Failed to get json data");
-  EXPECT_EQ(Behind(Sequence(Worker()), "Vesk::Task::getProperty"),
+  EXPECT_EQ(After(Sequence(Worker()), "Vesk::Task::getProperty"),
             Words("syslog CleanTimeOutTasks _exit"));
   EXPECT_TRUE(Calls("SaveTaskData").empty());
-  Watch();
+  StartOver();
   ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
   for (int time = 0; time < 2; ++time) {  // until it is removed
     const Device::Outcome status = Ask("status", started.data["taskid"].asString());
@@ -209,7 +210,7 @@ TEST_F(WorkerTest, LogsWhatItCannotStoreAndEndsAllTheSame) {
               {"Vesk::Task::getProperty#1=text", "Failed to get task data"},
               {"Vesk::Task::getProperty#1=7", "Failed to get task data"}};
   for (const auto& row : rows) {
-    Watch();
+    StartOver();
     Device::AddFault(row.fault);
     Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip"));
     ASSERT_TRUE(WaitUntil([&] { return !Calls("_exit").empty(); }));
