@@ -16,6 +16,7 @@ const SESSION_ENDED = 'The session has ended. Sign in again.';
 const app = byId('app');
 const drawerToggle = byId('drawer-toggle');
 let session = null;
+let lastUser = '';  // whose folder the location names
 
 const files = new Files({ onSelect: () => drawSelection() });
 const tray = new Tray({ onChange: () => drawSelection() });
@@ -43,12 +44,18 @@ const events = new Events({
 });
 
 function enter(signedIn) {
+  if (lastUser && lastUser !== signedIn.user) forgetFolder();
+  lastUser = signedIn.user;
   session = signedIn;
   signInForm.hide();
   byId('signed-in-user').textContent = shown(session.user);
   app.hidden = false;
   events.open();
   files.openLocation();
+}
+
+function forgetFolder() {
+  history.replaceState(null, '', location.pathname);
 }
 
 function endSession() {
@@ -99,6 +106,7 @@ byId('compress').addEventListener('click', () => {
 byId('sign-out').addEventListener('click', async () => {
   try {
     await signOut();
+    forgetFolder();
     leave('');
   } catch (refusal) {
     notify('sign-out', `Signing out did not work: ${refusal.message}.`, true);
