@@ -1,12 +1,13 @@
 // A sample device of its own for each test file, served on a free port, and clients of it.
-import { execFileSync, spawn } from 'node:child_process';
-import { mkdtempSync, readFileSync, rmSync, chmodSync } from 'node:fs';
+import { execFileSync, spawn, spawnSync } from 'node:child_process';
+import { chmodSync, chownSync, mkdtempSync, rmSync, truncateSync, writeFileSync } from 'node:fs';
 import { tmpdir } from 'node:os';
 import path from 'node:path';
 import { createInterface } from 'node:readline';
+import { setTimeout as sleep } from 'node:timers/promises';
 
 export const build = process.env.KAVO_BUILD;
-const program = path.join(build, 'kavo-device');
+export const program = path.join(build, 'kavo-device');
 export const isRoot = process.getuid() === 0;
 
 // Runs the program behind two folders with mounts and a small /tmp of its own, where the two stay.
@@ -18,18 +19,20 @@ const ownMounts = `
   done && mount --move "$1/tmp" /tmp && shift 2 && exec "$@"`;
 
 export class Device {
-  static all = new Set();
-
-  // One that is `isolated` has mounts and a /tmp that only it sees; that takes root.
-  static async start({ isolated = false, faults = [], env = {} } = {}) {
+  // Root's has mounts and a /tmp that only it sees, unless it is run by an `owner`, a uid and gid.
+  // `env` gets the folder around the device's.
+  static async start({ faults = [], env = () => ({}), owner = {} } = {}) {
     const device = new Device();
-    Device.all.add(device);
     device.base = mkdtempSync(path.join(tmpdir(), 'kavo-web-'));
     chmodSync(device.base, 0o755);
+    chownSync(device.base, owner.uid ?? process.getuid(), owner.gid ?? process.getgid());
     device.folder = path.join(device.base, 'nas');
+    device.at = (...names) => path.join(device.folder, ...names);
     device.faults = faults.flatMap((rule) => ['--fault', rule]);
-    Object.assign(device, { isolated, env: { ...process.env, ...env } });
-    execFileSync(program, ['init', device.folder], { stdio: 'pipe' });
+    device.isolated = isRoot && !owner.uid;
+    device.options = { ...owner, cwd: device.base, env: { ...process.env, ...env(device.base) } };
+    execFileSync(program, ['init', device.folder], { ...owner, stdio: 'pipe' });
+    device.add('vol1/photo/endless', 2 ** 40);
     await device.serve();
     return device;
   }
@@ -38,32 +41,24 @@ export class Device {
     const serve = [program, 'serve', this.folder, '--listen', '127.0.0.1:0', ...this.faults];
     const [command, ...args] = this.isolated
       ? ['unshare', '-m', 'sh', '-c', ownMounts, 'sh', this.base, build, ...serve] : serve;
-    this.process = spawn(command, args, { env: this.env });
+    this.process = spawn(command, args, this.options);
+    this.tmp = this.isolated ? `/proc/${this.process.pid}/root/tmp` : '/tmp';
     this.log = '';
     this.process.stderr.on('data', (data) => { this.log += data; });
     this.ended = new Promise((resolve) => { this.process.on('exit', resolve); });
-    for await (const line of createInterface({ input: this.process.stdout })) {
-      this.url = line.match(/ on (http:.*)\/$/)[1];
-      return;
-    }
-    throw new Error(`no address: ${this.log}`);
+    const { value } = await createInterface(this.process.stdout)[Symbol.asyncIterator]().next();
+    if (!value) throw new Error(`no address: ${this.log}`);
+    this.url = value.match(/ on (http:.*)\/$/)[1];
   }
 
-  async stop() {
+  stop() {
     this.process.kill('SIGTERM');
     return this.ended;
   }
 
   async remove() {
-    Device.all.delete(this);
     await this.stop();
-    for (const { pid } of this.processes()) {
-      try {
-        process.kill(pid, 'SIGKILL');
-      } catch {
-        // It has ended meanwhile.
-      }
-    }
+    this.processes().forEach(({ pid }) => kill(pid));
     rmSync(this.base, { recursive: true, force: true, maxRetries: 50 });
   }
 
@@ -73,81 +68,101 @@ export class Device {
       { stdio: 'pipe' });
   }
 
-  // The device's /tmp, as others reach it.
-  get tmp() {
-    return this.isolated ? `/proc/${this.process.pid}/root/tmp` : '/tmp';
+  // Makes a file of alice's; a number as content is the length of a sparse one.
+  add(name, content = 'x') {
+    const file = Buffer.concat([Buffer.from(`${this.folder}/`), Buffer.from(name)]);
+    writeFileSync(file, typeof content === 'number' ? '' : content);
+    if (typeof content === 'number') truncateSync(file, content);
+    if (isRoot) chownSync(file, 65001, 65100);
   }
 
-  // A path in the device's folder.
-  at(...names) {
-    return path.join(this.folder, ...names);
-  }
-
-  // What runs of the device: launcher, workers, archivers, by their command lines.
-  processes() {
-    return execFileSync('ps', ['-eo', 'pid=,args='], { encoding: 'utf8' }).split('\n')
-      .map((line) => line.trim().match(/^(\d+) (.*)$/))
-      .filter((match) => match && match[2].includes(this.folder))
-      .map((match) => ({ pid: Number(match[1]), args: match[2] }));
-  }
-
-  names(archive) {
-    return listing(this.at(archive));
+  // What runs of the device, of these kinds or all. A worker's group has its archiver and 7z too.
+  processes(...kinds) {
+    const kindOf = (pid, parent, group, args) => {
+      if (args.startsWith('kavo-web') && parent === this.process.pid) return 'front end';
+      if (!args.includes(this.folder)) return null;
+      if (pid === this.process.pid) return 'launcher';
+      if (args.startsWith('/usr/lib/p7zip')) return '7z';
+      if (args.includes('-progress')) return 'archiver';
+      return pid === group ? 'worker' : 'request';
+    };
+    return execFileSync('ps', ['-eo', 'pid=,ppid=,pgid=,args='], { encoding: 'utf8' }).split('\n')
+      .map((line) => line.match(/(\d+) +(\d+) +(\d+) (.*)/)).filter((match) => match)
+      .map(([, pid, parent, group, args]) =>
+        ({ pid: +pid, group: +group, args, kind: kindOf(+pid, +parent, +group, args) }))
+      .filter(({ kind }) => kind && (kinds.length === 0 || kinds.includes(kind)));
   }
 }
 
-// The names in an archive, sorted.
-export function listing(archive) {
-  return execFileSync('/usr/bin/7z', ['l', '-ba', '-slt', archive], { encoding: 'utf8' })
-    .split('\n').filter((line) => line.startsWith('Path = ')).map((line) => line.slice(7)).sort();
+// False when it has ended by itself meanwhile.
+export const kill = (pid, signal = 'KILL') => spawnSync('kill', [`-${signal}`, pid]).status === 0;
+
+// The names in an archive, each with the checksum of a file's content.
+export function contents(archive) {
+  const listed = execFileSync('/usr/bin/7z', ['l', '-ba', '-slt', archive], { encoding: 'utf8' });
+  return new Map([...listed.matchAll(/^Path = (.*)[^]*?^CRC = (\w*)/gm)].map((row) => row.slice(1)));
 }
+export const listing = (archive) => [...contents(archive).keys()].sort();
 
 // Waits until the function answers something true, and returns that.
 export async function until(body, seconds = 30) {
-  const deadline = Date.now() + seconds * 1000;
-  for (;;) {
+  for (const deadline = Date.now() + seconds * 1000; Date.now() < deadline; await sleep(10)) {
     const result = await body();
-    if (result) {
-      return result;
-    }
-    if (Date.now() > deadline) {
-      throw new Error(`not in ${seconds} s: ${body}`);
-    }
-    await new Promise((resolve) => { setTimeout(resolve, 10); });
+    if (result) return result;
   }
+  throw new Error(`not in ${seconds} s: ${body}`);
 }
 
 // A signed-in user without a browser.
 export class Client {
   static async signIn(device, user, password = user) {
-    const client = new Client();
-    client.device = device;
-    const response = await fetch(`${device.url}/session`, {
+    const client = Object.assign(new this(), { device, user, cookie: '' });
+    client.signedIn = await client.ask('/session', {
       method: 'POST', body: new URLSearchParams({ user, password }) });
-    client.signedIn = { status: response.status, cookie: response.headers.get('set-cookie') };
-    client.cookie = client.signedIn.cookie?.split(';')[0] ?? '';
+    client.cookie = client.signedIn.headers.get('set-cookie')?.split(';')[0] ?? '';
     return client;
   }
 
-  async ask(route, options = {}) {
-    const response = await fetch(this.device.url + route, {
-      ...options, headers: { Cookie: this.cookie, ...options.headers } });
-    const text = await response.text();
-    return { status: response.status, text, body: text ? JSON.parse(text) : null };
+  fetch(route, options = {}) {
+    const headers = { Cookie: this.cookie, ...options.headers };
+    return fetch(this.device.url + route, { ...options, headers });
+  }
+
+  async ask(route, options) {
+    const response = await this.fetch(route, options);
+    const [{ status, headers }, text] = [response, await response.text()];
+    return { status, headers, text, body: text.startsWith('{') ? JSON.parse(text) : null };
+  }
+
+  // Opens a stream of events; `events` are those of a kind that have come.
+  async follow() {
+    const ending = new AbortController();
+    const { status, headers, body } = await this.fetch('/events', { signal: ending.signal });
+    let text = '';
+    const read = async () => { for await (const part of body) text += Buffer.from(part); };
+    read().catch(() => {});  // it is closed
+    const events = (kind) => [...text.matchAll(new RegExp(`^event: ${kind}\ndata: (.*)\n\n`, 'gm'))]
+      .map(([, data]) => JSON.parse(data));
+    return { status, headers, events, close: () => ending.abort() };
   }
 
   async call(method, params) {
-    const answer = await this.ask('/webapi', {
-      method: 'POST',
-      body: new URLSearchParams({
-        api: 'KAVO.Zantro.Compress', version: 3, method, ...params }) });
-    return answer.body;
+    const body = JSON.stringify({ api: 'KAVO.Zantro.Compress', version: 3, method, params });
+    return (await this.ask('/webapi', { method: 'POST', body })).body;
   }
 
   async start(sources, dest, params = {}) {
-    const answer = await this.call('start', {
-      path: JSON.stringify(sources), dest_file_path: JSON.stringify([dest]), ...params });
-    return answer.data.taskid;
+    const [path, dest_file_path] = [sources, [dest]].map((paths) => JSON.stringify(paths));
+    return (await this.call('start', { path, dest_file_path, ...params })).data.taskid;
+  }
+
+  // A job without an end, when it packs: its task and the process of its worker.
+  async startEndless() {
+    const others = this.device.processes('7z').map(({ pid }) => pid);
+    const level = 'fastest';  // in a zip, which leaves the machine's other processors alone
+    const taskid = await this.start(['/photo/endless'], '/photo/endless.zip', { level });
+    const packing = () => this.device.processes('7z').find(({ pid }) => !others.includes(pid));
+    return { taskid, worker: (await until(packing)).group };
   }
 
   async tasks() {
@@ -155,12 +170,8 @@ export class Client {
   }
 
   // The task when it is in that state.
-  async taskIn(state, taskid) {
+  taskIn(state, taskid) {
     return until(async () => (await this.tasks())
       .find((task) => task.taskid === taskid && task.state === state));
   }
-}
-
-export function text(file) {
-  return readFileSync(file, 'utf8');
 }

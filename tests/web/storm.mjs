@@ -1,30 +1,37 @@
 // Load and faults on served devices: storm.mjs [--short] [SEED] [NAME...]. One line for each storm;
 // the exit status tells whether all held. The seed of a run is printed, so that it can be repeated.
-import { Device } from './device.mjs';
-import { archiverIsMissing, clockIsSetBack, storeIsDamaged, volumesAreFull } from
-  './storm/faults.mjs';
-import { killsAtRandom } from './storm/kills.mjs';
-import { hoursOfUse, manyJobsAtOnce, stopsAtAnyMoment } from './storm/load.mjs';
-import { names, seed } from './storm/tools.mjs';
+import { Device, isRoot } from './device.mjs';
+import { archiver, clock, stores, volumes } from './storm/faults.mjs';
+import { jobs, kills, stops, use } from './storm/load.mjs';
+import { calmCheck, names, seed } from './storm/tools.mjs';
 
-const storms = { jobs: manyJobsAtOnce, stops: stopsAtAnyMoment, kills: killsAtRandom,
-  volumes: volumesAreFull, archiver: archiverIsMissing, clock: clockIsSetBack,
-  stores: storeIsDamaged, use: hoursOfUse };
+const storms = { jobs, stops, kills, volumes, archiver, clock, stores, use };
 for (const name of names.filter((each) => !(each in storms))) {
   console.error(`no storm '${name}'; there are ${Object.keys(storms).join(', ')}`);
   process.exit(2);
 }
-console.log(`seed ${seed}`);
-for (const [name, storm] of Object.entries(storms)) {
-  if (names.length > 0 && !names.includes(name)) {
-    continue;
+
+// A storm answers what to say, and what is left behind on purpose.
+async function run(storm) {
+  if (storm.takesRoot && !isRoot) return ['skip ', 'it takes root'];
+  const device = await Device.start({ env: storm.env });
+  try {
+    const isCalm = calmCheck(device);
+    const [said, left] = await storm(device, isCalm);
+    await isCalm(left);
+    return ['ok   ', said];
+  } finally {
+    await device.remove();
   }
+}
+
+console.log(`seed ${seed}`);
+for (const name of Object.keys(storms).filter((each) => !names.length || names.includes(each))) {
   const begin = performance.now();
-  const told = await storm().then((said) => `ok    ${name}: ${said}`, (error) => {
+  const [result, said] = await run(storms[name]).catch((error) => {
     process.exitCode = 1;
-    return `FAILS ${name}: ${error.message}`;
+    return ['FAILS', error.message];
   });
-  await Promise.all([...Device.all].map((device) => device.remove()));
-  console.log(`${told} (${((performance.now() - begin) / 1000).toFixed(0)} s)`);
+  console.log(`${result} ${name}: ${said} (${((performance.now() - begin) / 1000).toFixed(0)} s)`);
 }
 process.exit();

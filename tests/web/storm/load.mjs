@@ -1,93 +1,44 @@
-// Load: many jobs at once, jobs that are stopped, and hours of use.
+// Load: many jobs at once, jobs that are stopped, processes that are killed, and hours of use.
+import assert from 'node:assert/strict';
 import { execFileSync } from 'node:child_process';
-import { existsSync } from 'node:fs';
-import path from 'node:path';
-import { Worker } from 'node:worker_threads';
+import { existsSync, readFileSync } from 'node:fs';
 
-import { Client, Device, isRoot, until } from '../device.mjs';
-import { addEndless, addZeros, calmCheck, ended, follow, footprints, isShort, moment, pick, quantile,
-  random, require, runJob, scale, users } from './tools.mjs';
+import { Client, contents, kill, listing, until } from '../device.mjs';
+import { assertDone, assertFailed, ended, moment, pick, random, runJob, scale, signInAll, users }
+  from './tools.mjs';
 
-const signIn = (device) => Promise.all(users.map((user) => Client.signIn(device, user)));
-const archiveOf = (device, user, dest) =>
-  device.at(user === 'carol' ? 'vol2' : 'vol1', 'homes', user, path.basename(dest));
+const archiveOf = ({ device, user }, dest) =>
+  device.at(user === 'carol' ? 'vol2' : 'vol1', dest.replace('/home', `homes/${user}`));
 
-// The names of an archive's files, each with the checksum of its content.
-function contents(archive) {
-  const listed = execFileSync('/usr/bin/7z', ['l', '-ba', '-slt', archive], { encoding: 'utf8' });
-  const files = listed.matchAll(/Path = (.*)[^]*?CRC = (\w+)/g);
-  return new Map([...files].map(([, name, checksum]) => [name, checksum]));
-}
-
-// Of answers, what the later asks for.
-const summary = (answers, part) => quantile(answers.map(({ took }) => took), part);
-
-export async function manyJobsAtOnce() {
-  const device = await Device.start({ isolated: isRoot });
-  const isCalm = await calmCheck(device);
-  for (const name of ['photo/zeros', 'music/zeros']) {
-    addZeros(device, `vol1/${name}`, 2 ** 24);  // keep the archiver at work, and little of the disk
-  }
+export async function jobs(device) {
+  device.add('vol1/photo/zeros', 2 ** 24);  // keeps the archiver at work, and little of the disk
+  device.add('vol1/music/zeros', 2 ** 24);
   const sources = [['/photo/zeros'], ['/photo/cat.jpg'], ['/photo/zeros', '/music/zeros']];
   execFileSync('7z', ['a', '-bso0', '-mx0', '../reference.7z', 'photo/zeros', 'photo/cat.jpg',
     'music/zeros'], { cwd: device.at('vol1') });
   const reference = contents(device.at('reference.7z'));
-  const clients = await signIn(device);
-  const prober = new Worker(new URL('./prober.mjs', import.meta.url),
-    { workerData: { url: device.url, cookie: clients[0].cookie } });
-  const told = () => new Promise((resolve) => { prober.once('message', resolve); });
-  const idle = summary(await told(), 0.5);
-  const jobs = await Promise.all(Array.from({ length: scale(200, 24) }, async (_, index) => {
-    const [client, user] = [clients[index % 3], users[index % 3]];
+  const clients = await signInAll(device);
+  const all = await Promise.all(Array.from({ length: scale(200, 24) }, async (_, index) => {
+    const client = clients[index % 3];
     const paths = sources[(index + Math.floor(index / 3)) % 3];
-    const dest = `/home/${index}.${index % 2 ? 'zip' : '7z'}`;
-    const params = { format: index % 2 ? 'zip' : '7z', level: 'fastest' };
-    return { client, user, paths, dest, taskid: await client.start(paths, dest, params) };
+    const format = index % 2 ? 'zip' : '7z';
+    const dest = `/home/${index}.${format}`;
+    const taskid = await client.start(paths, dest, { format, level: 'fastest' });
+    return { client, paths, dest, taskid };
   }));
-  const accepted = performance.timeOrigin + performance.now();
-  for (const { client, taskid, dest } of jobs) {
-    const end = await ended(client, taskid, 120);
-    require(!end.errors && end.dest_file_path === dest, end);
+  for (const { client, paths, dest, taskid } of all) {
+    assertDone(await ended(client, taskid), dest);
+    assert.deepEqual(contents(archiveOf(client, dest)), new Map(paths.map((each) =>
+      [each.slice(paths.length > 1 ? 1 : '/photo/'.length), reference.get(each.slice(1))])));
   }
-  const all = performance.timeOrigin + performance.now() - accepted;
-  const answersTold = told();
-  prober.postMessage('enough');
-  const answers = await answersTold;
-  for (const { user, paths, dest } of jobs) {
-    const found = contents(archiveOf(device, user, dest));
-    const names = paths.map((each) => (paths.length > 1 ? each.slice(1) : path.basename(each)));
-    require(found.size === names.length && names.every((name, index) =>
-      found.get(name) === reference.get(paths[index].slice(1))), `${dest}: ${[...found]}`);
-  }
-  for (const client of clients) {
-    require((await client.tasks()).length === 0, 'tasks are left');
-  }
-  await isCalm({ folders: jobs.filter(({ paths }) => paths.length > 1).length });
-  await prober.terminate();
-  await device.remove();
-  // Answers among the starts wait for those, which must not wait for the jobs too.
-  const [during, after] = [answers.filter(({ asked }) => asked < accepted),
-    answers.filter(({ asked }) => asked >= accepted)];
-  const burst = accepted - answers[0].asked;
-  // A short run has few answers, and a busy machine's hiccup must not fail it.
-  const part = scale(0.95, 0.5);
-  const [amid, loaded] = [summary(during, part), summary(after, part)];
-  require(loaded < 10 * Math.max(idle, 1), `answers took ${loaded} ms, ${idle} ms when idle`);
-  require(isShort || burst < all / 2, `the starts took ${burst} ms, and the jobs after them ${all} ms`);
-  return `${jobs.length} jobs; ${100 * part} in 100 answers took up to ${loaded.toFixed(1)} ms beside them, ` +
-    `${amid.toFixed(0)} ms in ${burst.toFixed(0)} ms of starts; half ${idle.toFixed(1)} ms, idle`;
+  return [`${all.length} jobs`, { folders: all.filter(({ paths }) => paths.length > 1).length }];
 }
 
-export async function stopsAtAnyMoment() {
-  const device = await Device.start({ isolated: isRoot });
-  addEndless(device);
-  const isCalm = await calmCheck(device);
-  const clients = await signIn(device);
-  let left = scale(1000, 60);
-  let folders = 0;
-  const counts = { running: 0, finished: 0 };
-  await Promise.all(clients.map(async (client, index) => {
-    const dest = `/home/out${index}.7z`;
+export async function stops(device) {
+  let [left, folders, running] = [scale(1000, 60), 0, 0];
+  const dest = '/home/out.7z';
+  const clients = await signInAll(device);
+  await Promise.all(clients.map(async (client) => {
     for (; left > 0; --left) {
       const sources = pick([['/photo/endless'], ['/photo/cat.jpg'], ['/photo/trip'],
         ['/photo/trip', '/music/album/02.mp3'], ['/music/album/02.mp3', '/photo/endless']]);
@@ -95,67 +46,93 @@ export async function stopsAtAnyMoment() {
       const taskid = await client.start(sources, dest, { format: '7z', level: 'store' });
       await moment(pick([1, 10, 40, 150]));
       const { code, data } = await client.call('status', { taskid });
-      require(code === 0 && !data.errors && data.dest_file_path === dest &&
-        data.progress >= 0 && data.progress <= 1, { code, data });
-      counts[data.finished ? 'finished' : 'running'] += 1;
+      assert.ok(code === 0 && !data.errors && data.dest_file_path === dest &&
+        data.progress >= 0 && data.progress <= 1, JSON.stringify({ code, data }));
+      running += data.finished ? 0 : 1;
       await moment(pick([1, 10, 40]));
-      const stop = await client.call('stop', { taskid });
-      require(stop.code === 0 && stop.data === null, stop);
-      require((await client.call('status', { taskid })).code === 599, 'the task is still there');
+      assert.deepEqual(await client.call('stop', { taskid }), { code: 0, data: null });
+      assert.equal((await client.call('status', { taskid })).code, 599, 'the task is still there');
     }
   }));
-  await isCalm({ folders });
-  users.forEach((user, index) => {
-    const archive = archiveOf(device, user, `out${index}.7z`);
-    if (existsSync(archive)) {
-      execFileSync('/usr/bin/7z', ['t', archive]);
-    }
-  });
-  await device.remove();
-  return `${counts.running} jobs in the middle, ${counts.finished} at their end`;
+  clients.map((client) => archiveOf(client, dest)).filter(existsSync)
+    .forEach((archive) => execFileSync('/usr/bin/7z', ['t', archive]));
+  return [`${running} jobs in the middle`, { folders }];
 }
 
-// What a user does in some minutes.
-async function useDevice(device) {
-  const user = pick(users);
-  if (random(4) === 0) {
-    const { status } = (await Client.signIn(device, user, 'wrong')).signedIn;
-    require(status === 401, `a wrong password: ${status}`);
+export async function kills(device) {
+  const dest = '/photo/old.7z';
+  const archive = device.at('vol1', dest);
+  execFileSync('7z', ['a', '-bso0', archive, device.at('vol1/photo/cat.jpg')]);
+  const old = readFileSync(archive);
+  const jobs = ['worker', 'archiver', '7z'];
+  const kinds = [...jobs, 'request', 'front end', 'launcher'];
+  const rounds = scale(200, 12);
+  const counts = Object.fromEntries(kinds.map((kind) => [kind, 0]));
+  const signIn = () => until(() => Client.signIn(device, 'alice').catch(() => null));
+  for (let round = 0; round < rounds; ++round) {
+    device.add('vol1/photo/old.7z', old);
+    const kind = kinds[round % kinds.length];
+    let client = await signIn();
+    const { close } = await client.follow();
+    const isEndless = random(2) === 0;
+    const taskid = await client.start([isEndless ? '/photo/endless' : '/photo/trip'], dest,
+      { format: '7z', level: 'store' });
+    let mayBeGone = !isEndless;  // a short job may end, and be reported, at any moment
+    const hasEnded = ({ code, data }) => {
+      const isFine = code === 599 ? mayBeGone
+        : code === 0 && (data.errors ? jobs.includes(kind) : !data.finished || !isEndless);
+      assert.ok(isFine, JSON.stringify({ kind, isEndless, code, data }));
+      if (data?.errors) assertFailed(data, dest);
+      mayBeGone ||= data.finished;
+      return code === 599 || data.finished;
+    };
+    await moment(120);
+    const polling = client.call('status', { taskid }).catch(() => ({}));
+    await moment(4);
+    const killed = device.processes(kind).slice(0, 1 + random(2)).filter(({ pid }) => kill(pid));
+    counts[kind] += killed.length;
+    const polled = await polling;
+    if ('code' in polled) hasEnded(polled);
+    close();
+    if (kind === 'launcher') await device.ended.then(() => device.serve());
+    // Else the moment after the kill counts.
+    if (['launcher', 'front end'].includes(kind)) client = await signIn();
+    const mustFail = isEndless && killed.length > 0 && jobs.includes(kind);
+    await until(async () => hasEnded(await client.call('status', { taskid })) || !mustFail);
+    assert.equal((await client.call('stop', { taskid })).code, 0);
+    await until(() => device.processes(...jobs).length === 0);
+    execFileSync('/usr/bin/7z', ['t', archive]);
+    assert.ok(listing(archive).includes('cat.jpg') &&
+      listing(archive).every((name) => /^(cat\.jpg|trip)(\/|$)/.test(name)), `${listing(archive)}`);
   }
-  if (random(4) === 0) {
-    await Client.signIn(device, user);  // and never out: it ends when there are too many
-  }
-  const client = await Client.signIn(device, user);
-  const close = await follow(client);
-  for (const route of ['/files?path=/', '/files?path=/photo', '/tasks', '/session', '/codes']) {
-    require((await client.ask(route)).status === 200, route);
-  }
-  await runJob(client, ['/photo/cat.jpg'], '/home/c.zip');
-  if (random(4) === 0) {
-    const taskid = await client.start(['/photo/endless'], '/home/e.zip');
-    require((await client.call('stop', { taskid })).code === 0, 'stop');
-  }
-  await close();
-  await client.ask('/session', { method: 'DELETE' });
+  // What an archiver that was killed has left, the next one of the same folder removes.
+  await runJob(await signIn(), ['/photo/cat.jpg'], '/photo/last.7z');
+  assert.doesNotMatch(device.log, /set aside/, 'a store was damaged');
+  return [JSON.stringify(counts), { lists: rounds }];
 }
 
-export async function hoursOfUse() {
-  const device = await Device.start({ isolated: isRoot });
-  const isCalm = await calmCheck(device);
-  addEndless(device);
-  const times = scale(1500, 25);
-  const useOften = async (count) => {
-    for (let index = 0; index < count; ++index) {
-      await useDevice(device);
+export async function use(device, isCalm) {
+  const useOften = async (times) => {
+    for (let index = 0; index < times; ++index) {
+      const user = pick(users);
+      assert.equal((await Client.signIn(device, user, 'wrong')).signedIn.status, 401);
+      await Client.signIn(device, user);  // and never out: it ends when there are too many
+      const client = await Client.signIn(device, user);
+      await client.follow();
+      for (const route of ['/files?path=/', '/files?path=/photo', '/tasks', '/codes']) {
+        assert.equal((await client.ask(route)).status, 200, route);
+      }
+      await runJob(client, ['/photo/cat.jpg'], '/home/c.zip');
+      const taskid = await client.start(['/photo/endless'], '/home/e.zip');
+      assert.equal((await client.call('stop', { taskid })).code, 0);
+      await client.ask('/session', { method: 'DELETE' });
     }
+    await isCalm();
+    return device.processes('launcher', 'front end').map(({ pid }) =>
+      Number(readFileSync(`/proc/${pid}/status`, 'utf8').match(/VmRSS:\s+(\d+)/)[1]));
   };
-  await useOften(scale(300, 15));
-  await isCalm();
-  const before = footprints(device);
-  await useOften(times);
-  await isCalm();
-  const grown = footprints(device).map((now, index) => now.kilobytes - before[index].kilobytes);
-  require(Math.max(...grown) < 1024, `grown by ${grown} KiB`);
-  await device.remove();
-  return `${times} uses; launcher and front end grew by ${grown.join(' and ')} KiB, no descriptor`;
+  const before = await useOften(scale(300, 15));
+  const grown = (await useOften(scale(1500, 25))).map((now, index) => now - before[index]);
+  assert.ok(Math.max(...grown) < 1024, `grown by ${grown} KiB`);
+  return [`launcher and front end grew by ${grown.join(' and ')} KiB`];
 }
