@@ -55,18 +55,6 @@ TEST_F(CliTest, CallAnswersOnOneLineAndDoesNotWaitForTheWorker) {
   EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
-TEST_F(CliTest, NobodyFollowsACallSoTheDesktopIsNotified) {
-  Add("vol1/photo/a.txt", "a");
-  EXPECT_EQ(
-      As("alice", "call", {"start", "path=/photo/a.txt", "dest_file_path=/photo/z.zip"}).status, 0);
-  Ran ran;
-  ASSERT_TRUE(WaitUntil([&] {
-    ran = As("alice", "notifications");
-    return !ran.out.empty();
-  }));
-  EXPECT_THAT(ran.out, HasSubstr("filebrowser:filebrowser_compress_completed\t/photo/z.zip\n"));
-}
-
 TEST_F(CliTest, CompressShowsEachErrorInWordsAndTheLogOnStandardError) {
   Add("vol1/photo/a.txt", "a");
   const Ran ran =

@@ -51,10 +51,6 @@ TEST_F(SessionTest, EachWrongPasswordAfterTheTenthDoublesTheWait) {
   gate.Succeeded("alice");
   EXPECT_EQ(gate.Try("alice", now), seconds(0));
   EXPECT_EQ(gate.Try("alice", now), seconds(0));
-  for (int name = 0; name < 10; ++name) {
-    EXPECT_EQ(gate.Try("nobody" + std::to_string(name), now), seconds(0));
-  }
-  EXPECT_GT(gate.Try("yet another", now), seconds(0));
 }
 
 }  // namespace

@@ -79,14 +79,6 @@ TEST_F(StoreTest, ARowSeesWhatAnotherHasChangedMemberByMember) {
     EXPECT_EQ(other.properties["data"].Value(), value) << step;
     EXPECT_EQ(store.FindTask(mine.id)->properties["data"].Value(), value) << step;
   }
-  // One that knows an old state only overwrites what it is told to, wholly.
-  Device::TaskRow late;
-  late.id = mine.id;
-  const Json::Value value = Device::ParseJson(R"({"late":true})");
-  ASSERT_TRUE(store.UpdateTask(late, {{"data", value}}, true));
-  ASSERT_TRUE(store.RefreshTask(other));
-  EXPECT_EQ(other.properties["data"].Value(), value);
-  EXPECT_TRUE(other.finished);
   store.RemoveTask(mine.id);
   EXPECT_FALSE(store.RefreshTask(other));
   std::map<std::string, Device::TaskRow> rows = {{mine.id, mine}};

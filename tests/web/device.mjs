@@ -20,8 +20,7 @@ const ownMounts = `
 
 export class Device {
   // Root's has mounts and a /tmp that only it sees, unless it is run by an `owner`, a uid and gid.
-  // `env` gets the folder around the device's.
-  static async start({ faults = [], env = () => ({}), owner = {} } = {}) {
+  static async start({ faults = [], owner = {} } = {}) {
     const device = new Device();
     device.base = mkdtempSync(path.join(tmpdir(), 'kavo-web-'));
     chmodSync(device.base, 0o755);
@@ -30,7 +29,7 @@ export class Device {
     device.at = (...names) => path.join(device.folder, ...names);
     device.faults = faults.flatMap((rule) => ['--fault', rule]);
     device.isolated = isRoot && !owner.uid;
-    device.options = { ...owner, cwd: device.base, env: { ...process.env, ...env(device.base) } };
+    device.options = { ...owner, cwd: device.base, env: process.env };
     execFileSync(program, ['init', device.folder], { ...owner, stdio: 'pipe' });
     device.add('vol1/photo/endless', 2 ** 40);
     await device.serve();

@@ -1,11 +1,11 @@
 // Load and faults on served devices: storm.mjs [--short] [SEED] [NAME...]. One line for each storm;
 // the exit status tells whether all held. The seed of a run is printed, so that it can be repeated.
 import { Device, isRoot } from './device.mjs';
-import { archiver, clock, stores, volumes } from './storm/faults.mjs';
-import { jobs, kills, stops, use } from './storm/load.mjs';
+import { archiver, stores, volumes } from './storm/faults.mjs';
+import { jobs, kills, stops } from './storm/load.mjs';
 import { calmCheck, names, seed } from './storm/tools.mjs';
 
-const storms = { jobs, stops, kills, volumes, archiver, clock, stores, use };
+const storms = { jobs, stops, kills, volumes, archiver, stores };
 for (const name of names.filter((each) => !(each in storms))) {
   console.error(`no storm '${name}'; there are ${Object.keys(storms).join(', ')}`);
   process.exit(2);
@@ -14,7 +14,7 @@ for (const name of names.filter((each) => !(each in storms))) {
 // A storm answers what to say, and what is left behind on purpose.
 async function run(storm) {
   if (storm.takesRoot && !isRoot) return ['skip ', 'it takes root'];
-  const device = await Device.start({ env: storm.env });
+  const device = await Device.start();
   try {
     const isCalm = calmCheck(device);
     const [said, left] = await storm(device, isCalm);

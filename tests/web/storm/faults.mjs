@@ -1,9 +1,9 @@
-// Faults: a volume full, no archiver, the clock set back, the store damaged.
+// Faults: a volume full, no archiver, the store damaged.
 import assert from 'node:assert/strict';
 import { readFileSync, readdirSync, rmSync, statSync, truncateSync, writeFileSync } from 'node:fs';
 
-import { Client, build, kill, until } from '../device.mjs';
-import { assertDone, assertFailed, ended, random, runJob, scale } from './tools.mjs';
+import { Client, kill, until } from '../device.mjs';
+import { assertFailed, ended, random, runJob, scale } from './tools.mjs';
 
 // Breaks something while a device is in use, looks at what it does, and mends it again.
 async function disturb(device, isCalm, rows) {
@@ -63,41 +63,6 @@ export const archiver = (device, isCalm) => disturb(device, isCalm, [
   { breaks: 'mount -t tmpfs none /usr/lib/p7zip', mends: 'umount /usr/lib/p7zip',
     says: /cannot start.*No such file/, look: failsJobs('/photo/new.zip') }]);
 volumes.takesRoot = archiver.takesRoot = true;
-
-const setClock = (base, days) => writeFileSync(`${base}/shift`, String(days * 86400));
-clock.env = (base) => {
-  setClock(base, 0);
-  return { LD_PRELOAD: `${build}/libshifted_clock.so`, KAVO_CLOCK_SHIFT: `${base}/shift` };
-};
-
-export async function clock(device) {
-  const client = await Client.signIn(device, 'alice');
-  const [killed, lost, stopped] = [await client.startEndless(), await client.startEndless(),
-    await client.startEndless()];
-  const done = await client.start(['/photo/cat.jpg'], '/photo/done.zip');
-  await client.taskIn('finished', done);
-  // A stop that dies when it has told the worker, which does not hear it.
-  const holds = (field) => field.test(readFileSync(`/proc/${lost.worker}/status`, 'utf8'));
-  kill(lost.worker, 'STOP');
-  await until(() => holds(/^State:\s*T/m));
-  const stopping = client.call('stop', lost).catch(() => null);
-  await until(() => holds(/^ShdPnd:\s*\w*[4-7c-f]\w{3}$/m));  // SIGTERM
-  setClock(device.base, -3);
-  device.processes('request').forEach(({ pid }) => kill(pid));
-  await stopping;
-  kill(lost.worker);
-  assertFailed(await ended(client, lost.taskid), '/photo/endless.zip');
-  const { started } = (await client.tasks()).find(({ taskid }) => taskid === done);
-  const fresh = await client.start(['/photo/cat.jpg'], '/photo/fresh.zip');
-  const task = await client.taskIn('finished', fresh);
-  assert.ok(started - task.started > 2 * 86400, 'the clock is not set back');
-  assertDone(await ended(client, done), '/photo/done.zip');
-  assertDone(await ended(client, fresh), '/photo/fresh.zip');
-  kill(killed.worker);
-  assertFailed(await ended(client, killed.taskid), '/photo/endless.zip');
-  assert.equal((await client.call('stop', stopped)).code, 0);
-  return ['set back among running, stopped, killed and finished jobs', { lists: 2 }];
-}
 
 export async function stores(device) {
   const client = await Client.signIn(device, 'alice');

@@ -1,4 +1,4 @@
-// Load: many jobs at once, jobs that are stopped, processes that are killed, and hours of use.
+// Load: many jobs at once, jobs that are stopped, processes that are killed.
 import assert from 'node:assert/strict';
 import { execFileSync } from 'node:child_process';
 import { existsSync, readFileSync } from 'node:fs';
@@ -109,30 +109,4 @@ export async function kills(device) {
   await runJob(await signIn(), ['/photo/cat.jpg'], '/photo/last.7z');
   assert.doesNotMatch(device.log, /set aside/, 'a store was damaged');
   return [JSON.stringify(counts), { lists: rounds }];
-}
-
-export async function use(device, isCalm) {
-  const useOften = async (times) => {
-    for (let index = 0; index < times; ++index) {
-      const user = pick(users);
-      assert.equal((await Client.signIn(device, user, 'wrong')).signedIn.status, 401);
-      await Client.signIn(device, user);  // and never out: it ends when there are too many
-      const client = await Client.signIn(device, user);
-      await client.follow();
-      for (const route of ['/files?path=/', '/files?path=/photo', '/tasks', '/codes']) {
-        assert.equal((await client.ask(route)).status, 200, route);
-      }
-      await runJob(client, ['/photo/cat.jpg'], '/home/c.zip');
-      const taskid = await client.start(['/photo/endless'], '/home/e.zip');
-      assert.equal((await client.call('stop', { taskid })).code, 0);
-      await client.ask('/session', { method: 'DELETE' });
-    }
-    await isCalm();
-    return device.processes('launcher', 'front end').map(({ pid }) =>
-      Number(readFileSync(`/proc/${pid}/status`, 'utf8').match(/VmRSS:\s+(\d+)/)[1]));
-  };
-  const before = await useOften(scale(300, 15));
-  const grown = (await useOften(scale(1500, 25))).map((now, index) => now - before[index]);
-  assert.ok(Math.max(...grown) < 1024, `grown by ${grown} KiB`);
-  return [`launcher and front end grew by ${grown.join(' and ')} KiB`];
 }
