@@ -52,11 +52,6 @@ TEST_F(LimitTest, FullVolume) {
   }
 }
 
-TEST_F(LimitTest, ReadOnlyVolume) {
-  ASSERT_EQ(mount("tmpfs", folder_.c_str(), "tmpfs", MS_RDONLY, "mode=0777"), 0);
-  EXPECT_EQ(Fail("big"), Strings{folder_ + ": 411"});
-}
-
 TEST_F(LimitTest, Quota) {
   const std::string image = temp_.Path() + "/image";
   WriteFile(image, "");
