@@ -30,8 +30,8 @@ class ZantroCompressHandler final : public FileWebAPI {
   // Appends {"path", "code"} to the job's error items. Decides nothing.
   void SetErrItem(const std::string& path, int code);
 
-  // The text quoted for a shell; empty, and a line logged, when that fails. The archiver is started
-  // without a shell and needs no quoting: kept for whoever does.
+  // The text quoted for a shell; empty, and a line logged, when that fails. Part of the handler's
+  // interface; nothing here needs it, as the archiver runs without a shell.
   static std::string LumoEscape(const char* text);
 
  protected:

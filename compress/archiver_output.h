@@ -15,7 +15,7 @@ struct ArchiverEvent {
 
   Kind kind = kOther;
   std::uint64_t total_size = 0;  // kTotal: bytes
-  std::string file;              // kFile
+  std::string file;              // kFile: the last character of the line alone, never the name
   float progress = 0;            // kProgress: 0 to 1
   ArchiverError error = ArchiverError::kUnknown;
 };

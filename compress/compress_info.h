@@ -16,7 +16,6 @@ struct StartParameters {
   std::vector<std::string> source_paths;  // at least one
 };
 
-// The order of the fields is part of the design: later ones are released first.
 struct _tag_CompressInfo_ {    // NOLINT: the device's name
   bool is7z;                   // format "7z", otherwise zip; set by archive_options, not before
   std::string dest_file_path;  // the request's "dest_file_path" as text, unchanged

@@ -11,7 +11,7 @@ namespace Zantro {
 // process.
 class ListFile {
  public:
-  // Takes over the file of that path, which outlives the object; an empty one is no file.
+  // Takes over the file of that path; an empty path is no file. The string must outlive the object.
   explicit ListFile(const std::string& path) { present_ = path.c_str(); }
   ~ListFile() { Remove(); }
   ListFile(const ListFile&) = delete;

@@ -42,9 +42,9 @@ inline constexpr char kParamTaskId[] = "taskid";
 // How long the worker waits for "data", and "stop" for the worker's process id in it.
 inline constexpr int kDataWaitSeconds = 60;
 
-// Stores the archiver's current file, the progress (0 to 1) and the total size in bytes in the
-// present task. A task that cannot be read or stored is logged and nothing more: the archiver goes
-// on.
+// Stores the file (as ParseArchiverLine has it, which is no name), the progress (0 to 1) and the
+// total size in bytes in the present task. A task that cannot be read or stored is logged and
+// nothing more: the archiver goes on.
 void WriteTaskProgress(const std::string& file, float progress, std::uint64_t total_size);
 
 }  // namespace Zantro

@@ -25,7 +25,8 @@ constexpr char kNotifyTitle[] = "tree:leaf_filebrowser";
 constexpr char kNotifyCompleted[] = "filebrowser:filebrowser_compress_completed";
 constexpr char kNotifyFailed[] = "filebrowser:filebrowser_compress_failed";
 
-// Holds SIGTERM back, so that it finds a job before it has a list file or when that has its owner.
+// Holds SIGTERM back while the list file is made and has no owner yet, so that the handler meets no
+// file that it cannot remove.
 class TermHeldBack {
  public:
   TermHeldBack() {

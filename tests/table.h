@@ -1,7 +1,9 @@
-// Tables of cases in tests/tables. A line that begins with a name begins a row; " | " or an
-// indented line begins a field, "key: value"; a key may stand several times. Fields behind "----"
-// belong to each row from there to the next "----" that has none of their keys itself. "#" begins a
-// comment. In values \n is a line feed, \s a blank, {n*256} as many times n.
+// Tables of cases in tests/tables. A line that does not begin with a blank begins a row with its
+// name. Fields, "key: value", follow after " | " or in indented lines; a key that stands several
+// times has several values. A row named "----" is none: its fields are the defaults of the rows up
+// to the next
+// "----", each for the rows that lack its key. A line with "#" in front is a comment. In values \n
+// is a line feed, \s a blank, {n*256} 256 times n.
 #pragma once
 
 #include <gtest/gtest.h>

@@ -22,8 +22,8 @@ bool WriteAll(int fd, std::string_view bytes);
 // Fills the buffer. False when the input ends before, or fails.
 bool ReadAll(int fd, char* to, std::size_t size);
 
-// Frames on a stream: a length, then so many bytes. Who else still holds the stream's other end
-// does not matter to a reader then.
+// Frames on a stream: a length, then so many bytes. A reader knows the end of a frame by its length
+// and need not wait until all who hold the other end have closed it.
 inline constexpr std::size_t kMostFrameBytes = std::size_t{256} << 20U;
 
 // False when the other side is gone.

@@ -184,7 +184,7 @@ class Job {
 
   int Report(const Outcome& outcome) const {
     if (outcome.code != 0) {
-      // The task is gone though its end was never reported: its process died.
+      // Another client has stopped the task or has seen its end, or the request itself went wrong.
       PrintError(dest_, outcome.code);
       return kExitFailed;
     }

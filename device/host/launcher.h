@@ -1,5 +1,5 @@
-// The web API host: loads the module once and runs each request in a process of its own, so that
-// one that crashes costs that request alone.
+// The web API host: loads the module once and runs each request in a process forked from this one,
+// the launcher, so that one that crashes costs that request alone.
 #pragma once
 
 #include <memory>

@@ -12,7 +12,8 @@ namespace Device {
 // user's oldest sessions end when there are too many. Throws std::system_error.
 std::string SignIn(const std::string& user);
 
-// Ends the session, for requests and workers that are on their way too. Any text may be given.
+// Ends the session, also for processes that were forked before: they see it the next time they ask.
+// Any text may be given.
 void SignOut(const std::string& session_id);
 
 // The user of a session that has not ended; empty when there is none.

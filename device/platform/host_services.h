@@ -1,5 +1,5 @@
-// What the libraries leave to the host that a process belongs to. The host fills it in before the
-// first request; without it no session is a living one.
+// What the libraries ask of the process's host, the launcher (device/host/launcher), which fills
+// this in when it is made. Until then no session is taken for a living one.
 #pragma once
 
 #include <functional>

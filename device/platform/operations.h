@@ -27,7 +27,9 @@ void OpenTrace(const std::string& path);
 // its work and leaves CODE as the library's last error. RESULT is a number, a text, `null`,
 // `throw`, `throw-int`, which is no std::exception, or `crash`, by which the process is killed; or
 // an object {"result": RESULT, NAME: VALUE...} that also fills the operation's outputs of those
-// names. Throws std::invalid_argument for a rule that is none or names no operation.
+// names. A text where a number is returned counts as 0; an operation that returns a pointer other
+// than a text answers null. Throws std::invalid_argument for a rule that is none or names no
+// operation.
 void AddFault(const std::string& rule);
 
 // The names of all operations, as rules and trace lines have them.

@@ -1,7 +1,7 @@
 // A user's tasks as clients see them. To be used with the user's identity.
 //
-// Whoever reads tasks does so here, and here alone a worker's death is noticed: a task whose worker
-// went without an outcome gets the one that it could not store, a single error item, the
+// What is shown to clients is read here, and here alone a worker's death is noticed: a task whose
+// worker went without an outcome gets the one that it could not store, a single error item, the
 // destination with the code of a general failure. Where the store has no room for it, the row has
 // it alone.
 #pragma once

@@ -18,15 +18,16 @@ void RegisterWorker(const std::string& user, pid_t pid);
 // True if the process is a worker of the user's and has not ended; a zombie has.
 bool IsWorkerAlive(const std::string& user, pid_t pid);
 
-// True if "stop" is ending the worker: its task is going to be removed.
+// True for 30 s after "stop" has begun to end the worker: its task is going to be removed.
 bool IsBeingStopped(const std::string& user, pid_t pid);
 
-// True of a worker that was killed, or that ended before its end: it has stored no outcome and
-// never will.
+// True of a worker that is gone without having done all that a worker does, unless "stop" is ending
+// it: it has stored no outcome and never will.
 bool HasDied(const std::string& user, pid_t pid);
 
 // Ends a worker of the user's and all that runs in its process group: asks first, and insists after
-// a grace of 5 s. False when it is none, or could not be ended.
+// a grace of 5 s. True when they are gone, also when they were before; false when the process was
+// never registered as this user's worker, or could not be ended.
 bool EndWorker(const std::string& user, pid_t pid);
 
 // Forgets those of the workers that have ended, but those to be kept.
