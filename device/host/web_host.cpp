@@ -105,7 +105,11 @@ void WebHost::StartFrontEnd() {
   start.arguments = {kFrontEndProgram, listen_, std::to_string(files_.page.Get())};
   start.input = front_end_side.Get();
   start.kept = {files_.page.Get()};
-  front_end_ = ChildProcess::Start(start).Release();
+  try {
+    front_end_ = ChildProcess::Start(start).Release();
+  } catch (const std::system_error& error) {
+    syslog(LOG_ERR, "cannot start %s: %s", kFrontEndProgram, error.what());
+  }
 }
 
 // It ends by itself when its control socket closes, when it has answered what was asked.
