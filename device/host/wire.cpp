@@ -1,68 +1,24 @@
 #include "device/host/wire.h"
 
-#include <sys/socket.h>
-#include <unistd.h>
-
-#include <array>
-#include <cstring>
 #include <sstream>
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/base/socket_message.h"
 
 namespace Device {
 
-namespace {
-
-// Room for one descriptor beside a message.
-union Ancillary {
-  cmsghdr header;
-  std::array<char, CMSG_SPACE(sizeof(int))> bytes;
-};
-
-}  // namespace
-
 bool SendControl(int socket, ControlKind kind, const std::string& text, int stream) {
-  std::string bytes = static_cast<char>(kind) + text;
-  iovec part = {bytes.data(), bytes.size()};
-  msghdr message{};
-  message.msg_iov = &part;
-  message.msg_iovlen = 1;
-  Ancillary ancillary{};
-  if (stream >= 0) {
-    message.msg_control = &ancillary;
-    message.msg_controllen = sizeof ancillary;
-    ancillary.header.cmsg_level = SOL_SOCKET;
-    ancillary.header.cmsg_type = SCM_RIGHTS;
-    ancillary.header.cmsg_len = CMSG_LEN(sizeof stream);
-    std::memcpy(CMSG_DATA(&ancillary.header), &stream, sizeof stream);
-  }
-  return TEMP_FAILURE_RETRY(sendmsg(socket, &message, MSG_NOSIGNAL)) >= 0;
+  return SendMessage(socket, static_cast<char>(kind) + text, stream);
 }
 
 std::optional<ControlMessage> ReceiveControl(int socket) {
-  std::string bytes(1 + kMostControlBytes, '\0');
-  iovec part = {bytes.data(), bytes.size()};
-  Ancillary ancillary{};
-  msghdr message{};
-  message.msg_iov = &part;
-  message.msg_iovlen = 1;
-  message.msg_control = &ancillary;
-  message.msg_controllen = CMSG_LEN(sizeof(int));  // rounded up there would be room for two
-  const ssize_t got = TEMP_FAILURE_RETRY(recvmsg(socket, &message, MSG_CMSG_CLOEXEC));
-  if (got < 1) {
+  std::optional<SocketMessage> message = ReceiveMessage(socket, 1 + kMostControlBytes);
+  if (!message) {
     return std::nullopt;
   }
-  ControlMessage received;
-  received.kind = static_cast<ControlKind>(bytes.front());
-  received.text = bytes.substr(1, static_cast<std::size_t>(got) - 1);
-  if (const cmsghdr* const header = CMSG_FIRSTHDR(&message);
-      header != nullptr && header->cmsg_type == SCM_RIGHTS) {
-    int stream = -1;
-    std::memcpy(&stream, CMSG_DATA(header), sizeof stream);
-    received.stream = FileDescriptor(stream);
-  }
-  return received;
+  return ControlMessage{static_cast<ControlKind>(message->bytes.front()), message->bytes.substr(1),
+                        std::move(message->descriptor)};
 }
 
 Answer::Answer(int http_status, const Json::Value& json)
