@@ -105,7 +105,8 @@ TEST(Run7z, TellsCauseAndObjectInOneLine) {
     Device::ProgramStart start;
     start.program = *row.script == '/' ? row.script : "/bin/sh";
     start.arguments = {start.program, "-c", row.script};
-    start.folder = "/";
+    const Device::FileDescriptor root(open("/", O_PATH | O_DIRECTORY | O_CLOEXEC));
+    start.folder = root.Get();
     try {
       Run7z(start, {"left out"}, cancel, report);
       ADD_FAILURE() << "succeeded: " << row.script;

@@ -97,12 +97,4 @@ void CheckPassword(const Request& request) {
   }
 }
 
-void HidePassword(int argc, char** argv) {
-  for (int i = 1; i < argc; ++i) {
-    if (IsPassword(argv[i], i + 1 == argc)) {
-      std::memset(argv[i] + 2, 0, std::strlen(argv[i] + 2));
-    }
-  }
-}
-
 }  // namespace Archiver

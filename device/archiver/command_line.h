@@ -25,7 +25,4 @@ Request ParseCommandLine(const std::vector<std::string>& arguments);
 // Throws Failure for a password which 7z cannot take for this request.
 void CheckPassword(const Request& request);
 
-// Blanks the password in the process's own argument vector, where everybody can read it.
-void HidePassword(int argc, char** argv);
-
 }  // namespace Archiver

@@ -1,23 +1,29 @@
 // kavo-7z: the archiver of the device, on top of a stock 7z.
 //
-// It takes the device's switches (-utf16, -lang, -progress, empty arguments), reports to its caller
-// in lines of its own, and keeps the promise that a file under the archive's name is a whole
-// archive.
+// It takes the device's switches (-utf16, -lang, -progress, empty arguments), and from the device
+// what its caller cannot put there (base/archiver_call.h), reports to its caller in lines of its
+// own, and keeps the promise that a file under the archive's name is a whole archive.
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <exception>
-#include <string>
-#include <vector>
+#include <optional>
+#include <utility>
 
 #include "device/archiver/archive_job.h"
 #include "device/archiver/cancel.h"
 #include "device/archiver/command_line.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/report.h"
+#include "device/base/archiver_call.h"
+#include "device/base/file_io.h"
+#include "device/base/work_folder.h"
 
 namespace {
+
+constexpr char kZipProgram[] = "kavo-zip";
 
 // Keeps the files that this program opens off the numbers of standard streams it was started
 // without.
@@ -29,11 +35,23 @@ void OccupyStandardStreams() {
   close(fd);
 }
 
+// What the device tells beside the arguments; by hand it is not there.
+std::optional<Device::ArchiverCall> CallOfDevice() {
+  struct stat input {};
+  if (fstat(STDIN_FILENO, &input) != 0 || !S_ISSOCK(input.st_mode)) {
+    return std::nullopt;
+  }
+  return Device::ReceiveArchiverCall(STDIN_FILENO);
+}
+
+Device::ArchiverCall CallByHand() {
+  const int zip_program = Device::OpenBesideProgram(kZipProgram, O_PATH).Release();
+  return {{}, Device::NewWorkFolderName(), zip_program, {}};
+}
+
 }  // namespace
 
 int main(int argc, char** argv) {
-  const std::vector<std::string> arguments(argv + (argc > 0 ? 1 : 0), argv + argc);
-  Archiver::HidePassword(argc, argv);
   if (fcntl(STDOUT_FILENO, F_GETFD) < 0) {
     return 1;  // nobody to report to
   }
@@ -42,7 +60,18 @@ int main(int argc, char** argv) {
     const Archiver::Cancel cancel(STDOUT_FILENO);
     Archiver::Report report(cancel);
     try {
-      Archiver::PackArchive(Archiver::ParseCommandLine(arguments), cancel, report);
+      Archiver::Request request =
+          Archiver::ParseCommandLine({argv + (argc > 0 ? 1 : 0), argv + argc});
+      const std::optional<Device::ArchiverCall> of_device = CallOfDevice();
+      const Device::ArchiverCall call = of_device ? *of_device : CallByHand();
+      if (of_device) {
+        request.password = call.password;
+      }
+      const Device::FileDescriptor archive = Archiver::PackArchive(request, call, cancel, report);
+      if (of_device && !Device::SendMadeArchive(STDIN_FILENO, archive)) {
+        return 1;  // nobody wants it any more
+      }
+      report.Done();
       return 0;
     } catch (const Archiver::Cancelled&) {
       report.CancelledRun();

@@ -6,15 +6,17 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <array>
 #include <cerrno>
-#include <cstdlib>
+#include <climits>
 #include <cstring>
 #include <filesystem>
 #include <memory>
 #include <utility>
 
 #include "device/archiver/failure.h"
-#include "device/base/file_descriptor.h"
+#include "device/base/open_below.h"
+#include "device/base/work_folder.h"
 
 namespace Archiver {
 
@@ -23,18 +25,28 @@ namespace fs = std::filesystem;
 namespace {
 
 constexpr char kCannotRead[] = "cannot read";
-constexpr mode_t kPermissions = 0777;
+constexpr int kOpenFolder = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
 
 struct CloseDir {
   void operator()(DIR* dir) const { closedir(dir); }
 };
 
-struct stat Status(int folder, const std::string& path, int flags) {
+struct stat Status(int folder, const char* path, int flags) {
   struct stat info {};
-  if (fstatat(folder, path.c_str(), &info, flags) != 0) {
+  if (fstatat(folder, path, &info, flags) != 0) {
     throw SystemFailure(kCannotRead, path, errno);
   }
   return info;
+}
+
+// Where a link leads that is open as a path.
+std::string TextOfLink(const Device::FileDescriptor& link) {
+  std::array<char, PATH_MAX> text{};
+  const ssize_t length = readlinkat(link.Get(), "", text.data(), text.size());
+  if (length < 0) {
+    throw SystemFailure(kCannotRead, "link", errno);
+  }
+  return {text.data(), static_cast<size_t>(length)};
 }
 
 class Scan {
@@ -42,9 +54,10 @@ class Scan {
   Scan(bool links_too, const std::vector<std::string>& excluded)
       : links_too_(links_too), excluded_(excluded) {}
 
-  void Visit(int parent, const char* name, mode_t type, const std::string& path) {
+  void Visit(const Device::FileDescriptor& source, const std::string& path) {
+    const mode_t type = Status(source.Get(), "", AT_EMPTY_PATH).st_mode;
     if (S_ISDIR(type)) {
-      VisitFolder(parent, name, path);
+      VisitFolder(openat(source.Get(), ".", kOpenFolder), path);
     } else if (IsSpecial(type)) {
       found.push_back(path);
     }
@@ -53,15 +66,17 @@ class Scan {
   std::vector<std::string> found;
 
  private:
-  bool IsSpecial(mode_t type) const { return S_ISLNK(type) ? links_too_ : !S_ISREG(type); }
+  bool IsSpecial(mode_t type) const {
+    return S_ISLNK(type) ? links_too_ : !S_ISREG(type) && !S_ISDIR(type);
+  }
 
   bool IsLeftOut(const char* name) const {
     return std::strcmp(name, ".") == 0 || std::strcmp(name, "..") == 0 ||
+           Device::IsWorkFolderName(name) ||
            std::find(excluded_.begin(), excluded_.end(), name) != excluded_.end();
   }
 
-  void VisitFolder(int parent, const char* name, const std::string& path) {
-    const int fd = openat(parent, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  void VisitFolder(int fd, const std::string& path) {
     const std::unique_ptr<DIR, CloseDir> dir(fd < 0 ? nullptr : fdopendir(fd));
     if (!dir) {
       throw SystemFailure(kCannotRead, path, errno);
@@ -72,8 +87,10 @@ class Scan {
                               ? Status(fd, child, AT_SYMLINK_NOFOLLOW).st_mode
                               : DTTOIF(entry->d_type);
       // Plain files, which are the most, take no more than that look.
-      if ((S_ISDIR(type) || IsSpecial(type)) && !IsLeftOut(child)) {
-        Visit(fd, child, type, std::string(path).append("/").append(child));
+      if (S_ISDIR(type) && !IsLeftOut(child)) {
+        VisitFolder(openat(fd, child, kOpenFolder), std::string(path).append("/").append(child));
+      } else if (IsSpecial(type) && !IsLeftOut(child)) {
+        found.push_back(std::string(path).append("/").append(child));
       }
     }
   }
@@ -87,44 +104,31 @@ class Scan {
 std::vector<std::string> FindSpecials(const WorkPlace& place,
                                       const std::vector<std::string>& sources,
                                       const std::vector<std::string>& excluded) {
-  const Device::FileDescriptor folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
   Scan scan(!place.shares.empty(), excluded);
   for (const std::string& source : sources) {
-    const int flags = place.shares.count(source) != 0 ? 0 : AT_SYMLINK_NOFOLLOW;
-    scan.Visit(folder.Get(), source.c_str(), Status(folder.Get(), source, flags).st_mode, source);
+    scan.Visit(OpenSource(place, source, O_PATH), source);
   }
   return std::move(scan.found);
 }
 
-SpecialsMirror::SpecialsMirror(const WorkPlace& place, const std::vector<std::string>& specials)
-    : path_(fs::temp_directory_path() / "kavo-7z-mirror-XXXXXX") {
-  if (mkdtemp(path_.data()) == nullptr) {
-    throw SystemFailure("cannot create folder", path_, errno);
-  }
-  try {
-    for (const std::string& special : specials) {
-      const fs::path original = fs::path(place.folder) / special;
-      const fs::path copy = fs::path(path_) / special;
-      const struct stat info = Status(AT_FDCWD, original, AT_SYMLINK_NOFOLLOW);
-      fs::create_directories(copy.parent_path());
-      if (S_ISLNK(info.st_mode)) {
-        fs::create_symlink(fs::read_symlink(original), copy);
-      } else if (mknod(copy.c_str(), S_IFREG | (info.st_mode & kPermissions), 0) != 0) {
-        throw SystemFailure("cannot copy", special, errno);
-      }
-      const timespec times[] = {info.st_atim, info.st_mtim};
-      utimensat(AT_FDCWD, copy.c_str(), times, AT_SYMLINK_NOFOLLOW);
+Device::FileDescriptor MirrorSpecials(const WorkPlace& place,
+                                      const std::vector<std::string>& specials, int work_folder) {
+  const fs::path mirror = Device::PathOf(work_folder) + "/" + Device::kWorkMirror;
+  fs::create_directory(mirror);
+  for (const std::string& special : specials) {
+    const Device::FileDescriptor original = OpenSource(place, special, O_PATH);
+    const fs::path copy = mirror / special;
+    const struct stat info = Status(original.Get(), "", AT_EMPTY_PATH);
+    fs::create_directories(copy.parent_path());
+    if (S_ISLNK(info.st_mode)) {
+      fs::create_symlink(TextOfLink(original), copy);
+    } else if (mknod(copy.c_str(), S_IFREG | (info.st_mode & ACCESSPERMS), 0) != 0) {
+      throw SystemFailure("cannot copy", special, errno);
     }
-  } catch (...) {
-    std::error_code ignored;
-    fs::remove_all(path_, ignored);
-    throw;
+    const timespec times[] = {info.st_atim, info.st_mtim};
+    utimensat(AT_FDCWD, copy.c_str(), times, AT_SYMLINK_NOFOLLOW);
   }
-}
-
-SpecialsMirror::~SpecialsMirror() {
-  std::error_code ignored;
-  fs::remove_all(path_, ignored);
+  return Device::OpenBelow(work_folder, Device::kWorkMirror, O_PATH | O_DIRECTORY);
 }
 
 }  // namespace Archiver

@@ -14,19 +14,10 @@ std::vector<std::string> FindSpecials(const WorkPlace& place,
                                       const std::vector<std::string>& sources,
                                       const std::vector<std::string>& excluded);
 
-// A temporary folder with copies of such links at their places, empty files for the rest, and
-// nothing else but the folders on the way: what a 7z that follows no links can safely pack.
-class SpecialsMirror {
- public:
-  SpecialsMirror(const WorkPlace& place, const std::vector<std::string>& specials);
-  ~SpecialsMirror();
-  SpecialsMirror(const SpecialsMirror&) = delete;
-  SpecialsMirror& operator=(const SpecialsMirror&) = delete;
-
-  const std::string& Path() const { return path_; }
-
- private:
-  std::string path_;
-};
+// Makes a folder in the work folder with copies of such links at their places, empty files for the
+// rest, and nothing else but the folders on the way: what a 7z that follows no links can safely
+// pack. Throws Failure.
+Device::FileDescriptor MirrorSpecials(const WorkPlace& place,
+                                      const std::vector<std::string>& specials, int work_folder);
 
 }  // namespace Archiver

@@ -2,6 +2,8 @@
 
 #include <algorithm>
 
+#include "device/base/work_folder.h"
+
 namespace Archiver {
 namespace {
 
@@ -41,6 +43,8 @@ std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& ru
   if (run.follow_links) {
     switches.emplace_back("-l");
   }
+  // Of this job and of others, which may be anybody's.
+  switches.push_back(std::string("-xrw!") + Device::kWorkFolderPattern);
   for (const std::string& name : request.exclude) {
     switches.push_back("-xr!" + name);
   }

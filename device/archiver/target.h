@@ -1,53 +1,43 @@
 #pragma once
 
-#include <sys/types.h>
+#include <sys/stat.h>
 
-#include <ctime>
 #include <string>
+#include <vector>
 
 #include "device/base/file_descriptor.h"
 
 namespace Archiver {
 
-// The file that bears the archive's name, as it was when somebody looked.
-struct ArchiveState {
-  bool exists = false;
-  dev_t device = 0;
-  ino_t inode = 0;
-  off_t size = 0;
-  timespec changed{};  // its contents
-
-  bool operator==(const ArchiveState& other) const;
-};
-
-// What stands under `path`, an archive to update or nothing. Throws Failure when something other
-// than a regular file bears the name, or when the name cannot be used.
-ArchiveState LookAtArchive(const std::string& path);
-
-// A hidden folder beside the archive in which 7z and libzip write, with names as long as they like,
-// until the result takes the archive's name in one step. It goes with everything in it; one that a
-// killed run has left is swept by the next run in the same folder, which tells it by the lock.
-class WorkFolder {
+// The file that is to be the archive: its folder, held by descriptor, and its name there.
+class Target {
  public:
-  explicit WorkFolder(std::string archive);
-  ~WorkFolder();
-  WorkFolder(const WorkFolder&) = delete;
-  WorkFolder& operator=(const WorkFolder&) = delete;
+  // `path` is absolute; below the fixed folders (see OpenUserPath) no link is followed. Throws
+  // Failure when the folder cannot be opened, when something other than a regular file bears the
+  // name, or when the name cannot be used.
+  Target(std::string path, const std::vector<std::string>& fixed);
 
   const std::string& Path() const { return path_; }
-  std::string Result() const;
-  // Moves the result over the archive, if that is still as it was seen: what another run has put
-  // there meanwhile is not in the result and would be lost. Throws Failure.
-  void Publish(const ArchiveState& seen) const;
+  const std::string& Name() const { return name_; }
+  const Device::FileDescriptor& Folder() const { return folder_; }
+  // The archive that stands there, opened as a path (O_PATH); invalid when there is none.
+  const Device::FileDescriptor& Old() const { return old_; }
+
+  // Moves the result out of the work folder over the old archive, if that is still as it was: what
+  // another run has put there meanwhile is not in the result and would be lost. Returns the result,
+  // opened as a path. Throws Failure.
+  Device::FileDescriptor Publish(int work_folder) const;
 
  private:
-  void Sweep() const;
-  bool CreateLocked();
+  Device::FileDescriptor OpenFolder() const;
+  bool IsAsSeen(int folder, const std::string& name) const;
 
-  std::string archive_;
-  std::string parent_;
-  std::string path_;
-  Device::FileDescriptor lock_;
+  const std::string path_;
+  const std::string name_;
+  const std::vector<std::string>& fixed_;
+  Device::FileDescriptor folder_;
+  Device::FileDescriptor old_;
+  struct stat seen_ {};  // of the old archive
 };
 
 }  // namespace Archiver

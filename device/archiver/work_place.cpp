@@ -6,25 +6,29 @@
 #include <cerrno>
 #include <filesystem>
 #include <set>
-#include <string_view>
+#include <utility>
 
 #include "device/archiver/failure.h"
-#include "device/base/file_descriptor.h"
+#include "device/base/open_below.h"
 
 namespace Archiver {
 namespace {
 
 constexpr char kCannotPack[] = "cannot pack";
+constexpr char kWildcards[] = "*?";  // 7z looks for such a name among all, though it is no pattern
 
 namespace fs = std::filesystem;
 
-std::string RealPath(const std::string& path) {
-  std::error_code error;
-  const std::string resolved = fs::canonical(path, error);
-  if (error) {
-    throw SystemFailure("cannot resolve", path, error.value());
+Device::FileDescriptor OpenFolder(const std::string& path) {
+  Device::FileDescriptor folder(open(path.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+  if (!folder) {
+    throw SystemFailure("cannot open", path, errno);
   }
-  return resolved;
+  return folder;
+}
+
+std::string RealPath(const Device::FileDescriptor& folder) {
+  return fs::read_symlink(Device::PathOf(folder.Get()));
 }
 
 std::string Parent(const std::string& path) {
@@ -54,7 +58,7 @@ std::string Below(const std::string& folder, const std::string& path) {
 }  // namespace
 
 WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::string& list_path) {
-  WorkPlace place{RealPath("."), {}};
+  WorkPlace place{OpenFolder("."), {}};
   if (!IsStagingFolder(list_path)) {
     return place;
   }
@@ -62,60 +66,78 @@ WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::stri
   for (const std::string& source : sources) {
     names.insert(source.substr(0, source.find('/')));
   }
+  const std::string here = RealPath(place.folder);
   std::set<std::string> folders;
   for (const std::string& name : names) {
     if (!LeadsToFolder(name)) {
-      folders.insert(place.folder);
+      folders.insert(here);
       continue;
     }
-    const std::string share = RealPath(name);
-    place.shares.emplace(name, share);
-    const bool own_name = Below(Parent(share), share) == name;
-    folders.insert(own_name ? Parent(share) : place.folder);
+    Device::FileDescriptor share = OpenFolder(name);
+    const std::string path = RealPath(share);
+    place.shares.emplace(name, std::move(share));
+    folders.insert(Below(Parent(path), path) == name ? Parent(path) : here);
   }
-  if (folders.size() == 1 && *folders.begin() != place.folder) {
-    return {*folders.begin(), {}};
+  if (folders.size() == 1 && *folders.begin() != here) {
+    return {OpenFolder(*folders.begin()), {}};
   }
   return place;
 }
 
-std::unordered_set<std::string> CheckSources(const WorkPlace& place,
-                                             const std::vector<std::string>& sources) {
+Device::FileDescriptor OpenSource(const WorkPlace& place, const std::string& source, int flags) {
+  const size_t slash = source.find('/');
+  const auto share = place.shares.find(source.substr(0, slash));
+  Device::FileDescriptor opened =
+      share == place.shares.end() ? Device::OpenBelow(place.folder.Get(), source, flags)
+      : slash == std::string::npos
+          ? Device::OpenBelow(share->second.Get(), ".", flags)
+          : Device::OpenBelow(share->second.Get(), source.substr(slash + 1), flags);
+  if (!opened && errno == ELOOP) {
+    throw NamedFailure(kCannotPack, source, "it lies behind a symbolic link");
+  }
+  if (!opened) {
+    throw SystemFailure(kCannotPack, source, errno);
+  }
+  return opened;
+}
+
+std::unordered_set<std::string> AllowSources(const WorkPlace& place,
+                                             const std::vector<std::string>& sources,
+                                             Device::Fence& fence) {
   std::unordered_set<std::string> no_files;
-  const Device::FileDescriptor folder(open(place.folder.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  std::unordered_set<std::string_view> folders;
-  struct stat info {};
+  bool is_listed = false;
   for (const std::string& source : sources) {
-    for (size_t at = source.find('/'); at != std::string::npos; at = source.find('/', at + 1)) {
-      if (!folders.insert(std::string_view(source).substr(0, at)).second) {
-        continue;
-      }
-      const std::string parent = source.substr(0, at);
-      if (place.shares.count(parent) == 0 &&
-          fstatat(folder.Get(), parent.c_str(), &info, AT_SYMLINK_NOFOLLOW) == 0 &&
-          S_ISLNK(info.st_mode)) {
-        throw NamedFailure(kCannotPack, source, "it lies behind a symbolic link");
-      }
-    }
-    if (fstatat(folder.Get(), source.c_str(), &info, AT_SYMLINK_NOFOLLOW) != 0) {
+    is_listed = is_listed || source.find_first_of(kWildcards) != std::string::npos;
+    const Device::FileDescriptor opened = OpenSource(place, source, O_PATH);
+    struct stat info {};
+    if (fstat(opened.Get(), &info) != 0) {
       throw SystemFailure(kCannotPack, source, errno);
+    }
+    if (S_ISREG(info.st_mode) || S_ISDIR(info.st_mode)) {
+      fence.AllowReading(opened.Get());
     }
     if (!S_ISREG(info.st_mode)) {
       no_files.insert(source);
     }
   }
+  if (is_listed) {
+    fence.AllowListing(place.folder.Get());
+    for (const auto& [name, share] : place.shares) {
+      fence.AllowListing(share.Get());
+    }
+  }
   return no_files;
 }
 
-std::vector<std::string> NamesWithin(const WorkPlace& place, const std::string& path) {
-  const std::string real = RealPath(Parent(path)) + path.substr(path.rfind('/'));
+std::vector<std::string> NamesOf(const WorkPlace& place, const Target& target) {
+  const std::string path = fs::path(RealPath(target.Folder())) / target.Name();
   std::vector<std::string> names;
-  if (std::string name = Below(place.folder, real); !name.empty()) {
-    names.push_back(std::move(name));
+  if (std::string below = Below(RealPath(place.folder), path); !below.empty()) {
+    names.push_back(std::move(below));
   }
-  for (const auto& [share, folder] : place.shares) {
-    if (const std::string name = Below(folder, real); !name.empty()) {
-      names.push_back(std::string(share).append("/").append(name));
+  for (const auto& [share, root] : place.shares) {
+    if (const std::string below = Below(RealPath(root), path); !below.empty()) {
+      names.push_back(std::string(share).append("/").append(below));
     }
   }
   return names;

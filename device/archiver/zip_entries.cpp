@@ -1,8 +1,9 @@
-#include "device/archiver/zip_names.h"
+#include "device/archiver/zip_entries.h"
 
 #include <zip.h>
 
 #include <algorithm>
+#include <array>
 #include <cstring>
 #include <functional>
 #include <memory>
@@ -33,7 +34,7 @@ Zip Open(const std::string& path, int flags) {
     zip_error_init_with_code(&error, code);
     const std::string reason = Reason(&error);
     zip_error_fini(&error);
-    throw NamedFailure("cannot read the names in archive", path, reason);
+    throw Failure(reason);
   }
   return archive;
 }
@@ -57,12 +58,7 @@ RawName NameOf(zip_t* archive, zip_uint64_t index) {
   return name;
 }
 
-int StopRequested(zip_t* /*archive*/, void* cancel) {
-  return static_cast<const Cancel*>(cancel)->Requested() ? 1 : 0;
-}
-
-void Rename(const std::string& path, zip_flags_t encoding, const Conversion& convert,
-            const Cancel& cancel) {
+void Rename(const std::string& path, zip_flags_t encoding, const Conversion& convert) {
   Zip archive = Open(path, 0);
   const zip_int64_t count = zip_get_num_entries(archive.get(), 0);
   bool changed = false;
@@ -79,12 +75,8 @@ void Rename(const std::string& path, zip_flags_t encoding, const Conversion& con
   if (!changed) {
     return;
   }
-  zip_register_cancel_callback_with_state(archive.get(), StopRequested, nullptr,
-                                          const_cast<Cancel*>(&cancel));
   if (zip_close(archive.get()) != 0) {
-    cancel.Check();
-    throw NamedFailure("cannot write the names in archive", path,
-                       Reason(zip_get_error(archive.get())));
+    throw Failure(Reason(zip_get_error(archive.get())));
   }
   static_cast<void>(archive.release());  // zip_close has freed it
 }
@@ -95,7 +87,57 @@ Conversion ToUtf8(const CodePage& page) {
   };
 }
 
+struct CloseFile {
+  void operator()(zip_file_t* file) const { zip_fclose(file); }
+};
+using Member = std::unique_ptr<zip_file_t, CloseFile>;
+
+// Opening it compares the password with one or two bytes only.
+Member OpenMember(zip_t* archive, zip_uint64_t index, const std::string& password) {
+  Member member(zip_fopen_index_encrypted(archive, index, 0, password.c_str()));
+  if (!member) {
+    throw Failure("member '" + NameInError(NameOf(archive, index).bytes) +
+                  "': " + Reason(zip_get_error(archive)));
+  }
+  return member;
+}
+
+// To the end, where its checksum is compared.
+bool IsReadable(zip_file_t* member) {
+  std::array<char, 65536> block{};
+  zip_int64_t got = 1;
+  while (got > 0) {
+    got = zip_fread(member, block.data(), block.size());
+  }
+  return got == 0;
+}
+
 }  // namespace
+
+void CheckMembers(const std::string& archive, const std::string& password) {
+  const Zip zip = Open(archive, ZIP_RDONLY);
+  std::optional<zip_stat_t> smallest;
+  for (zip_int64_t i = zip_get_num_entries(zip.get(), 0); --i >= 0;) {
+    zip_stat_t member{};
+    zip_stat_init(&member);
+    if (zip_stat_index(zip.get(), static_cast<zip_uint64_t>(i), 0, &member) != 0) {
+      throw Failure(Reason(zip_get_error(zip.get())));
+    }
+    if (member.encryption_method == ZIP_EM_NONE) {
+      continue;
+    }
+    if (password.empty()) {
+      throw Failure("it is protected by a password, and none is given");
+    }
+    OpenMember(zip.get(), member.index, password);
+    if (member.size > 0 && (!smallest || member.size < smallest->size)) {
+      smallest = member;
+    }
+  }
+  if (smallest && !IsReadable(OpenMember(zip.get(), smallest->index, password).get())) {
+    throw Failure("it is protected by another password");
+  }
+}
 
 bool HasNamesIn(const CodePage& page, const std::string& archive) {
   const Zip zip = Open(archive, ZIP_RDONLY);
@@ -109,15 +151,15 @@ bool HasNamesIn(const CodePage& page, const std::string& archive) {
   return false;
 }
 
-void NamesToUtf8(const CodePage& page, const std::string& archive, const Cancel& cancel) {
-  Rename(archive, ZIP_FL_ENC_UTF_8, ToUtf8(page), cancel);
+void NamesToUtf8(const CodePage& page, const std::string& archive) {
+  Rename(archive, ZIP_FL_ENC_UTF_8, ToUtf8(page));
 }
 
-void NamesToCodePage(const CodePage& page, const std::string& archive, const Cancel& cancel) {
+void NamesToCodePage(const CodePage& page, const std::string& archive) {
   const Conversion from_utf8 = [&page](const std::string& name, bool flagged) {
     return flagged ? page.Encode(name) : std::nullopt;
   };
-  Rename(archive, ZIP_FL_ENC_CP437, from_utf8, cancel);
+  Rename(archive, ZIP_FL_ENC_CP437, from_utf8);
 }
 
 }  // namespace Archiver

@@ -69,13 +69,29 @@ void Execute(const ProgramStart& start, int input, char* const* arguments, char*
       raise(SIGKILL);  // the parent has ended in the moment before
     }
   }
-  if ((start.folder.empty() || chdir(start.folder.c_str()) == 0) && Redirect(input, STDIN_FILENO) &&
-      Redirect(start.output, STDOUT_FILENO) && Redirect(start.errors, STDERR_FILENO)) {
+  if ((start.folder < 0 || fchdir(start.folder) == 0) && Redirect(input, STDIN_FILENO) &&
+      Redirect(start.output, STDOUT_FILENO) && Redirect(start.errors, STDERR_FILENO) &&
+      (start.fence == nullptr || start.fence->Enter())) {
     for (const int fd : start.kept) {
       fcntl(fd, F_SETFD, 0);
     }
     execve(start.program.c_str(), arguments, environment);
   }
+}
+
+// The child shares the caller's memory until the program runs: a copy would cost more than a small
+// job. Why it does not run, it tells `failure`.
+pid_t Spawn(const ProgramStart& start, int input, char* const* arguments, char* const* environment,
+            int failure) {
+  const pid_t parent = getpid();
+  const pid_t pid = vfork();
+  if (pid == 0) {
+    Execute(start, input, arguments, environment, parent);
+    const int error = errno;
+    [[maybe_unused]] const ssize_t told = write(failure, &error, sizeof error);
+    _exit(kCannotStart);
+  }
+  return pid;
 }
 
 }  // namespace
@@ -86,18 +102,15 @@ ChildProcess ChildProcess::Start(const ProgramStart& start) {
   const int input = start.input < 0 ? null.Get() : start.input;
   const std::vector<char*> arguments = Pointers(start.arguments);
   const std::vector<char*> variables = Pointers(start.environment);
-  char* const* const environment = start.environment.empty() ? environ : variables.data();
-  const pid_t parent = getpid();
   ChildProcess child(0);
   {
     const SignalsHeldBack held_back;
-    child = Fork();
-    if (child.Pid() == 0) {
-      Execute(start, input, arguments.data(), environment, parent);
-      const int error = errno;
-      [[maybe_unused]] const ssize_t told = write(failure.writer.Get(), &error, sizeof error);
-      _exit(kCannotStart);
-    }
+    child.pid_ =
+        Spawn(start, input, arguments.data(),
+              start.environment.empty() ? environ : variables.data(), failure.writer.Get());
+  }
+  if (child.pid_ < 0) {
+    ThrowErrno("vfork");
   }
   failure.writer.Close();
   int error = 0;

@@ -8,6 +8,8 @@
 #include <utility>
 #include <vector>
 
+#include "device/base/fence.h"
+
 namespace Device {
 
 // How a program is to run. The descriptors are the caller's and stay open there; no others but the
@@ -16,12 +18,13 @@ struct ProgramStart {
   std::string program;                   // path
   std::vector<std::string> arguments;    // with the program's name in front
   std::vector<std::string> environment;  // "NAME=VALUE"; empty: the caller's
-  std::string folder;                    // working directory; empty: the caller's
+  int folder = -1;                       // working directory; -1: the caller's
   int input = -1;                        // standard input; -1: /dev/null
   int output = -1;                       // standard output; -1: the caller's
   int errors = -1;                       // standard error; -1: the caller's
   std::vector<int> kept;                 // further descriptors, open there under their numbers
   bool ends_with_caller = false;         // killed when the calling process ends, however that is
+  const Fence* fence = nullptr;          // confines it; null: it may what the caller may
 };
 
 // Owns a child: one that was not waited for is killed and reaped.

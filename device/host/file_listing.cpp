@@ -6,11 +6,12 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <filesystem>
 #include <map>
 #include <memory>
 
 #include "device/base/json_text.h"
+#include "device/base/open_below.h"
+#include "device/base/work_folder.h"
 #include "device/model/device.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/lumo/paths.h"
@@ -19,8 +20,6 @@
 namespace Device {
 
 namespace {
-
-namespace fs = std::filesystem;
 
 const char* KindOf(mode_t mode) {
   return S_ISDIR(mode) ? "folder" : S_ISREG(mode) ? "file" : S_ISLNK(mode) ? "link" : "other";
@@ -65,9 +64,9 @@ Listing FailWithErrno(int error_number) {
   return {LumoLibGetErr(), {}};
 }
 
-bool IsWritable(const ResolvedPath& folder) {
+bool IsWritable(const ResolvedPath& folder, int fd) {
   return (folder.share == nullptr || !folder.share->read_only) &&
-         faccessat(AT_FDCWD, folder.real_path.c_str(), W_OK | X_OK, AT_EACCESS) == 0;
+         faccessat(fd, ".", W_OK | X_OK, AT_EACCESS) == 0;
 }
 
 }  // namespace
@@ -83,29 +82,24 @@ Listing ListFolder(const std::string& user, const std::string& path) {
   if (AccessOf(folder, user) == Access::kNone) {
     return {KAVO::kErrNoPrivilege, {}};
   }
-  std::error_code error;
-  const std::string followed = fs::canonical(folder.real_path, error).string();
-  if (error) {
-    return FailWithErrno(error.value());
+  const int fd =
+      OpenUserPath(TheDevice().FixedFolders(user), folder.real_path, O_RDONLY | O_DIRECTORY)
+          .Release();
+  if (fd < 0) {
+    return errno == ELOOP ? Listing{KAVO::kErrOutsideShare, {}} : FailWithErrno(errno);
   }
-  if (!IsWithin(followed, fs::canonical(folder.share_real_path, error).string())) {
-    return {KAVO::kErrOutsideShare, {}};  // a link leads there
-  }
-  const std::unique_ptr<DIR, int (*)(DIR*)> directory(opendir(folder.real_path.c_str()), closedir);
-  if (directory == nullptr) {
-    return FailWithErrno(errno);
-  }
+  const std::unique_ptr<DIR, int (*)(DIR*)> directory(fdopendir(fd), closedir);
   std::map<std::string, Json::Value> entries;
   while (const dirent* const found = readdir(directory.get())) {
     const std::string name = found->d_name;
     struct stat status {};
     // One that has gone meanwhile is not there.
-    if (name != "." && name != ".." &&
-        fstatat(dirfd(directory.get()), found->d_name, &status, AT_SYMLINK_NOFOLLOW) == 0) {
+    if (name != "." && name != ".." && !IsWorkFolderName(name) &&
+        fstatat(fd, found->d_name, &status, AT_SYMLINK_NOFOLLOW) == 0) {
       entries[name] = Entry(name, status);
     }
   }
-  return {0, Body(folder.user_path, IsWritable(folder), entries)};
+  return {0, Body(folder.user_path, IsWritable(folder, fd), entries)};
 }
 
 }  // namespace Device

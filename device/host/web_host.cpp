@@ -20,6 +20,8 @@
 #include "device/base/json_text.h"
 #include "device/host/web_request.h"
 #include "device/model/device.h"
+#include "device/tasks/leftovers.h"
+#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -53,6 +55,18 @@ std::pair<std::string, std::string> SessionCookie(const std::string& value) {
           std::string(kSessionCookie) + "=" + value + "; Path=/; HttpOnly; SameSite=Strict"};
 }
 
+// Each user's with that user's identity, so in a process of its own.
+void RemoveLeftoversOfAll() {
+  for (const User& user : TheDevice().config.users) {
+    ChildProcess::Run([&] {
+      if (LumoLibUGIDSet(nullptr, user.name.c_str()) == 0) {
+        RemoveLeftovers(user.name);
+      }
+      return 0;
+    }).Wait();
+  }
+}
+
 }  // namespace
 
 FrontEndFiles::FrontEndFiles()
@@ -61,6 +75,10 @@ FrontEndFiles::FrontEndFiles()
 
 WebHost::WebHost(const FrontEndFiles& files, std::string listen)
     : files_(files), listen_(std::move(listen)), lock_(LockDevice()) {
+  if (!Fence::IsSupported()) {
+    std::cerr << "kavo-device: the archiver will not be fenced: the kernel has no Landlock\n";
+  }
+  RemoveLeftoversOfAll();
   sigset_t mask;
   sigemptyset(&mask);
   for (const int signal_number : {SIGCHLD, SIGTERM, SIGINT, SIGHUP}) {

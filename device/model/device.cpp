@@ -18,6 +18,7 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr char kArchiverName[] = "kavo-7z";
+constexpr char kZipProgramName[] = "kavo-zip";
 constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
 
 std::unique_ptr<OpenDevice>& Instance() {
@@ -50,6 +51,7 @@ std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
   }
   // Opened at once: later there may be no way to walk there.
   device->archiver = OpenBesideProgram(kArchiverName, O_PATH);
+  device->zip_program = OpenBesideProgram(kZipProgramName, O_PATH);
   device->module = OpenBesideProgram(kModuleName, O_RDONLY);
   device->switches_identity = geteuid() == 0;
   if (device->switches_identity) {
@@ -61,6 +63,20 @@ std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
 }
 
 }  // namespace
+
+std::vector<std::string> OpenDevice::FixedFolders(const std::string& user) const {
+  std::vector<std::string> folders;
+  for (const std::string& volume : config.volumes) {
+    folders.push_back(VolumePath(volume));
+  }
+  for (const Share& share : config.shares) {
+    folders.push_back(VolumePath(share.volume) + "/" + share.name);
+  }
+  if (const User* const owner = config.FindUser(user)) {
+    folders.push_back(HomePath(*owner));
+  }
+  return folders;
+}
 
 OpenDevice& Open(const std::string& folder) {
   try {

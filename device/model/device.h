@@ -27,12 +27,15 @@ struct OpenDevice {
   std::vector<std::string> real_volumes;  // their folders, links resolved
   bool switches_identity = false;         // false: not root, all users are the caller
   FileDescriptor archiver;                // the program that runs in place of /usr/bin/7z
+  FileDescriptor zip_program;             // which the archiver asks about zips
   FileDescriptor module;                  // the shared library that serves the requests
 
   std::string VolumePath(const std::string& volume) const { return root + "/" + volume; }
   std::string HomePath(const User& user) const {
     return VolumePath(user.home) + "/homes/" + user.name;
   }
+  // Paths of folders that no user can rename or replace: volumes, shared folders, the user's home.
+  std::vector<std::string> FixedFolders(const std::string& user) const;
   std::string StateFolder(const std::string& user) const { return root + "/users/" + user; }
 };
 

@@ -13,7 +13,7 @@ using Statement = Database::Statement;
 
 namespace {
 
-constexpr int kSchemaVersion = 2;  // one more with each change of the schema
+constexpr int kSchemaVersion = 3;  // one more with each change of the schema
 
 constexpr char kSchema[] = R"(
 CREATE TABLE tasks (
@@ -27,6 +27,8 @@ CREATE TABLE members (
 CREATE TABLE workers (
   pid INTEGER PRIMARY KEY, start_time INTEGER NOT NULL, stopped INTEGER NOT NULL,
   ended INTEGER NOT NULL);
+CREATE TABLE leftovers (
+  number INTEGER PRIMARY KEY, worker INTEGER NOT NULL, list TEXT NOT NULL, folder TEXT NOT NULL, work_folder TEXT NOT NULL);
 CREATE TABLE notifications (
   time INTEGER NOT NULL, app TEXT NOT NULL, task TEXT NOT NULL, title TEXT NOT NULL,
   message TEXT NOT NULL, arguments TEXT NOT NULL);
@@ -214,6 +216,30 @@ std::vector<pid_t> TaskStore::AllWorkers() {
 
 void TaskStore::RemoveWorker(pid_t pid) {
   Statement(database_, "DELETE FROM workers WHERE pid = ?").Bind(std::int64_t{pid}).Step();
+}
+
+void TaskStore::AddLeftovers(pid_t worker, const Leftovers& leftovers) {
+  Statement(database_, "INSERT INTO leftovers VALUES (NULL, ?, ?, ?, ?)")
+      .Bind(std::int64_t{worker})
+      .Bind(leftovers.list)
+      .Bind(leftovers.folder)
+      .Bind(leftovers.work_folder)
+      .Step();
+}
+
+std::vector<LeftoversRow> TaskStore::AllLeftovers() {
+  std::vector<LeftoversRow> rows;
+  Statement select(database_, "SELECT number, worker, list, folder, work_folder FROM leftovers");
+  while (select.Step()) {
+    rows.push_back({select.Number(0),
+                    static_cast<pid_t>(select.Number(1)),
+                    {select.Text(2), select.Text(3), select.Text(4)}});
+  }
+  return rows;
+}
+
+void TaskStore::RemoveLeftovers(std::int64_t number) {
+  Statement(database_, "DELETE FROM leftovers WHERE number = ?").Bind(number).Step();
 }
 
 void TaskStore::AddNotification(const NotificationRow& row) {

@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "device/tasks/database.h"
+#include "device/tasks/leftovers.h"
 #include "device/tasks/stored_value.h"
 
 namespace Device {
@@ -35,6 +36,12 @@ struct WorkerRow {
   std::uint64_t start_time = 0;  // the kernel's ticks since boot
   std::int64_t stopped = 0;      // when "stop" asked it to end, in seconds since 1970; 0: never
   bool has_come_to_end = false;  // it has done all that a worker does
+};
+
+struct LeftoversRow {
+  std::int64_t number = 0;
+  pid_t worker = -1;
+  Leftovers leftovers;
 };
 
 struct NotificationRow {
@@ -75,6 +82,10 @@ class TaskStore {
   void NoteEnd(pid_t pid);
   std::vector<pid_t> AllWorkers();
   void RemoveWorker(pid_t pid);
+
+  void AddLeftovers(pid_t worker, const Leftovers& leftovers);
+  std::vector<LeftoversRow> AllLeftovers();
+  void RemoveLeftovers(std::int64_t number);
 
   void AddNotification(const NotificationRow& row);
   // The ones after that number, all for 0.

@@ -77,15 +77,17 @@ export class Device {
 
   // What runs of the device, of these kinds or all. A worker's group has its archiver and 7z too.
   processes(...kinds) {
+    const archivers = [];
     const kindOf = (pid, parent, group, args) => {
       if (args.startsWith('kavo-web') && parent === this.process.pid) return 'front end';
+      if (archivers.includes(parent)) return '7z';
       if (!args.includes(this.folder)) return null;
       if (pid === this.process.pid) return 'launcher';
-      if (args.startsWith('/usr/lib/p7zip')) return '7z';
-      if (args.includes('-progress')) return 'archiver';
+      if (args.includes('-progress')) return archivers.push(pid) && 'archiver';
       return pid === group ? 'worker' : 'request';
     };
-    return execFileSync('ps', ['-eo', 'pid=,ppid=,pgid=,args='], { encoding: 'utf8' }).split('\n')
+    return execFileSync('ps', ['-eo', 'pid=,ppid=,pgid=,args=', '--sort=start_time,pid'], { encoding: 'utf8' })
+      .split('\n')
       .map((line) => line.match(/(\d+) +(\d+) +(\d+) (.*)/)).filter((match) => match)
       .map(([, pid, parent, group, args]) =>
         ({ pid: +pid, group: +group, args, kind: kindOf(+pid, +parent, +group, args) }))

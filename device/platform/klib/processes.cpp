@@ -18,9 +18,11 @@
 #include "device/base/file_descriptor.h"
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
+#include "device/platform/klib/archive.h"
 #include "device/platform/klib/klib_error.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
+#include "device/tasks/leftovers.h"
 #include "device/tasks/task_store.h"
 #include "device/tasks/workers.h"
 #include "platform/klib/system.h"
@@ -32,15 +34,9 @@ namespace {
 constexpr char kArchiverProgram[] = "/usr/bin/7z";
 constexpr unsigned int kRunAndWait = 187;
 
-// The device's own program where it has one of that name.
-std::string ProgramFile(const std::string& program) {
-  return program == kArchiverProgram ? "/proc/self/fd/" + std::to_string(TheDevice().archiver.Get())
-                                     : program;
-}
-
 ChildProcess StartProgram(const char* program, const char* const* arguments, int output) {
   ProgramStart start;
-  start.program = ProgramFile(program);
+  start.program = program;
   for (; *arguments != nullptr; ++arguments) {
     start.arguments.emplace_back(*arguments);
   }
@@ -53,6 +49,7 @@ ChildProcess StartProgram(const char* program, const char* const* arguments, int
 struct ProgramOutput {
   FileDescriptor output;
   ChildProcess program;
+  ArchiverRun archiver;  // when it is that
   bool has_ended = false;
   int status = 0;         // wait status, once it has ended
   std::string last_line;  // what is left of it
@@ -65,6 +62,8 @@ struct ProgramOutput {
     } else if (WEXITSTATUS(status) != 0) {
       last_line =
           "\nError: the archiver failed with status " + std::to_string(WEXITSTATUS(status)) + "\n";
+    } else if (archiver.call) {
+      TakeArchive(archiver);
     }
   }
 };
@@ -98,9 +97,12 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
   try {
     malloc_trim(0);  // the caller is going to wait for the program, for hours maybe
     Pipe pipe;
-    ChildProcess child = StartProgram(program, arguments, pipe.writer.Get());
+    ArchiverRun archiver;
+    ChildProcess child = std::strcmp(program, kArchiverProgram) == 0
+                             ? StartArchiver(arguments, pipe.writer.Get(), archiver)
+                             : StartProgram(program, arguments, pipe.writer.Get());
     auto source = std::make_unique<ProgramOutput>(
-        ProgramOutput{std::move(pipe.reader), std::move(child), false, 0, {}});
+        ProgramOutput{std::move(pipe.reader), std::move(child), std::move(archiver), false, 0, {}});
     FILE* const stream = fopencookie(source.get(), mode, {ReadOutput, nullptr, nullptr, nullptr});
     if (stream == nullptr) {
       ThrowErrno("stream");
@@ -109,6 +111,10 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     return stream;
   } catch (const std::system_error& error) {
     KlibError(error.code().value());
+    return nullptr;
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "%s: %s", program, error.what());
+    KlibError(EPERM);
     return nullptr;
   }
 }
@@ -140,6 +146,11 @@ void BecomeWorker() {
 }
 
 pid_t ForkWorker() {
+  try {
+    RemoveLeftovers(CurrentUser());
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "leftovers: %s", error.what());
+  }
   CloseStores();
   try {
     ChildProcess worker = ChildProcess::Fork();

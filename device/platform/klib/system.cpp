@@ -9,7 +9,9 @@
 #include <cerrno>
 #include <cstring>
 
+#include "device/base/open_below.h"
 #include "device/model/device.h"
+#include "device/platform/klib/archive.h"
 #include "device/platform/klib/klib_error.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
@@ -37,12 +39,19 @@ int IsAdmin(const char* name) {
 
 int AddToIndex(const char* path) {
   try {
-    StoreOf(CurrentUser()).AddToIndex(path);
+    if (OpenArchive(path)) {
+      StoreOf(CurrentUser()).AddToIndex(path);
+    }
     return 0;
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "file index: %s", error.what());
     return KlibError(EIO);
   }
+}
+
+int SetMode(const char* path, mode_t mode) {
+  const FileDescriptor archive = OpenArchive(path);
+  return archive ? chmod(PathOf(archive.Get()).c_str(), mode) : 0;
 }
 
 // Each character that means something to a shell behind a backslash; a line feed, which a backslash
@@ -99,7 +108,7 @@ int KLIBKavoIndexAdd(const char* path, int scope) {
 
 int KAVOFSAclChmod(const char* path, int descriptor, mode_t mode) {
   return Operation("KAVOFSAclChmod", path, descriptor, mode).Run([&] {
-    return descriptor == Device::kByPath ? chmod(path, mode) : fchmod(descriptor, mode);
+    return descriptor == Device::kByPath ? Device::SetMode(path, mode) : fchmod(descriptor, mode);
   });
 }
 

@@ -1,12 +1,17 @@
 #include "device/platform/lumo/paths.h"
 
+#include <fcntl.h>
+#include <sys/stat.h>
+
 #include <algorithm>
+#include <cerrno>
 #include <climits>
-#include <cstdlib>
-#include <memory>
+#include <filesystem>
+#include <system_error>
 #include <string_view>
 #include <utility>
 
+#include "device/base/open_below.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
@@ -58,36 +63,34 @@ bool FindShareFolder(const OpenDevice& device, const std::string& user, Resolved
   return true;
 }
 
-// Where the path leads when links are followed; of one that does not exist, its nearest parent that
-// does. Empty, with errno set, when that cannot be told.
-std::string FollowLinks(std::string path) {
-  for (;;) {
-    const std::unique_ptr<char, void (*)(void*)> followed(realpath(path.c_str(), nullptr),
-                                                          std::free);
-    if (followed != nullptr) {
-      return followed.get();
-    }
-    if (errno != ENOENT || path.size() <= 1) {
-      return {};
-    }
-    path.resize(std::max<std::size_t>(path.rfind('/'), 1));
+bool IsInsideOne(const std::string& path, const std::vector<std::string>& folders) {
+  return std::any_of(folders.begin(), folders.end(),
+                     [&](const std::string& folder) { return IsWithin(path, folder); });
+}
+
+// True of a link that leads off the volumes.
+bool LeadsAway(const FileDescriptor& entry, const std::string& path) {
+  struct stat status {};
+  if (fstat(entry.Get(), &status) != 0 || !S_ISLNK(status.st_mode)) {
+    return false;
   }
+  std::error_code error;
+  const std::string end = std::filesystem::canonical(path, error);
+  return !error && !IsInsideOne(end, TheDevice().real_volumes);
 }
 
-bool IsOnVolumes(const std::string& path) {
-  const std::vector<std::string>& volumes = TheDevice().real_volumes;
-  return std::any_of(volumes.begin(), volumes.end(),
-                     [&](const std::string& volume) { return IsWithin(path, volume); });
-}
-
-int CheckPath(const char* path) {
-  const std::string followed = FollowLinks(path);
-  if (followed.empty()) {
-    SetLastErrno(errno);
+// Refuses what lies outside the device or behind a link, whoever made it: user paths name folders.
+// The last name may be a link's, which is packed as such.
+int CheckPath(const std::string& path) {
+  const std::vector<std::string> fixed = TheDevice().FixedFolders(CurrentUser());
+  const FileDescriptor entry = OpenUserPath(fixed, path, O_PATH);
+  const int error = entry ? 0 : errno;
+  if (error == ELOOP || !IsInsideOne(path, fixed) || (entry && LeadsAway(entry, path))) {
+    SetLastError(KAVO::kErrOutsideShare);
     return -1;
   }
-  if (!IsOnVolumes(followed)) {
-    SetLastError(KAVO::kErrOutsideShare);
+  if (error != 0 && error != ENOENT) {
+    SetLastErrno(error);
     return -1;
   }
   return 0;
@@ -118,7 +121,11 @@ std::string CommonFolder(const std::string& one, const std::string& other) {
   return one.substr(0, end);
 }
 
+std::string sources_folder;
+
 }  // namespace
+
+const std::string& SourcesFolder() { return sources_folder; }
 
 ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const std::string& path) {
   ResolvedPath resolved;
@@ -155,11 +162,6 @@ Access AccessOf(const ResolvedPath& path, const std::string& user) {
   }
   const auto found = path.share->access.find(user);
   return found == path.share->access.end() ? Access::kNone : found->second;
-}
-
-bool IsWithin(const std::string& path, const std::string& folder) {
-  return path.compare(0, folder.size(), folder) == 0 &&
-         (path.size() == folder.size() || path[folder.size()] == '/');
 }
 
 const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_path) {
@@ -248,6 +250,7 @@ std::string FindCommonParent(std::vector<std::string> directories) {
     for (const std::string& directory : directories) {
       parent = Device::CommonFolder(parent, directory);
     }
+    Device::sources_folder = parent.substr(0, parent.size() - 1);
     return parent;
   });
 }

@@ -27,7 +27,8 @@ Access AccessOf(const ResolvedPath& path, const std::string& user);
 // The shared folder that a full path lies in, null when it is in none.
 const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_path);
 
-// True if `path` is `folder` or lies below it. Both are full paths without a slash at the end.
-bool IsWithin(const std::string& path, const std::string& folder);
+// The folder in which this process's job has its sources, when they lie in one shared folder: what
+// FindCommonParent answered. Without a slash at the end; empty before.
+const std::string& SourcesFolder();
 
 }  // namespace Device

@@ -5,7 +5,9 @@
 
 #include <cerrno>
 
+#include "device/base/open_below.h"
 #include "device/model/device.h"
+#include "device/platform/klib/archive.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/lumo/paths.h"
@@ -51,6 +53,12 @@ bool MayList(const std::string& user, const char* path) {
 int AskKernel(const char* path, int mode) {
   const int bits = ((mode & kAccessRead) != 0 ? R_OK : 0) |
                    ((mode & kAccessWrite) != 0 ? W_OK : 0) | ((mode & kAccessPass) != 0 ? X_OK : 0);
+  // What is written to is the destination's folder, never one behind a link.
+  if ((mode & kAccessWrite) != 0 &&
+      !OpenUserPath(TheDevice().FixedFolders(CurrentUser()), path, O_PATH | O_DIRECTORY)) {
+    SetLastErrno(errno);
+    return -1;
+  }
   if (faccessat(AT_FDCWD, path, bits, AT_EACCESS) != 0) {
     SetLastErrno(errno);
     return -1;
@@ -64,8 +72,10 @@ int ChownToAdmins(const char* path, const std::string& name) {
     SetLastError(KAVO::kErrNoUser);
     return -1;
   }
+  const FileDescriptor archive = OpenArchive(path);
   // Without root there are no such users and groups, only the caller.
-  if (TheDevice().switches_identity && lchown(path, user->uid, kAdminsGroup) != 0) {
+  if (TheDevice().switches_identity && archive &&
+      fchownat(archive.Get(), "", user->uid, kAdminsGroup, AT_EMPTY_PATH) != 0) {
     SetLastErrno(errno);
     return -1;
   }

@@ -1,0 +1,61 @@
+#include "device/base/archiver_call.h"
+
+#include <cerrno>
+#include <cstdlib>
+#include <utility>
+
+#include "device/base/file_io.h"
+#include "device/base/socket_message.h"
+
+namespace Device {
+
+namespace {
+
+constexpr char kMade[] = "made";
+constexpr std::size_t kMostCallBytes = 128 << 10U;  // what the socket holds before anybody reads
+
+void Add(std::string& texts, const std::string& text) { texts.append(text).push_back('\0'); }
+
+}  // namespace
+
+bool SendArchiverCall(int socket, const ArchiverCall& call) {
+  std::string texts;
+  Add(texts, call.password);
+  Add(texts, call.work_folder);
+  Add(texts, std::to_string(call.zip_program));
+  for (const std::string& folder : call.fixed_folders) {
+    Add(texts, folder);
+  }
+  if (texts.size() > kMostCallBytes) {
+    errno = E2BIG;
+    return false;
+  }
+  return WriteFrame(socket, texts);
+}
+
+std::optional<ArchiverCall> ReceiveArchiverCall(int socket) {
+  const std::optional<std::string> frame = ReadFrame(socket);
+  std::vector<std::string> texts;
+  std::size_t begin = 0;
+  for (std::size_t end = 0; frame && (end = frame->find('\0', begin)) != std::string::npos;
+       begin = end + 1) {
+    texts.push_back(frame->substr(begin, end - begin));
+  }
+  constexpr std::size_t kHead = 3;  // before the folders
+  if (texts.size() < kHead) {
+    return std::nullopt;
+  }
+  return ArchiverCall{
+      texts[0], texts[1], std::atoi(texts[2].c_str()), {texts.begin() + kHead, texts.end()}};
+}
+
+bool SendMadeArchive(int socket, const FileDescriptor& archive) {
+  return SendMessage(socket, kMade, archive.Get());
+}
+
+FileDescriptor ReceiveMadeArchive(int socket) {
+  std::optional<SocketMessage> message = ReceiveMessage(socket, sizeof kMade);
+  return message ? std::move(message->descriptor) : FileDescriptor();
+}
+
+}  // namespace Device

@@ -1,0 +1,126 @@
+#include "device/platform/klib/archive.h"
+
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <stdexcept>
+#include <utility>
+
+#include "device/base/archiver_call.h"
+#include "device/base/open_below.h"
+#include "device/base/work_folder.h"
+#include "device/model/device.h"
+#include "device/platform/lumo/identity.h"
+#include "device/platform/lumo/paths.h"
+#include "device/tasks/leftovers.h"
+
+namespace Device {
+
+namespace {
+
+struct MadeArchive {
+  std::string path;
+  FileDescriptor file;
+} made_archive;
+
+bool IsSameFolder(const FileDescriptor& folder) {
+  struct stat one {};
+  struct stat here {};
+  return folder && fstat(folder.Get(), &one) == 0 && stat(".", &here) == 0 &&
+         one.st_dev == here.st_dev && one.st_ino == here.st_ino;
+}
+
+// The module's vector, taken apart.
+struct Arguments {
+  std::vector<std::string> shown;  // all but the password, with the program's name in front
+  std::string password;
+  std::string list;     // path
+  std::string archive;  // path
+};
+
+// A last "-progress" is the switch; anywhere else it would be the password "rogress".
+Arguments TakeApart(char* const* argument) {
+  constexpr char kPasswordMark[] = "-p";
+  constexpr std::size_t kMarkLength = sizeof kPasswordMark - 1;
+  Arguments taken;
+  taken.shown = {*argument};
+  while (*++argument != nullptr) {
+    const std::string text = *argument;
+    if (text.compare(0, kMarkLength, kPasswordMark) == 0 && argument[1] != nullptr) {
+      taken.password = text.substr(kMarkLength);
+      continue;
+    }
+    if (text[0] == '@') {
+      taken.list = text.substr(1);
+    } else if (text[0] == '/') {
+      taken.archive = text;
+    }
+    taken.shown.push_back(text);
+  }
+  return taken;
+}
+
+// So that it is removed when this worker and its archiver are killed.
+void NoteWhatIsLeft(const Arguments& arguments, const std::string& work_folder) {
+  const std::string& archive = arguments.archive;
+  try {
+    NoteLeftovers(CurrentUser(),
+                  {arguments.list, archive.substr(0, archive.rfind('/')), work_folder});
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "archiver: %s", error.what());
+  }
+}
+
+}  // namespace
+
+ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun& run) {
+  const Arguments arguments = TakeApart(argument_vector);
+  const ArchiverCall call = {arguments.password, NewWorkFolderName(), TheDevice().zip_program.Get(),
+                             TheDevice().FixedFolders(CurrentUser())};
+  const std::string& folder = SourcesFolder();
+  if (!folder.empty() &&
+      !IsSameFolder(OpenUserPath(call.fixed_folders, folder, O_PATH | O_DIRECTORY))) {
+    throw std::runtime_error("the folder of the sources has changed: " + folder);
+  }
+  if (!Fence::IsSupported()) {
+    syslog(LOG_WARNING, "the archiver is not fenced: the kernel has no Landlock");
+  }
+  int ends[2];
+  if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
+    ThrowErrno("socket pair");
+  }
+  run = {FileDescriptor(ends[0]), arguments.archive};
+  const FileDescriptor input(ends[1]);
+  NoteWhatIsLeft(arguments, call.work_folder);
+  if (!SendArchiverCall(run.call.Get(), call)) {
+    ThrowErrno("archiver");
+  }
+  ProgramStart start;
+  start.program = PathOf(TheDevice().archiver.Get());
+  start.arguments = arguments.shown;
+  start.input = input.Get();
+  start.output = output;
+  start.kept = {call.zip_program};
+  return ChildProcess::Start(start);
+}
+
+void TakeArchive(const ArchiverRun& run) {
+  made_archive = {run.archive, ReceiveMadeArchive(run.call.Get())};
+}
+
+FileDescriptor OpenArchive(const std::string& path) {
+  if (made_archive.file && path == made_archive.path) {
+    return FileDescriptor(fcntl(made_archive.file.Get(), F_DUPFD_CLOEXEC, 0));
+  }
+  FileDescriptor file = OpenUserPath(TheDevice().FixedFolders(CurrentUser()), path, O_PATH);
+  struct stat status {};
+  const bool is_single =
+      file && fstat(file.Get(), &status) == 0 && S_ISREG(status.st_mode) && status.st_nlink == 1;
+  return is_single ? std::move(file) : FileDescriptor();
+}
+
+}  // namespace Device

@@ -1,0 +1,31 @@
+// The archiver that stands behind /usr/bin/7z, and the archive that it has made.
+#pragma once
+
+#include <string>
+
+#include "device/base/child_process.h"
+#include "device/base/file_descriptor.h"
+
+namespace Device {
+
+// The archiver as it runs: the other end of its standard input, and where its archive is to stand.
+struct ArchiverRun {
+  FileDescriptor call;
+  std::string archive;  // path
+};
+
+// Starts the device's archiver with the module's argument vector; the password in it is handed over
+// by descriptor, as everybody can read argument lists. Throws std::exception, among others when the
+// working directory is no longer the folder in which the sources were found.
+ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun& run);
+
+// Takes over what the archiver has made, once it has ended well.
+void TakeArchive(const ArchiverRun& run);
+
+// The file that operations on a job's archive are to touch, opened as a path: the one that the
+// archiver made for that path in this process, wherever it lies by now. When it made none, the
+// regular file with a single link that lies there with no link on the way below a shared folder.
+// Invalid when that is something else: nothing is to be touched then.
+FileDescriptor OpenArchive(const std::string& path);
+
+}  // namespace Device
