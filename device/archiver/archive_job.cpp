@@ -12,7 +12,6 @@
 #include <unordered_set>
 #include <utility>
 
-#include "device/archiver/code_page.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/list_file.h"
 #include "device/archiver/special_files.h"
@@ -21,6 +20,7 @@
 #include "device/archiver/target.h"
 #include "device/archiver/work_place.h"
 #include "device/archiver/zip_program.h"
+#include "device/base/code_page.h"
 #include "device/base/fence.h"
 #include "device/base/file_io.h"
 #include "device/base/open_below.h"
@@ -237,9 +237,10 @@ void PrepareArchive(Job& job, PackRun& run) {
 Device::FileDescriptor PackArchive(const Request& request, const Device::ArchiverCall& call,
                                    const Cancel& cancel, Report& report) {
   CheckPassword(request);
-  const bool recode = request.zip && !CodePage::IsUtf8(request.code_page);
-  if (recode) {
-    CodePage checked(request.code_page);
+  const bool recode = request.zip && !Device::CodePage::IsUtf8(request.code_page);
+  if (recode && !Device::CodePage::Open(request.code_page)) {
+    throw NamedFailure("unknown code page", request.code_page,
+                       "not one for names in a zip archive");
   }
   std::vector<std::string> listed = Sources(request);
   const WorkPlace place = FindWorkPlace(listed, request.list_path);

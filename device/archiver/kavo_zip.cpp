@@ -5,22 +5,19 @@
 #include <exception>
 #include <iostream>
 #include <iterator>
-#include <optional>
 #include <string>
 #include <vector>
 
-#include "device/archiver/code_page.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/zip_entries.h"
 #include "device/archiver/zip_program.h"
+#include "device/base/code_page.h"
 
 namespace {
 
 int Run(const std::string& command, const std::string& archive, const std::string& page_name) {
-  std::optional<Archiver::CodePage> page;
-  if (!Archiver::CodePage::IsUtf8(page_name)) {
-    page.emplace(page_name);
-  }
+  const auto page =
+      Device::CodePage::IsUtf8(page_name) ? nullptr : Device::CodePage::Open(page_name);
   if (command == Archiver::kZipCheck) {
     const std::string password(std::istreambuf_iterator<char>(std::cin), {});
     Archiver::CheckMembers(archive, password);

@@ -81,7 +81,7 @@ void Rename(const std::string& path, zip_flags_t encoding, const Conversion& con
   static_cast<void>(archive.release());  // zip_close has freed it
 }
 
-Conversion ToUtf8(const CodePage& page) {
+Conversion ToUtf8(const Device::CodePage& page) {
   return [&page](const std::string& name, bool flagged) {
     return flagged ? std::nullopt : page.Decode(name);
   };
@@ -139,7 +139,7 @@ void CheckMembers(const std::string& archive, const std::string& password) {
   }
 }
 
-bool HasNamesIn(const CodePage& page, const std::string& archive) {
+bool HasNamesIn(const Device::CodePage& page, const std::string& archive) {
   const Zip zip = Open(archive, ZIP_RDONLY);
   const zip_int64_t count = zip_get_num_entries(zip.get(), 0);
   for (zip_int64_t i = 0; i < count; ++i) {
@@ -151,11 +151,11 @@ bool HasNamesIn(const CodePage& page, const std::string& archive) {
   return false;
 }
 
-void NamesToUtf8(const CodePage& page, const std::string& archive) {
+void NamesToUtf8(const Device::CodePage& page, const std::string& archive) {
   Rename(archive, ZIP_FL_ENC_UTF_8, ToUtf8(page));
 }
 
-void NamesToCodePage(const CodePage& page, const std::string& archive) {
+void NamesToCodePage(const Device::CodePage& page, const std::string& archive) {
   const Conversion from_utf8 = [&page](const std::string& name, bool flagged) {
     return flagged ? page.Encode(name) : std::nullopt;
   };

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "device/archiver/code_page.h"
+#include "device/base/code_page.h"
 
 namespace Archiver {
 
@@ -18,8 +18,8 @@ void CheckMembers(const std::string& archive, const std::string& password);
 // entry bears, stays as it is.
 
 // Whether the archive has names which NamesToUtf8 would change.
-bool HasNamesIn(const CodePage& page, const std::string& archive);
-void NamesToUtf8(const CodePage& page, const std::string& archive);
-void NamesToCodePage(const CodePage& page, const std::string& archive);
+bool HasNamesIn(const Device::CodePage& page, const std::string& archive);
+void NamesToUtf8(const Device::CodePage& page, const std::string& archive);
+void NamesToCodePage(const Device::CodePage& page, const std::string& archive);
 
 }  // namespace Archiver

@@ -1,13 +1,11 @@
-#include "device/archiver/code_page.h"
+#include "device/base/code_page.h"
 
 #include <strings.h>
 
 #include <algorithm>
 #include <cctype>
 
-#include "device/archiver/failure.h"
-
-namespace Archiver {
+namespace Device {
 namespace {
 
 constexpr char kUtf8[] = "UTF-8";
@@ -50,12 +48,13 @@ std::optional<std::string> Convert(iconv_t converter, std::string text) {
 
 CodePage::CodePage(const std::string& name)
     : encoder_(iconv_open(IconvName(name).c_str(), kUtf8)),
-      decoder_(iconv_open(kUtf8, IconvName(name).c_str())) {
+      decoder_(iconv_open(kUtf8, IconvName(name).c_str())) {}
+
+std::unique_ptr<CodePage> CodePage::Open(const std::string& name) {
   const std::string path = "/ABCXYZabcxyz0189.-_+@";
-  if (encoder_ == Unopened() || decoder_ == Unopened() || Encode(path) != path) {
-    CodePage::~CodePage();
-    throw NamedFailure("unknown code page", name, "not one for names in a zip archive");
-  }
+  std::unique_ptr<CodePage> page(new CodePage(name));
+  const bool is_known = page->encoder_ != Unopened() && page->decoder_ != Unopened();
+  return is_known && page->Encode(path) == path ? std::move(page) : nullptr;
 }
 
 CodePage::~CodePage() {
@@ -86,4 +85,4 @@ bool CodePage::IsUtf8(const std::string& name) {
          name == "65001";
 }
 
-}  // namespace Archiver
+}  // namespace Device

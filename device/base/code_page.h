@@ -1,17 +1,19 @@
+// Names in a character set other than UTF-8.
 #pragma once
 
 #include <iconv.h>
 
+#include <memory>
 #include <optional>
 #include <string>
 
-namespace Archiver {
+namespace Device {
 
 // A character set that agrees with ASCII on what makes a path, by its IANA name or as "CPnnn".
 class CodePage {
  public:
-  // Throws Failure for a name that is unknown or cannot serve in file names.
-  explicit CodePage(const std::string& name);
+  // Null for a name that is unknown or cannot serve in file names.
+  static std::unique_ptr<CodePage> Open(const std::string& name);
   ~CodePage();
   CodePage(const CodePage&) = delete;
   CodePage& operator=(const CodePage&) = delete;
@@ -24,8 +26,10 @@ class CodePage {
   static bool IsUtf8(const std::string& name);
 
  private:
+  explicit CodePage(const std::string& name);
+
   iconv_t encoder_;
   iconv_t decoder_;
 };
 
-}  // namespace Archiver
+}  // namespace Device
