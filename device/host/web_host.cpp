@@ -29,7 +29,6 @@ namespace {
 
 constexpr char kFrontEndProgram[] = "kavo-web";
 constexpr char kPageFolder[] = "page";
-constexpr char kLockFile[] = "serve.lock";
 constexpr std::size_t kMostRequests = 384;  // at the same time; further ones wait
 constexpr int kRestartPauseMs = 500;
 constexpr std::chrono::seconds kFrontEndGrace(6);

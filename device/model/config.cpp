@@ -1,5 +1,6 @@
 #include "device/model/config.h"
 
+#include <crypt.h>
 #include <json/json.h>
 
 #include <algorithm>
@@ -8,14 +9,16 @@
 #include <set>
 #include <stdexcept>
 
+#include "device/base/code_page.h"
 #include "device/base/json_text.h"
+#include "device/model/device.h"
 
 namespace Device {
 
 namespace {
 
 const std::set<std::string> kReservedShares = {"home", "homes"};  // every user's own, and all
-const std::set<std::string> kReservedVolumes = {"users", "device.json"};  // beside the volumes
+const std::set<std::string> kReservedVolumes = {kUsersFolder, kConfigFile, kLockFile};
 
 // Reads members of JSON objects and says on which line of the text something is wrong.
 class ConfigReader {
@@ -95,6 +98,36 @@ class ConfigReader {
   const std::string& text_;
 };
 
+// As crypt(3) makes it: "$METHOD$", settings, "$" and so many digits as the method has.
+bool IsPasswordHash(const std::string& text) {
+  static const std::map<std::string, std::size_t> kDigits = {
+      {"$1$", 22},  {"$5$", 43},  {"$6$", 86},  {"$7$", 43}, {"$y$", 43},
+      {"$gy$", 43}, {"$2a$", 53}, {"$2b$", 53}, {"$2y$", 53}};
+  const std::size_t method_end = text.find('$', 1);
+  const std::size_t settings_end =
+      text.find_last_not_of("./0123456789ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz");
+  const auto method = kDigits.find(text.substr(0, method_end + 1));
+  return method != kDigits.end() && settings_end > method_end && text[settings_end] == '$' &&
+         text.size() - settings_end - 1 == method->second &&
+         crypt_checksalt(text.c_str()) != CRYPT_SALT_INVALID;
+}
+
+std::string ReadPassword(const ConfigReader& reader, const Json::Value& value) {
+  std::string hash = reader.Text(value);
+  if (!IsPasswordHash(hash)) {
+    reader.Fail(value, "'password' is no hash of crypt(3), as 'openssl passwd -6' prints one");
+  }
+  return hash;
+}
+
+std::string ReadCodePage(const ConfigReader& reader, const Json::Value& value) {
+  std::string name = reader.Text(value);
+  if (!CodePage::IsUtf8(name) && !CodePage::Open(name)) {
+    reader.Fail(value, "unknown code page '" + name + "'");
+  }
+  return name;
+}
+
 uid_t ReadUid(const ConfigReader& reader, const Json::Value& value) {
   if (!value.isUInt() || value.asUInt() == 0 ||
       value.asUInt() == std::numeric_limits<std::uint32_t>::max()) {
@@ -111,8 +144,8 @@ User ReadUser(const ConfigReader& reader, const Json::Value& value) {
        {"uid", [&](const Json::Value& each) { user.uid = ReadUid(reader, each); }},
        {"home", [&](const Json::Value& each) { user.home = reader.Name(each); }}},
       {{"admin", [&](const Json::Value& each) { user.admin = reader.Bool(each); }},
-       {"codepage", [&](const Json::Value& each) { user.codepage = reader.Text(each); }},
-       {"password", [&](const Json::Value& each) { user.password = reader.Text(each); }}});
+       {"codepage", [&](const Json::Value& each) { user.codepage = ReadCodePage(reader, each); }},
+       {"password", [&](const Json::Value& each) { user.password = ReadPassword(reader, each); }}});
   return user;
 }
 

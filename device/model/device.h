@@ -3,7 +3,7 @@
 //
 // In the folder: device.json; a folder for each volume; in a volume its shared folders and, under
 // "homes", the users' homes; under "users" a folder for each user, that only that user can enter,
-// with the store of tasks.
+// with the store of tasks; serve.lock while the device is served.
 #pragma once
 
 #include <string>
@@ -18,7 +18,10 @@ namespace Device {
 inline constexpr gid_t kUsersGroup = 65100;
 inline constexpr gid_t kAdminsGroup = 65101;
 
+// What lies in the device's folder beside the volumes.
 inline constexpr char kConfigFile[] = "device.json";
+inline constexpr char kUsersFolder[] = "users";
+inline constexpr char kLockFile[] = "serve.lock";
 inline constexpr char kHomeShare[] = "home";
 
 struct OpenDevice {
@@ -36,7 +39,9 @@ struct OpenDevice {
   }
   // Paths of folders that no user can rename or replace: volumes, shared folders, the user's home.
   std::vector<std::string> FixedFolders(const std::string& user) const;
-  std::string StateFolder(const std::string& user) const { return root + "/users/" + user; }
+  std::string StateFolder(const std::string& user) const {
+    return root + "/" + kUsersFolder + "/" + user;
+  }
 };
 
 // Opens the device in a folder, once in a process, before anything below platform/ is called.

@@ -74,7 +74,8 @@ void MakeShare(const std::string& root, const Config& config, const Share& share
 void MakeUser(const std::string& root, const User& user) {
   const std::string homes = root + "/" + user.home + "/homes";
   MakeFolder(homes, kFolderMode);
-  for (const std::string& path : {homes + "/" + user.name, root + "/users/" + user.name}) {
+  for (const std::string& path :
+       {homes + "/" + user.name, root + "/" + kUsersFolder + "/" + user.name}) {
     MakeFolder(path, kPrivateMode);
     GiveTo(path, user);
   }
@@ -86,7 +87,7 @@ void MakeFolders(const std::string& root, const Config& config, const std::strin
   }
   fs::create_directories(root);
   MakeFolder(root, kFolderMode);
-  MakeFolder(root + "/users", kFolderMode);
+  MakeFolder(root + "/" + kUsersFolder, kFolderMode);
   for (const std::string& volume : config.volumes) {
     MakeFolder(root + "/" + volume, kFolderMode);
   }
