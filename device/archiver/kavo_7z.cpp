@@ -25,16 +25,6 @@ namespace {
 
 constexpr char kZipProgram[] = "kavo-zip";
 
-// Keeps the files that this program opens off the numbers of standard streams it was started
-// without.
-void OccupyStandardStreams() {
-  int fd = 0;
-  do {
-    fd = open("/dev/null", O_RDWR | O_CLOEXEC);
-  } while (fd >= 0 && fd <= STDERR_FILENO);
-  close(fd);
-}
-
 // What the device tells beside the arguments; by hand it is not there.
 std::optional<Device::ArchiverCall> CallOfDevice() {
   struct stat input {};
@@ -55,7 +45,7 @@ int main(int argc, char** argv) {
   if (fcntl(STDOUT_FILENO, F_GETFD) < 0) {
     return 1;  // nobody to report to
   }
-  OccupyStandardStreams();
+  Device::OccupyStandardStreams();
   try {
     const Archiver::Cancel cancel(STDOUT_FILENO);
     Archiver::Report report(cancel);

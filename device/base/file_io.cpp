@@ -10,6 +10,14 @@
 
 namespace Device {
 
+void OccupyStandardStreams() {
+  int fd = 0;
+  do {
+    fd = open("/dev/null", O_RDWR);
+  } while (fd >= 0 && fd <= STDERR_FILENO);
+  close(fd);
+}
+
 FileDescriptor OpenBesideProgram(const std::string& name, int flags) {
   const std::filesystem::path path =
       std::filesystem::read_symlink("/proc/self/exe").parent_path() / name;

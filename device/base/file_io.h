@@ -1,4 +1,4 @@
-// Whole reads and writes, and frames.
+// Whole reads and writes, frames, standard streams.
 #pragma once
 
 #include <cstddef>
@@ -9,6 +9,10 @@
 #include "device/base/file_descriptor.h"
 
 namespace Device {
+
+// Puts /dev/null in the place of the standard streams that are closed, so that nothing opened later
+// gets their numbers.
+void OccupyStandardStreams();
 
 // A file beside the program's own, opened with the flags. Throws std::system_error that names it.
 FileDescriptor OpenBesideProgram(const std::string& name, int flags);

@@ -15,6 +15,7 @@
 #include <string>
 #include <thread>
 
+#include "device/base/file_io.h"
 #include "device/host/wire.h"
 #include "device/web/front_end.h"
 
@@ -100,6 +101,7 @@ void Serve(const std::string& listen, int page) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  Device::OccupyStandardStreams();
   std::signal(SIGPIPE, SIG_IGN);
   try {
     if (argc != 3) {
