@@ -80,6 +80,46 @@ TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
+TEST_F(CliTest, AnyStandardStreamMayBeClosed) {
+  Add("vol1/photo/a.txt", "a");
+  for (const std::string closed : {"<&-", ">&-", "2>&-", "<&- >&- 2>&-"}) {
+    const std::string compress = Built("kavo-device") + " compress " + device_ +
+                                 " --user alice /photo/a.txt /photo/z.zip " + closed;
+    EXPECT_EQ(RunProgram({"/bin/sh", "-c", compress}).status, 0) << closed;
+    EXPECT_TRUE(fs::remove(At("vol1/photo/z.zip"))) << closed;
+  }
+  Program serve(
+      {"/bin/sh", "-c",
+       "exec " + Built("kavo-device") + " serve " + device_ + " --listen 127.0.0.1:0 <&- 2>&-"},
+      "/");
+  EXPECT_TRUE(serve.ReadUntil("' on http://127.0.0.1:"));
+  kill(serve.Pid(), SIGTERM);
+  EXPECT_EQ(serve.Wait(), 0);
+}
+
+TEST_F(CliTest, OutputThatCannotBeWrittenIsNoSuccess) {
+  Add("vol1/photo/a.txt", "a");
+  const std::string device = " " + device_ + " --user alice ";
+  for (const std::string& command :
+       {"init " + temp_.Path() + "/new", std::string("--help"),
+        "call" + device + "start path=/photo/a.txt dest_file_path=/photo/c.zip", "tasks" + device,
+        "compress" + device + "/photo/a.txt /photo/z.zip", "notifications" + device,
+        "serve " + device_ + " --listen 127.0.0.1:0"}) {
+    // The list of notifications is empty until the job of "call" has ended.
+    ASSERT_TRUE(command.rfind("notif", 0) != 0 ||
+                WaitUntil([&] { return !As("alice", "notifications").out.empty(); }));
+    const std::string line = Built("kavo-device") + " " + command;
+    const Ran full = RunProgram({"/bin/sh", "-c", line + " >/dev/full"});
+    EXPECT_EQ(full.status, 1) << command;
+    EXPECT_THAT(full.err, HasSubstr("standard output: No space left on device\n")) << command;
+  }
+  EXPECT_TRUE(fs::exists(At("vol1/photo/z.zip")));
+  Program unread({Built("kavo-device"), "--help"}, "/", temp_.Path() + "/err");
+  unread.CloseOutput();
+  EXPECT_EQ(unread.Wait(), -SIGPIPE);
+  EXPECT_EQ(ReadFile(temp_.Path() + "/err"), "");
+}
+
 class CliRefuses : public CliTest, public testing::WithParamInterface<TableRow> {};
 
 TEST_P(CliRefuses, WithStatusTwoAndOneLine) {

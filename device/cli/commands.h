@@ -9,7 +9,7 @@ namespace Device {
 
 enum ExitStatus : int {
   kExitDone = 0,
-  kExitFailed = 1,  // the API or the job answered an error
+  kExitFailed = 1,  // the API or the job answered an error, or output was lost
   kExitUsage = 2    // wrong usage, or no such device
 };
 

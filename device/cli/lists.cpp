@@ -9,6 +9,7 @@
 
 #include "device/base/child_process.h"
 #include "device/cli/commands.h"
+#include "device/cli/output.h"
 #include "device/model/device.h"
 #include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
@@ -28,9 +29,8 @@ int RunAs(const std::string& user, const std::function<void()>& body) {
                          throw std::runtime_error("cannot take on the identity of '" + user + "'");
                        }
                        body();
-                       std::cout.flush();
                        CloseStores();
-                       return kExitDone;
+                       return FinishOutput() ? kExitDone : kExitFailed;
                      }).Wait();
   return WIFEXITED(status) ? WEXITSTATUS(status) : kExitFailed;
 }

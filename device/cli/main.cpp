@@ -7,7 +7,9 @@
 #include <exception>
 #include <iostream>
 
+#include "device/base/file_io.h"
 #include "device/cli/commands.h"
+#include "device/cli/output.h"
 #include "device/host/web_host.h"
 #include "device/model/device.h"
 #include "device/platform/operations.h"
@@ -156,12 +158,15 @@ int Run(int argc, char** argv) {
 }  // namespace
 
 int main(int argc, char** argv) {
+  Device::OccupyStandardStreams();
+  Device::WatchOutput();
   openlog("kavo-device", LOG_PID | LOG_PERROR, LOG_USER);
   std::signal(SIGPIPE, SIG_IGN);
+  int status = Device::kExitUsage;
   try {
-    return Run(argc, argv);
+    status = Run(argc, argv);
   } catch (const std::exception& error) {
     std::cerr << "kavo-device: " << error.what() << '\n';
-    return Device::kExitUsage;
   }
+  return Device::FinishOutput() ? status : Device::kExitFailed;
 }

@@ -175,7 +175,7 @@ bool WebHost::TakeMessage() {
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "message of the front end: %s", error.what());
   }
-  return true;
+  return std::cout.good();  // it does not serve where it could not say
 }
 
 void WebHost::Serve(ControlMessage& message) {
@@ -188,7 +188,7 @@ void WebHost::Serve(ControlMessage& message) {
         listen_ = message.text;  // where any free port was asked for, this one from now on
         std::cout << "serving '" << TheDevice().root << "' on http://" << listen_ << '/'
                   << std::endl;
-        has_listened_ = true;
+        has_listened_ = std::cout.good();
       }
       break;
     case ControlKind::kRequest:
