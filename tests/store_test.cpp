@@ -1,6 +1,7 @@
 // The store of tasks: read and written piece by piece, damaged, and without room.
 #include <sqlite3.h>
 
+#include <csignal>
 #include <filesystem>
 #include <map>
 
@@ -84,6 +85,44 @@ TEST_F(StoreTest, ARowSeesWhatAnotherHasChangedMemberByMember) {
   std::map<std::string, Device::TaskRow> rows = {{mine.id, mine}};
   store.RefreshTasks(rows);
   EXPECT_TRUE(rows.empty());
+}
+
+// The bytes in the files, not what the database shows of them.
+TEST_F(StoreTest, ThePasswordOfARemovedTaskIsInNoFileOfTheStore) {
+  const std::string password = "correct-horse-battery";
+  const auto is_kept = [&] {
+    return (ReadFile(file_) + ReadFile(file_ + "-wal")).find(password) != std::string::npos;
+  };
+  const auto params = [&](const std::string& source) {
+    return JobParams({source}, "/photo/z.7z", R"({"format":"7z","password":")" + password + "\"}");
+  };
+  RunJob(params("/photo/a.txt"));
+  EXPECT_FALSE(is_kept());
+
+  sqlite3* reader = nullptr;
+  ASSERT_EQ(sqlite3_open(file_.c_str(), &reader), SQLITE_OK);
+  sqlite3_exec(reader, "BEGIN; SELECT * FROM tasks", nullptr, nullptr, nullptr);
+  RunJob(params("/photo/a.txt"));
+  EXPECT_TRUE(is_kept());
+  ASSERT_EQ(sqlite3_close(reader), SQLITE_OK);
+  Ask("status", "Zantro_none");
+  EXPECT_FALSE(is_kept());
+
+  fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
+  const std::string task = Call("start", params("/photo/zeros")).data["taskid"].asString();
+  EXPECT_TRUE(is_kept());
+  kill(Worker(), SIGKILL);
+  EXPECT_TRUE(Follow(task).isMember("errors"));
+  EXPECT_FALSE(is_kept());
+
+  Device::TaskStore store("alice");
+  Device::TaskRow row;
+  row.id = "Zantro_test";
+  row.properties["data"] = Device::ParseJson(R"({"params":{"password":")" + password + "\"}}");
+  store.AddTask(row);
+  ASSERT_TRUE(is_kept());
+  ASSERT_TRUE(store.UpdateTask(row, {{"data", Device::ParseJson(R"({"params":{}})")}}, false));
+  EXPECT_FALSE(is_kept());
 }
 
 }  // namespace

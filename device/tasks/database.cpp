@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <cstdlib>
 #include <ctime>
 #include <stdexcept>
 #include <utility>
@@ -14,6 +15,10 @@ namespace Device {
 namespace {
 
 constexpr int kBusyTimeoutMs = 30000;  // longer than any transaction of another process
+constexpr int kEraseTimeoutMs = 100;
+// The number in the file's header that is an application's own. Each erasure that is asked for
+// makes it greater by one; when it is done, the number is negative.
+constexpr char kMark[] = "PRAGMA application_id";
 
 ino_t FileOf(const std::string& path) {
   struct stat status {};
@@ -51,30 +56,34 @@ void Database::Open() {
   file_ = FileOf(path_);
 }
 
+void Database::Execute(const std::string& sql) {
+  Check(sqlite3_exec(database_.get(), sql.c_str(), nullptr, nullptr, nullptr));
+}
+
+std::int64_t Database::Number(const char* sql) {
+  Statement query(*this, sql);
+  return query.Step() ? query.Number(0) : 0;
+}
+
 void Database::MakeSchema(const char* schema, int version) {
-  const auto execute = [&](const std::string& sql) {
-    Check(sqlite3_exec(database_.get(), sql.c_str(), nullptr, nullptr, nullptr));
-  };
-  const auto number = [&](const char* sql) {
-    Statement query(*this, sql);
-    return query.Step() ? query.Number(0) : 0;
-  };
   constexpr char kVersion[] = "PRAGMA user_version";
-  execute("PRAGMA synchronous = NORMAL; PRAGMA wal_autocheckpoint = 200");
-  if (number(kVersion) == version) {
+  Execute(
+      "PRAGMA synchronous = NORMAL; PRAGMA wal_autocheckpoint = 200;"
+      "PRAGMA temp_store = MEMORY");
+  if (Number(kVersion) == version) {
     return;
   }
-  execute("PRAGMA journal_mode = WAL");
+  Execute("PRAGMA journal_mode = WAL");
   InTransaction(true, [&] {
-    if (number(kVersion) == version) {
+    if (Number(kVersion) == version) {
       return;  // another process was faster
     }
-    if (number("SELECT count(*) FROM sqlite_master") != 0) {
+    if (Number("SELECT count(*) FROM sqlite_master") != 0) {
       SetAside("it has another schema");
       throw std::runtime_error("task store '" + path_ + "' has another schema");
     }
-    execute(schema);
-    execute(kVersion + (" = " + std::to_string(version)));
+    Execute(schema);
+    Execute(kVersion + (" = " + std::to_string(version)));
   });
 }
 
@@ -112,8 +121,48 @@ void Database::InTransaction(bool for_writing, const std::function<void()>& body
     body();
     Statement(*this, "COMMIT").Step();
   } catch (...) {
+    is_marked_ = false;
     sqlite3_exec(database_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
     throw;
+  }
+  if (std::exchange(is_marked_, false)) {
+    EraseMarked();
+  }
+}
+
+void Database::MarkErasure() {
+  Execute(kMark + (" = " + std::to_string(std::abs(Number(kMark)) + 1)));
+  is_marked_ = true;
+}
+
+bool Database::EmptyLog() {
+  sqlite3_busy_timeout(database_.get(), kEraseTimeoutMs);
+  const int result = sqlite3_wal_checkpoint_v2(database_.get(), nullptr, SQLITE_CHECKPOINT_TRUNCATE,
+                                               nullptr, nullptr);
+  sqlite3_busy_timeout(database_.get(), kBusyTimeoutMs);
+  if (result != SQLITE_BUSY) {
+    Check(result);
+  }
+  return result == SQLITE_OK;
+}
+
+void Database::EraseMarked() {
+  try {
+    const std::int64_t mark = Number(kMark);
+    if (mark <= 0 || !EmptyLog()) {
+      return;
+    }
+    // Pages have copies of rows that were moved within them, also with "secure_delete".
+    Execute("VACUUM");
+    if (EmptyLog()) {
+      InTransaction(true, [&] {
+        if (Number(kMark) == mark) {  // else another process has marked more meanwhile
+          Execute(kMark + (" = " + std::to_string(-mark)));
+        }
+      });
+    }
+  } catch (const std::runtime_error& error) {
+    syslog(LOG_ERR, "erase what was removed: %s", error.what());
   }
 }
 

@@ -27,14 +27,26 @@ class Database {
   // throws undoes its changes and passes on.
   void InTransaction(bool for_writing, const std::function<void()>& body);
 
+  // Within a transaction: what it removes or overwrites is to leave the files too. That is tried
+  // when the transaction is done, and cannot be while another process reads what was before.
+  void MarkErasure();
+  // Tries again, whichever process has marked it. Does nothing when nothing is marked. A failure is
+  // logged, and the mark stays.
+  void EraseMarked();
+
  private:
   void Open();
+  void Execute(const std::string& sql);
+  std::int64_t Number(const char* sql);
+  // False while another process uses the log.
+  bool EmptyLog();
   void MakeSchema(const char* schema, int version);
   void Check(int result);
   void SetAside(const std::string& reason);
 
   const std::string path_;
   ino_t file_ = 0;
+  bool is_marked_ = false;  // in the transaction that runs
   std::unique_ptr<sqlite3, int (*)(sqlite3*)> database_;
 };
 

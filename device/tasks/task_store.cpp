@@ -37,13 +37,16 @@ CREATE TABLE file_index (path TEXT PRIMARY KEY, time INTEGER NOT NULL) WITHOUT R
 
 constexpr bool kForReading = false;
 constexpr bool kForWriting = true;
-constexpr char kWhole[] = "";      // in place of a member's name
-constexpr char kMemberMark = '.';  // before it
+constexpr char kWhole[] = "";                // in place of a member's name
+constexpr char kMemberMark = '.';            // before it
+constexpr char kSecret[] = "\"password\":";  // in a text that is erased when it goes
 
 }  // namespace
 
 TaskStore::TaskStore(const std::string& user)
-    : database_(TheDevice().StateFolder(user) + "/store.db", kSchema, kSchemaVersion) {}
+    : database_(TheDevice().StateFolder(user) + "/store.db", kSchema, kSchemaVersion) {
+  database_.EraseMarked();
+}
 
 void TaskStore::AddTask(TaskRow& row) {
   const std::map<std::string, StoredValue> properties = std::exchange(row.properties, {});
@@ -73,6 +76,12 @@ void TaskStore::WriteMember(const TaskRow& row, const std::string& name, const s
   insert.Bind(row.version).Step();
 }
 
+void TaskStore::MarkIfSecret(const std::string& lost) {
+  if (lost.find(kSecret) != std::string::npos) {
+    database_.MarkErasure();
+  }
+}
+
 void TaskStore::WriteProperty(TaskRow& row, const std::string& name, StoredValue value) {
   const bool is_new = row.properties.count(name) == 0;
   StoredValue& known = row.properties[name];
@@ -81,12 +90,15 @@ void TaskStore::WriteProperty(TaskRow& row, const std::string& name, StoredValue
   }
   for (const auto& [member, text] : known.members) {
     if (!value.HasMember(member)) {
+      MarkIfSecret(text);
       WriteMember(row, name, kMemberMark + member, nullptr);
     }
   }
   for (const auto& [member, text] : value.members) {
     const auto found = known.members.find(member);
-    if (found == known.members.end() || found->second != text) {
+    const bool is_new_member = found == known.members.end();
+    if (is_new_member || found->second != text) {
+      MarkIfSecret(is_new_member ? "" : found->second);
       WriteMember(row, name, kMemberMark + member, &text);
     }
   }
@@ -173,6 +185,10 @@ bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> prop
 void TaskStore::RemoveTask(const std::string& id, pid_t worker) {
   database_.InTransaction(kForWriting, [&] {
     RemoveWorker(worker);
+    Statement secret(database_, "SELECT 1 FROM members WHERE task = ? AND instr(value, ?) LIMIT 1");
+    if (secret.Bind(id).Bind(kSecret).Step()) {
+      database_.MarkErasure();
+    }
     Statement(database_, "DELETE FROM members WHERE task = ?").Bind(id).Step();
     Statement(database_, "DELETE FROM tasks WHERE id = ?").Bind(id).Step();
   });
@@ -203,6 +219,7 @@ void TaskStore::NoteStop(pid_t pid) {
 
 void TaskStore::NoteEnd(pid_t pid) {
   Statement(database_, "UPDATE workers SET ended = 1 WHERE pid = ?").Bind(std::int64_t{pid}).Step();
+  database_.EraseMarked();  // this process may have been the one that read
 }
 
 std::vector<pid_t> TaskStore::AllWorkers() {

@@ -103,6 +103,7 @@ class TaskStore {
   void WriteProperty(TaskRow& row, const std::string& name, StoredValue value);
   void WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
                    const std::string* text);
+  void MarkIfSecret(const std::string& lost);
 
   Database database_;
 };
