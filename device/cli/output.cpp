@@ -18,8 +18,6 @@ class Output : public std::stringbuf {
  public:
   Output() : std::stringbuf(std::ios::out), replaced_(std::cout.rdbuf(this)) {}
   ~Output() override { std::cout.rdbuf(replaced_); }
-  Output(const Output&) = delete;
-  Output& operator=(const Output&) = delete;
 
   int Error() const { return error_; }
 
