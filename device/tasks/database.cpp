@@ -153,6 +153,7 @@ void Database::EraseMarked() {
       return;
     }
     // Pages have copies of rows that were moved within them, also with "secure_delete".
+    // Rows of a table without a key of its own may get other numbers, if some were ever removed.
     Execute("VACUUM");
     if (EmptyLog()) {
       InTransaction(true, [&] {
