@@ -120,6 +120,25 @@ TEST_F(ArchiverTest, EncryptsWithThePasswordWhateverItHolds) {
   }
 }
 
+TEST_F(ArchiverTest, UpdatesAProtectedArchiveWithItsOwnPasswordAlone) {
+  WriteFile(share / "b", "b");
+  for (const char* page : {static_cast<const char*>(nullptr), "", "CP932"}) {
+    fs::remove(out / "z");
+    Good("z", {"a"}, {"a", "", "first", page});
+    const std::string old = ReadFile(out / "z");
+    for (const char* actions : {"", "-up1q1r0x1y2z1w2", "-up1q0r2x1y2z1w2"}) {
+      const std::string command = *actions == 0 ? "a" : "u";
+      for (const char* password : {"", "other"}) {
+        Bad("z", {"a", "b"}, "password", {command, actions, password, page});
+      }
+    }
+    EXPECT_EQ(ReadFile(out / "z"), old);
+    Good("z", {"b"}, {"u", "", "first", page});
+    EXPECT_EQ(RunProgram({"/usr/bin/7z", "t", "-pfirst", out / "z"}).status, 0);
+    EXPECT_EQ(InOut(), Strings{"z"});
+  }
+}
+
 TEST_F(ArchiverTest, NamesWhatIsMissingAndLeavesTheOldArchive) {
   Good("old", {"a"});
   const std::string old = ReadFile(out / "old");

@@ -1,109 +1,26 @@
 #include "device/archiver/archive_job.h"
 
-#include <fcntl.h>
-#include <sys/mman.h>
-#include <sys/stat.h>
-
 #include <algorithm>
-#include <array>
-#include <cerrno>
 #include <iterator>
 #include <set>
 #include <unordered_set>
 #include <utility>
 
 #include "device/archiver/failure.h"
+#include "device/archiver/job.h"
 #include "device/archiver/list_file.h"
+#include "device/archiver/old_archive.h"
+#include "device/archiver/output_of_7z.h"
 #include "device/archiver/special_files.h"
 #include "device/archiver/stock_7z.h"
 #include "device/archiver/switches.h"
-#include "device/archiver/target.h"
 #include "device/archiver/work_place.h"
-#include "device/archiver/zip_program.h"
 #include "device/base/code_page.h"
-#include "device/base/fence.h"
 #include "device/base/file_io.h"
 #include "device/base/open_below.h"
-#include "device/base/work_folder.h"
 
 namespace Archiver {
 namespace {
-
-constexpr mode_t kFileMode = 0666;  // the umask takes its share
-
-Device::WorkFolder MakeWorkFolder(const Target& target, const std::string& name) {
-  try {
-    return Device::WorkFolder(target.Folder(), name);
-  } catch (const std::system_error& error) {
-    throw SystemFailure("cannot make a temporary folder beside", target.Path(),
-                        error.code().value());
-  }
-}
-
-// A job while it runs: what it holds, and what the programs that it starts may reach.
-struct Job {
-  Job(const Request& asked, const Device::ArchiverCall& call, const Cancel& stop, Report& lines)
-      : request(asked),
-        cancel(stop),
-        report(lines),
-        target(asked.archive, call.fixed_folders),
-        work(MakeWorkFolder(target, call.work_folder)),
-        zip_program(call.zip_program) {
-    fence.AllowWriting(work.Get());
-    fence.AllowRunning(zip_program);
-    if (target.Old()) {
-      fence.AllowReading(target.Old().Get());
-    }
-  }
-
-  // The new archive, as the programs know it.
-  std::string Result() const { return Device::PathOf(work.Get()) + "/" + Device::kWorkResult; }
-  std::string Old() const { return Device::PathOf(target.Old().Get()); }
-
-  const Request& request;
-  const Cancel& cancel;
-  Report& report;
-  const Target target;
-  const Device::WorkFolder work;
-  const int zip_program;
-  Device::Fence fence;
-};
-
-// A program of the job's, as far as all are alike.
-Device::ProgramStart ProgramOf(const Job& job) {
-  Device::ProgramStart start;
-  start.folder = job.work.Get();
-  start.kept = {job.work.Get()};
-  if (job.target.Old()) {
-    start.kept.push_back(job.target.Old().Get());
-  }
-  start.fence = &job.fence;
-  return start;
-}
-
-Device::FileDescriptor Open(const std::string& path, int flags) {
-  Device::FileDescriptor fd(open(path.c_str(), flags | O_CLOEXEC, kFileMode));
-  if (!fd) {
-    throw SystemFailure("cannot open", path, errno);
-  }
-  return fd;
-}
-
-void CopyOldArchive(const Job& job) {
-  const std::string& name = job.target.Path();
-  const Device::FileDescriptor in = Open(job.Old(), O_RDONLY);
-  const Device::FileDescriptor out = Open(job.Result(), O_WRONLY | O_CREAT | O_EXCL);
-  std::array<char, 65536> block{};
-  while (const ssize_t size = read(in.Get(), block.data(), block.size())) {
-    job.cancel.Check();
-    if (size < 0) {
-      throw SystemFailure("cannot read", name, errno);
-    }
-    if (!Device::WriteAll(out.Get(), {block.data(), static_cast<size_t>(size)})) {
-      throw SystemFailure("cannot write a copy of", name, errno);
-    }
-  }
-}
 
 std::vector<std::string> Sources(const Request& request) {
   std::vector<std::string> sources =
@@ -122,35 +39,6 @@ std::vector<std::string> Filter(const std::vector<std::string>& sources, IsWante
   return result;
 }
 
-// An unnamed file that holds the text, positioned at its start.
-Device::FileDescriptor UnnamedFile(const std::string& text) {
-  Device::FileDescriptor fd(memfd_create("kavo-7z", MFD_CLOEXEC));
-  if (!fd || !Device::WriteAll(fd.Get(), text) || lseek(fd.Get(), 0, SEEK_SET) != 0) {
-    throw SystemFailure("cannot write", "unnamed file for 7z", errno);
-  }
-  return fd;
-}
-
-// A standard input for 7z that answers its questions for the password; invalid when there is none.
-Device::FileDescriptor PasswordInput(const Request& request) {
-  if (request.password.empty()) {
-    return Device::FileDescriptor();
-  }
-  // It asks once to open an old archive and once to encrypt new files.
-  const std::string answer = request.password + '\n';
-  return UnnamedFile(answer + answer);
-}
-
-// What kavo-zip says of an archive, or does with it; see there.
-bool RunZip(const Job& job, const std::string& command, const std::string& archive) {
-  const Device::FileDescriptor password = UnnamedFile(job.request.password);
-  Device::ProgramStart start = ProgramOf(job);
-  start.program = Device::PathOf(job.zip_program);
-  start.arguments = {"kavo-zip", command, archive, job.request.code_page};
-  start.input = password.Get();
-  return RunZipProgram(start, job.target.Path(), job.cancel);
-}
-
 // 7z knows the archives by their descriptors alone; whoever reads an error knows the name.
 std::string WithArchiveNamed(std::string text, const PackRun& run, const std::string& name) {
   for (const std::string& path : {run.new_archive, run.archive}) {
@@ -159,6 +47,22 @@ std::string WithArchiveNamed(std::string text, const PackRun& run, const std::st
     }
   }
   return text;
+}
+
+void ReportEvents(const std::vector<Event>& events, Report& report) {
+  for (const Event& event : events) {
+    switch (event.kind) {
+      case Event::Kind::kTotal:
+        report.Total(event.value);
+        break;
+      case Event::Kind::kFile:
+        report.Compressing(event.name);
+        break;
+      case Event::Kind::kPercent:
+        report.Progress(event.value);
+        break;
+    }
+  }
 }
 
 void Pack(Job& job, PackRun run, const Device::FileDescriptor& folder) {
@@ -174,8 +78,10 @@ void Pack(Job& job, PackRun run, const Device::FileDescriptor& folder) {
   start.folder = folder.Get();
   start.input = password.Get();
   start.kept.insert(start.kept.end(), {sources.Get(), left_out.Get()});
+  OutputParser parser;
   try {
-    Run7z(start, run.left_out_links, job.cancel, job.report);
+    Run7z(start, run.left_out_links, job.cancel,
+          [&](const std::string& bytes) { ReportEvents(parser.Feed(bytes), job.report); });
   } catch (const Failure& failure) {
     throw Failure(WithArchiveNamed(failure.what(), run, job.target.Path()));
   }
@@ -216,22 +122,6 @@ void PackWithSpecials(Job& job, const WorkPlace& place, PackRun run,
   }
 }
 
-// What 7z is to begin with: nothing, the archive that stands there, or, where names in it have to
-// be changed first, a copy of it.
-void PrepareArchive(Job& job, PackRun& run) {
-  run.archive = job.Result();
-  if (!job.target.Old()) {
-    return;
-  }
-  if (job.request.zip && !RunZip(job, kZipCheck, job.Old())) {
-    CopyOldArchive(job);
-    RunZip(job, kZipToUtf8, job.Result());
-  } else {
-    run.archive = job.Old();
-    run.new_archive = job.Result();
-  }
-}
-
 }  // namespace
 
 Device::FileDescriptor PackArchive(const Request& request, const Device::ArchiverCall& call,
@@ -261,7 +151,7 @@ Device::FileDescriptor PackArchive(const Request& request, const Device::Archive
     PackWithSpecials(job, place, run, left_out, sources, suspects);
   }
   if (recode) {
-    RunZip(job, kZipToCodePage, job.Result());
+    PutNamesIntoCodePage(job);
   }
   cancel.Check();
   return job.target.Publish(job.work.Get());

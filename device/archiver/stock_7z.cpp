@@ -50,25 +50,8 @@ std::string ReadSome(Device::FileDescriptor& fd) {
   return {buffer.data(), static_cast<size_t>(size)};
 }
 
-void ReportEvents(const std::vector<Event>& events, Report& report) {
-  for (const Event& event : events) {
-    switch (event.kind) {
-      case Event::Kind::kTotal:
-        report.Total(event.value);
-        break;
-      case Event::Kind::kFile:
-        report.Compressing(event.name);
-        break;
-      case Event::Kind::kPercent:
-        report.Progress(event.value);
-        break;
-    }
-  }
-}
-
 void Drain(Device::FileDescriptor& output, Device::FileDescriptor& errors, ErrorText* text,
-           const Cancel& cancel, Report& report) {
-  OutputParser parser;
+           const Cancel& cancel, const OutputReader& reader) {
   while ((output || errors) && !text->HasWarning()) {
     pollfd watched[] = {{output.Get(), POLLIN, 0},
                         {errors.Get(), POLLIN, 0},
@@ -82,7 +65,7 @@ void Drain(Device::FileDescriptor& output, Device::FileDescriptor& errors, Error
       text->Feed(ReadSome(errors));
     }
     if (watched[0].revents != 0) {
-      ReportEvents(parser.Feed(ReadSome(output)), report);
+      reader(ReadSome(output));
     }
   }
 }
@@ -98,7 +81,7 @@ Device::ChildProcess StartOrFail(const Device::ProgramStart& start) {
 }  // namespace
 
 void Run7z(Device::ProgramStart start, const std::set<std::string>& left_out, const Cancel& cancel,
-           Report& report) {
+           const OutputReader& reader) {
   Device::Pipe output;
   Device::Pipe errors;
   start.output = output.writer.Get();
@@ -109,7 +92,7 @@ void Run7z(Device::ProgramStart start, const std::set<std::string>& left_out, co
   output.writer.Close();
   errors.writer.Close();
   ErrorText text(left_out);
-  Drain(output.reader, errors.reader, &text, cancel, report);
+  Drain(output.reader, errors.reader, &text, cancel, reader);
   if (text.HasWarning()) {
     throw Failure("not everything can be packed: " + text.Line());
   }

@@ -13,8 +13,6 @@
 namespace Archiver {
 namespace {
 
-constexpr char kCannotUpdate[] = "cannot update archive";
-
 // To the end of the stream.
 std::string ReadReason(const Device::FileDescriptor& errors, const Cancel& cancel) {
   std::string text;

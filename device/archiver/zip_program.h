@@ -20,6 +20,8 @@ inline constexpr char kZipCheck[] = "check";
 inline constexpr char kZipToUtf8[] = "to-utf8";
 inline constexpr char kZipToCodePage[] = "to-code-page";
 
+inline constexpr char kCannotUpdate[] = "cannot update archive";
+
 inline constexpr int kZipYes = 0;
 inline constexpr int kZipNo = 1;
 inline constexpr int kZipFailed = 2;  // the reason stands on standard error
