@@ -45,7 +45,7 @@ bool RunZipProgram(Device::ProgramStart start, const std::string& name, const Ca
     errors.writer.Close();
     const std::string reason = ReadReason(errors.reader, cancel);
     const int status = process.Wait();
-    if (WIFEXITED(status) && WEXITSTATUS(status) < kZipFailed) {
+    if (WIFEXITED(status) && (WEXITSTATUS(status) == kZipYes || WEXITSTATUS(status) == kZipNo)) {
       return WEXITSTATUS(status) == kZipYes;
     }
     cancel.Check();

@@ -23,8 +23,8 @@ inline constexpr char kZipToCodePage[] = "to-code-page";
 inline constexpr char kCannotUpdate[] = "cannot update archive";
 
 inline constexpr int kZipYes = 0;
-inline constexpr int kZipNo = 1;
-inline constexpr int kZipFailed = 2;  // the reason stands on standard error
+inline constexpr int kZipFailed = 1;  // the reason stands on standard error
+inline constexpr int kZipNo = 2;
 
 // Runs it to its end; true for kZipYes. Throws Failure with the reason and the archive's `name`,
 // and Cancelled when the job is to stop; the program is gone in each case.

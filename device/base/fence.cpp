@@ -38,9 +38,15 @@ constexpr std::uint64_t kFileRights =
     LANDLOCK_ACCESS_FS_READ_FILE | LANDLOCK_ACCESS_FS_EXECUTE | LANDLOCK_ACCESS_FS_WRITE_FILE;
 
 constexpr const char* kSystemPrograms[] = {"/usr/bin", "/usr/lib", "/usr/lib64", "/lib", "/lib64"};
-constexpr const char* kSystemTables[] = {"/etc/ld.so.cache", "/etc/localtime",
-                                         "/usr/share/zoneinfo", "/usr/share/locale",
-                                         "/sys/devices/system/cpu"};
+constexpr const char* kSystemTables[] = {
+#ifdef __SANITIZE_ADDRESS__
+    "/proc",  // where the sanitizer reads about its own process
+#endif
+    "/etc/ld.so.cache",
+    "/etc/localtime",
+    "/usr/share/zoneinfo",
+    "/usr/share/locale",
+    "/sys/devices/system/cpu"};
 
 // 0 where there is none.
 int Version() {
