@@ -14,8 +14,8 @@
 #include "device/archiver/list_file.h"
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/host/body.h"
 #include "device/model/config.h"
-#include "device/web/body.h"
 
 namespace {
 
@@ -66,7 +66,7 @@ void SourceList(const std::string& input) try {
 void RequestBody(const std::string& input) try {
   const char* const type =
       input.find('=') < input.find('{') ? "application/x-www-form-urlencoded" : "";
-  const Json::Value body = Web::ParseBody(type, input);
+  const Json::Value body = Device::ParseBody(type, input);
   Require(body.isObject(), "a body is an object");
   Require(Device::ParseJson(Device::ToText(body)) == body, "what is sent on comes back");
 } catch (const std::runtime_error& error) {

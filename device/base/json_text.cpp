@@ -6,6 +6,7 @@
 #include <memory>
 #include <stdexcept>
 
+#include "device/base/shortage.h"
 #include "device/base/utf8.h"
 
 namespace Device {
@@ -47,6 +48,7 @@ const Json::StreamWriterBuilder& LineWriter() {
 void CheckBytes(const std::string& text, int most_depth) {
   unsigned long line = 1;
   std::size_t line_begin = 0;
+  std::size_t values = 1;
   int depth = 0;
   bool is_in_string = false;
   for (std::size_t at = 0; at < text.size(); ++at) {
@@ -61,6 +63,8 @@ void CheckBytes(const std::string& text, int most_depth) {
       is_in_string = !is_in_string;
     } else if (is_in_string) {
       at += byte == '\\' ? 1 : 0;
+    } else if ((byte == ',' || byte == '[' || byte == '{') && ++values > kMostValues) {
+      ThrowMemoryShortage();
     } else if ((byte == '[' || byte == '{') && ++depth > most_depth) {
       Fail(line, column, "nested too deep");
     } else if (byte == ']' || byte == '}') {
@@ -117,16 +121,20 @@ Json::Value ParseJson(const std::string& text, int depth) {
   const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
   Json::Value value;
   std::string errors;
-  if (!reader->parse(text.data(), text.data() + text.size(), &value, &errors)) {
-    FailFor(errors);
+  try {
+    if (!reader->parse(text.data(), text.data() + text.size(), &value, &errors)) {
+      FailFor(errors);
+    }
+  } catch (const Json::RuntimeError&) {  // what the library says when it has no memory
+    ThrowMemoryShortage();
   }
   return value;
 }
 
-std::string DecodeByteEscapes(const std::string& json) {
+std::string DecodeByteEscapes(std::string json) {
   constexpr std::size_t kDigits = 4;
   constexpr std::size_t kEscape = 2 + kDigits;  // "\\udc80"
-  std::string decoded;
+  std::size_t decoded = 0;                       // bytes, in place
   for (std::size_t at = 0; at < json.size();) {
     std::size_t length = json[at] == '\\' ? 2 : 1;  // as it stands
     if (json.compare(at, 2, "\\u") == 0 && at + kEscape <= json.size()) {
@@ -134,16 +142,18 @@ std::string DecodeByteEscapes(const std::string& json) {
       unsigned code = 0;
       const auto [end, error] = std::from_chars(digits, digits + kDigits, code, kHexBase);
       if (end == digits + kDigits && code >= 0xDC80 && code <= 0xDCFF) {
-        decoded += static_cast<char>(code - 0xDC00);
+        json[decoded++] = static_cast<char>(code - 0xDC00);
         at += kEscape;
         continue;
       }
       length = code >= 0xD800 && code <= 0xDBFF ? 2 * kEscape : kEscape;  // a pair stays together
     }
-    decoded.append(json, at, length);
-    at += length;
+    for (; length > 0 && at < json.size(); --length) {
+      json[decoded++] = json[at++];
+    }
   }
-  return decoded;
+  json.resize(decoded);
+  return json;
 }
 
 }  // namespace Device

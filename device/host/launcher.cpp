@@ -14,6 +14,7 @@
 #include "device/base/child_process.h"
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/base/shortage.h"
 #include "device/host/sessions.h"
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
@@ -79,6 +80,8 @@ Launcher::Launcher(WorkerLog worker_log)
   };
   TheHost().leave_request = [this, worker_log] {
     answer_.Close();
+    LiftMemoryLimit();
+    Database::SetPatience(Database::kLongPatience);
     if (worker_log == WorkerLog::kSyslogOnly && IsStandardErrorRead()) {
       dup2(STDOUT_FILENO, STDERR_FILENO);  // /dev/null
     }
@@ -123,6 +126,9 @@ Outcome Launcher::CallHere(const Request& request) {
 Outcome Launcher::CallSafely(const Request& request) {
   try {
     return CallHere(request);
+  } catch (const Json::RuntimeError& error) {  // the library has no memory
+    TheShortage() = Shortage::kMemory;
+    return {KAVO::kErrInternal, Json::Value()};
   } catch (const Json::Exception& error) {
     syslog(LOG_ERR, "%s: %s", request.method.c_str(), error.what());
     return {KAVO::kErrBadParameter, Json::Value()};

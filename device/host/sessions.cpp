@@ -5,8 +5,10 @@
 
 #include <algorithm>
 #include <atomic>
+#include <functional>
 #include <memory>
 #include <new>
+#include <vector>
 
 #include "device/base/file_descriptor.h"
 #include "device/base/random_id.h"
@@ -20,7 +22,6 @@ constexpr int kSessionIdWords = 4;
 constexpr std::size_t kMostSessions = 16;  // of one user
 constexpr int kFreeTries = 10;
 constexpr std::chrono::seconds kLongestWait(60);
-// In place of that of a user who is not there; no password has it.
 constexpr char kNobodysHash[] = "$6$nobody$";
 
 using Flag = std::atomic<bool>;
@@ -84,19 +85,38 @@ std::string UserOfSession(const std::string& session_id) {
   return found == sessions.end() || *found->second.has_ended ? "" : found->second.user;
 }
 
+namespace {
+
+// In place of that of a user who is not there: one that costs what looking at a user's does.
+std::string HashFor(const std::string& name) {
+  std::vector<std::string> hashes;
+  for (const User& user : TheDevice().config.users) {
+    if (!user.password.empty()) {
+      hashes.push_back(user.password);
+    }
+  }
+  return hashes.empty() ? kNobodysHash : hashes[std::hash<std::string>()(name) % hashes.size()];
+}
+
+}  // namespace
+
 bool IsPassword(const std::string& user, const std::string& password) {
   const User* const known = TheDevice().config.FindUser(user);
   const bool has_password = known != nullptr && !known->password.empty();
-  const std::string hash = has_password ? known->password : kNobodysHash;
+  const std::string hash = has_password ? known->password : HashFor(user);
   const auto data = std::make_unique<crypt_data>();
   const char* const result = crypt_r(password.c_str(), hash.c_str(), data.get());
   const bool is_whole = password.find('\0') == std::string::npos;  // crypt_r reads no further
   return has_password && is_whole && result != nullptr && hash == result;
 }
 
+std::size_t SignInGate::CountOf(const std::string& user) {
+  constexpr std::size_t kCounts = std::size_t{1} << 16U;
+  return std::hash<std::string>()(user) % kCounts;
+}
+
 std::chrono::seconds SignInGate::Try(const std::string& user, Clock::time_point now) {
-  // Names that nobody has share one count, so that made-up ones take no room.
-  Tries& tries = tries_[TheDevice().config.FindUser(user) != nullptr ? user : ""];
+  Tries& tries = tries_[CountOf(user)];
   if (now < tries.open_again) {
     return std::chrono::ceil<std::chrono::seconds>(tries.open_again - now);
   }

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <chrono>
+#include <cstddef>
 #include <map>
 #include <string>
 
@@ -22,22 +23,25 @@ std::string UserOfSession(const std::string& session_id);
 // True if the password is the user's. Takes as long for a user that is not there.
 bool IsPassword(const std::string& user, const std::string& password);
 
-// Slows down who tries passwords: after ten wrong ones in a row a user's sign-in is open again only
-// after a while, which doubles each time.
+// Slows down who tries passwords: after ten wrong ones in a row the sign-in under that name is open
+// again only after a while, which doubles each time. It does not know which names there are: names
+// share so many counts, each by its hash, that made-up ones take no room.
 class SignInGate {
  public:
   using Clock = std::chrono::steady_clock;
 
   // To be called before a password is looked at: 0, or how long to wait before the next try.
   std::chrono::seconds Try(const std::string& user, Clock::time_point now);
-  void Succeeded(const std::string& user) { tries_.erase(user); }
+  void Succeeded(const std::string& user) { tries_.erase(CountOf(user)); }
 
  private:
   struct Tries {
     int count = 0;
     Clock::time_point open_again;
   };
-  std::map<std::string, Tries> tries_;
+  static std::size_t CountOf(const std::string& user);
+
+  std::map<std::size_t, Tries> tries_;
 };
 
 }  // namespace Device

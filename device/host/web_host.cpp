@@ -11,6 +11,7 @@
 #include <chrono>
 #include <cstring>
 #include <iostream>
+#include <memory>
 #include <stdexcept>
 #include <system_error>
 #include <utility>
@@ -29,9 +30,9 @@ namespace {
 
 constexpr char kFrontEndProgram[] = "kavo-web";
 constexpr char kPageFolder[] = "page";
-constexpr std::size_t kMostRequests = 384;  // at the same time; further ones wait
 constexpr int kRestartPauseMs = 500;
 constexpr std::chrono::seconds kFrontEndGrace(6);
+constexpr char kRetrySeconds[] = "10";
 
 // A lock that belongs to this process alone: no worker takes it along.
 FileDescriptor LockDevice() {
@@ -66,6 +67,9 @@ void RemoveLeftoversOfAll() {
   }
 }
 
+// Of a client who is not signed in, told apart from a user's name.
+std::string AddressOf(const Json::Value& asked) { return "address " + asked["client"].asString(); }
+
 }  // namespace
 
 FrontEndFiles::FrontEndFiles()
@@ -92,8 +96,7 @@ WebHost::~WebHost() { EndFrontEnd(); }
 bool WebHost::Run() {
   StartFrontEnd();
   for (;;) {
-    const bool has_room = requests_.size() + checks_.size() < kMostRequests;
-    pollfd sources[] = {{signals_.Get(), POLLIN, 0}, {has_room ? control_.Get() : -1, POLLIN, 0}};
+    pollfd sources[] = {{signals_.Get(), POLLIN, 0}, {control_.Get(), POLLIN, 0}};
     poll(sources, std::size(sources), -1);
     if (sources[0].revents != 0 && !TakeSignal()) {
       return true;
@@ -153,7 +156,7 @@ pid_t WebHost::Fork(const std::function<int()>& body) {
              control_.Close();
              signals_.Close();
              lock_.Close();
-             requests_.clear();
+             queue_.Clear();
              checks_.clear();
              sigprocmask(SIG_SETMASK, &saved_mask_, nullptr);
              return body();
@@ -192,7 +195,7 @@ void WebHost::Serve(ControlMessage& message) {
       }
       break;
     case ControlKind::kRequest:
-      TakeRequest(std::move(message.stream));
+      TakeRequest(message.text, std::move(message.stream));
       break;
     case ControlKind::kSignIn:
       TakeSignIn(message.text, std::move(message.stream));
@@ -203,20 +206,40 @@ void WebHost::Serve(ControlMessage& message) {
   }
 }
 
-void WebHost::TakeRequest(FileDescriptor stream) {
-  const pid_t pid = Fork([&] {
-    ServeWebRequest(launcher_, std::move(stream));
-    return 0;
-  });
-  if (pid > 0) {
-    requests_.insert(pid);
+void WebHost::TakeRequest(const std::string& text, FileDescriptor stream) {
+  Json::Value asked = ParseJson(text);
+  const std::string session = asked["session"].asString();
+  const std::string user = UserOfSession(session);
+  if (user.empty() && asked["kind"] != kKindCodes) {
+    SendAnswer(stream.Get(), Refusal(kHttpUnauthorized, "no session"));
+    return;
+  }
+  asked["followed"] = queue_.HasStream(session);
+  const std::string client = user.empty() ? AddressOf(asked) : "user " + user;
+  Enqueue({client, session, asked["kind"] == kKindEvents}, std::move(stream),
+          [this, asked](FileDescriptor& taken) {
+            return Fork([&] {
+              ServeWebRequest(launcher_, std::move(taken), asked);
+              return 0;
+            });
+          });
+}
+
+void WebHost::Enqueue(const Asker& asker, FileDescriptor stream,
+                      const std::function<pid_t(FileDescriptor&)>& start) {
+  const auto shared = std::make_shared<FileDescriptor>(std::move(stream));
+  if (!queue_.Add(asker, [=] { return start(*shared); })) {
+    Answer answer = Refusal(kHttpTooMany, asker.is_stream ? "too many event streams"
+                                                          : "too many requests at the same time");
+    answer.headers = {{"Retry-After", kRetrySeconds}};
+    SendAnswer(shared->Get(), answer);
   }
 }
 
 void WebHost::TakeSignIn(const std::string& text, FileDescriptor stream) {
   const Json::Value asked = ParseJson(text);
-  const std::string user = asked["user"].asString();
-  const std::chrono::seconds wait = gate_.Try(user, SignInGate::Clock::now());
+  const std::chrono::seconds wait =
+      gate_.Try(asked["user"].asString(), SignInGate::Clock::now());
   if (wait.count() > 0) {
     Answer answer = Refusal(kHttpTooMany, "too many wrong passwords");
     answer.headers = {{"Retry-After", std::to_string(wait.count())}};
@@ -224,10 +247,14 @@ void WebHost::TakeSignIn(const std::string& text, FileDescriptor stream) {
     return;
   }
   // Looking at a password takes its time, which is not the launcher's.
-  const pid_t pid = Fork([&] { return IsPassword(user, asked["password"].asString()) ? 0 : 1; });
-  if (pid > 0) {
-    checks_.emplace(pid, SignInCheck{user, std::move(stream)});
-  }
+  Enqueue({AddressOf(asked), "", false}, std::move(stream), [this, asked](FileDescriptor& taken) {
+    const std::string user = asked["user"].asString();
+    const pid_t pid = Fork([&] { return IsPassword(user, asked["password"].asString()) ? 0 : 1; });
+    if (pid > 0) {
+      checks_.emplace(pid, SignInCheck{user, std::move(taken)});
+    }
+    return pid;
+  });
 }
 
 void WebHost::TakeSignOut(const ControlMessage& message) {
@@ -272,9 +299,8 @@ void WebHost::TakeEndedChildren() {
       FinishSignIn(finished, ended.si_code == CLD_EXITED && ended.si_status == 0);
     } else if (pid == front_end_) {
       front_end_ = -1;  // its control socket tells the rest
-    } else {
-      requests_.erase(pid);  // or it was a worker: who reads its task sees what it has stored
     }
+    queue_.TakeEnd(pid);  // or it was a worker: who reads its task sees what it has stored
     ended.si_pid = 0;
   }
 }

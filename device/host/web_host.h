@@ -7,11 +7,11 @@
 #include <csignal>
 #include <functional>
 #include <map>
-#include <set>
 #include <string>
 
 #include "device/base/file_descriptor.h"
 #include "device/host/launcher.h"
+#include "device/host/request_queue.h"
 #include "device/host/sessions.h"
 #include "device/host/wire.h"
 
@@ -54,7 +54,10 @@ class WebHost {
   // False when the front end is gone.
   bool TakeMessage();
   void Serve(ControlMessage& message);
-  void TakeRequest(FileDescriptor stream);
+  void TakeRequest(const std::string& text, FileDescriptor stream);
+  // Has the process started that is to answer, or refuses the request.
+  void Enqueue(const Asker& asker, FileDescriptor stream,
+               const std::function<pid_t(FileDescriptor&)>& start);
   void TakeSignIn(const std::string& text, FileDescriptor stream);
   void TakeSignOut(const ControlMessage& message);
   void FinishSignIn(const SignInCheck& check, bool is_password);
@@ -74,7 +77,7 @@ class WebHost {
   Launcher launcher_;
   SignInGate gate_;
   std::map<pid_t, SignInCheck> checks_;
-  std::set<pid_t> requests_;
+  RequestQueue queue_;
 };
 
 }  // namespace Device

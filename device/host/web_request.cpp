@@ -2,18 +2,24 @@
 
 #include <syslog.h>
 
+#include <chrono>
+#include <csignal>
 #include <optional>
 #include <stdexcept>
 #include <utility>
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/base/shortage.h"
+#include "device/host/body.h"
 #include "device/host/file_listing.h"
 #include "device/host/sessions.h"
 #include "device/host/task_events.h"
 #include "device/host/wire.h"
 #include "device/model/device.h"
+#include "device/platform/host_services.h"
 #include "device/platform/lumo/errors.h"
+#include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
 #include "platform/lumo/file_manager.h"
 
@@ -21,23 +27,58 @@ namespace Device {
 
 namespace {
 
+constexpr std::size_t kMostMemory = std::size_t{48} << 20U;
+constexpr std::chrono::seconds kStorePatience(2);
+
 void TakeIdentity(const std::string& session_id, const std::string& user) {
   if (LumoLibUGIDSet(session_id.c_str(), user.c_str()) != 0) {
     throw std::runtime_error("cannot take on the identity of '" + user + "'");
   }
 }
 
-Answer CallApi(Launcher& launcher, const std::string& user, Json::Value& asked) {
+// What the client sends, in its time. Nothing when it breaks off.
+std::optional<std::string> ReceiveBody(int stream) {
+  SendAnswer(stream, Answer(kHttpContinue));
+  std::string body;
+  std::optional<std::string> part;
+  while ((part = ReadFrame(stream)) && !part->empty()) {
+    body += *part;
+  }
+  return part ? std::optional(std::move(body)) : std::nullopt;
+}
+
+Answer RefusalFor(Shortage shortage) {
+  if (TheHost().worker > 0) {
+    kill(TheHost().worker, SIGKILL);  // it waits for its task's data, which will not come
+  }
+  if (shortage == Shortage::kMemory) {
+    return Refusal(kHttpTooLarge, "the request takes too much memory");
+  }
+  Answer answer = Refusal(kHttpUnavailable, "the user's tasks are locked");
+  answer.headers = {{"Retry-After", "2"}};
+  return answer;
+}
+
+Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& asked,
+               std::string body) {
+  Json::Value call;
+  try {
+    call = ApiRequest(ParseBody(asked["type"].asString(), std::move(body)));
+  } catch (const std::runtime_error& error) {
+    return Refusal(kHttpBadRequest, error.what());
+  }
   Request request;
-  request.api = asked["api"].asString();
-  request.method = asked["method"].asString();
-  request.version = asked["version"].asInt();
-  request.params = std::move(asked["params"]);  // may be large, and a worker inherits it
+  request.api = call["api"].asString();
+  request.method = call["method"].asString();
+  request.version = call["version"].asInt();
+  request.params = std::move(call["params"]);  // may be large, and a worker inherits it
   request.is_followed = asked["followed"].asBool();
   request.user = user;
   request.session_id = asked["session"].asString();
   const Outcome outcome = launcher.CallSafely(request);
-  return Answer(kHttpOk, JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
+  return outcome.code != 0 && TheShortage() != Shortage::kNone
+             ? RefusalFor(TheShortage())
+             : Answer(kHttpOk, JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
 }
 
 Answer ListFiles(const std::string& user, const std::string& path) {
@@ -81,23 +122,27 @@ void StreamEvents(int stream, const std::string& user, const std::string& sessio
   }
 }
 
-void Serve(Launcher& launcher, Json::Value asked) {
+void Serve(Launcher& launcher, const Json::Value& asked) {
   const int stream = launcher.AnswerStream().Get();
   const std::string kind = asked["kind"].asString();
   const std::string session_id = asked["session"].asString();
+  std::optional<std::string> body;
+  if ((kind == kKindCall || kind == kKindFiles) && !(body = ReceiveBody(stream))) {
+    return;
+  }
   const std::string user = UserOfSession(session_id);
   if (kind == kKindCodes) {
     SendAnswer(stream, ListCodes());
   } else if (user.empty()) {
     SendAnswer(stream, Refusal(kHttpUnauthorized, "no session"));
   } else if (kind == kKindCall) {
-    SendAnswer(stream, CallApi(launcher, user, asked));
+    SendAnswer(stream, CallApi(launcher, user, asked, std::move(*body)));
   } else if (kind == kKindSession) {
     SendAnswer(stream, Answer(kHttpOk, SessionBody(user)));
   } else {
     TakeIdentity(session_id, user);
     if (kind == kKindFiles) {
-      SendAnswer(stream, ListFiles(user, asked["path"].asString()));
+      SendAnswer(stream, ListFiles(user, *body));
     } else if (kind == kKindTasks) {
       SendAnswer(stream, ListTasks(user));
     } else {
@@ -112,18 +157,21 @@ Json::Value SessionBody(const std::string& user) {
   return JsonObject({{"user", user}, {"codepage", TheDevice().config.FindUser(user)->codepage}});
 }
 
-void ServeWebRequest(Launcher& launcher, FileDescriptor stream) {
+void ServeWebRequest(Launcher& launcher, FileDescriptor stream, const Json::Value& asked) {
   launcher.AnswerStream() = std::move(stream);
   const int answer = launcher.AnswerStream().Get();
   try {
-    if (std::optional<std::string> text = ReadFrame(answer)) {
-      Json::Value asked = ParseJson(*text);
-      text.reset();  // it may be large
-      Serve(launcher, std::move(asked));
-    }
+    LimitMemory(kMostMemory);
+    Database::SetPatience(kStorePatience);
+    Serve(launcher, asked);
   } catch (const std::exception& error) {
+    if (dynamic_cast<const Json::RuntimeError*>(&error) != nullptr) {
+      TheShortage() = Shortage::kMemory;  // so the library says it
+    }
     syslog(LOG_ERR, "web request: %s", error.what());
-    SendAnswer(answer, Refusal(kHttpInternal, "the device cannot answer: see its log"));
+    SendAnswer(answer, TheShortage() != Shortage::kNone
+                           ? RefusalFor(TheShortage())
+                           : Refusal(kHttpInternal, "the device cannot answer: see its log"));
   }
   CloseStores();
 }

@@ -2,16 +2,17 @@
 //
 // The front end sends the launcher control messages over a socket of sequenced packets (its
 // standard input): a kind, a text, and the end of a stream for the answer. Everything on that
-// stream is a frame (base/file_io.h). A request goes there as a frame of JSON, {"kind", "session",
-// ...}; what comes back is an answer, made into text by who knows it and passed through to the
-// client:
+// stream is a frame (base/file_io.h). What comes back is an answer, made into text by who knows it
+// and passed through to the client:
 //
 //     STATUS \n
 //     NAME: VALUE \n        any number of HTTP headers
 //     \n
 //     BODY                  as the client gets it
 //
-// An answer to kKindEvents is followed by frames of server-sent events, as the client gets them.
+// Of a request with a body the first answer may have the status 100: it is the request's turn. Then
+// the body goes there as it came, in frames that an empty one ends, and the answer comes. An answer
+// to kKindEvents is followed by frames of server-sent events, as the client gets them.
 #pragma once
 
 #include <json/json.h>
@@ -27,12 +28,14 @@
 namespace Device {
 
 enum HttpStatus : int {
+  kHttpContinue = 100,
   kHttpOk = 200,
   kHttpNoContent = 204,
   kHttpBadRequest = 400,
   kHttpUnauthorized = 401,
   kHttpForbidden = 403,
   kHttpNotFound = 404,
+  kHttpTimeout = 408,
   kHttpTooLarge = 413,
   kHttpNotDecoded = 415,
   kHttpTooMany = 429,
@@ -45,8 +48,8 @@ inline constexpr std::size_t kMostControlBytes = 8192;
 
 enum class ControlKind : char {
   kListening = 'l',  // text: ADDRESS:PORT; no stream
-  kRequest = 'r',    // the request comes as a frame on the stream; a process of its own reads it
-  kSignIn = 'i',     // text: {"user","password"}
+  kRequest = 'r',    // text: {"kind","session","client"}, and what the kind needs
+  kSignIn = 'i',     // text: {"user","password","client"}
   kSignOut = 'o'     // text: the session's id
 };
 
@@ -62,10 +65,10 @@ bool SendControl(int socket, ControlKind kind, const std::string& text, int stre
 // Nothing when the other side is gone, or what came is no message.
 std::optional<ControlMessage> ReceiveControl(int socket);
 
-// What a request's frame asks for, by its "kind"; beside it "session" and what the kind needs.
-inline constexpr char kKindCall[] = "call";  // "api", "version", "method", "params", "followed"
+// What a request asks for, by its "kind"; "client" is the address that it comes from.
+inline constexpr char kKindCall[] = "call";        // "type", the body's; body: the API's request
 inline constexpr char kKindSession[] = "session";  // who is signed in
-inline constexpr char kKindFiles[] = "files";      // "path"
+inline constexpr char kKindFiles[] = "files";      // body: the path
 inline constexpr char kKindTasks[] = "tasks";
 inline constexpr char kKindEvents[] = "events";
 inline constexpr char kKindCodes[] = "codes";  // no session needed

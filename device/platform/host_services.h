@@ -2,6 +2,8 @@
 // this in when it is made. Until then no session is taken for a living one.
 #pragma once
 
+#include <sys/types.h>
+
 #include <functional>
 #include <string>
 
@@ -13,6 +15,8 @@ struct HostServices {
       [](const std::string&, const std::string&) { return false; };
   // Called in a worker's process when it has been forked: lets go of what belongs to the request.
   std::function<void()> leave_request = [] {};
+  // The worker that this request has forked; 0: none.
+  pid_t worker = 0;
   // Whether the desktop is to be told of the end of the tasks that the process makes.
   bool notifies_desktop = true;
 };

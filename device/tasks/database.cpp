@@ -10,15 +10,17 @@
 #include <stdexcept>
 #include <utility>
 
+#include "device/base/shortage.h"
+
 namespace Device {
 
 namespace {
 
-constexpr int kBusyTimeoutMs = 30000;  // longer than any transaction of another process
 constexpr int kEraseTimeoutMs = 100;
 // The number in the file's header that is an application's own. Each erasure that is asked for
 // makes it greater by one; when it is done, the number is negative.
 constexpr char kMark[] = "PRAGMA application_id";
+std::chrono::milliseconds the_patience = Database::kLongPatience;
 
 ino_t FileOf(const std::string& path) {
   struct stat status {};
@@ -26,6 +28,10 @@ ino_t FileOf(const std::string& path) {
 }
 
 }  // namespace
+
+void Database::SetPatience(std::chrono::milliseconds patience) {
+  the_patience = patience;
+}
 
 Database::Database(std::string path, const char* schema, int version)
     : path_(std::move(path)), database_(nullptr, sqlite3_close) {
@@ -48,7 +54,7 @@ void Database::Open() {
                                      SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE, nullptr);
   database_.reset(database);
   Check(result);
-  sqlite3_busy_timeout(database, kBusyTimeoutMs);
+  sqlite3_busy_timeout(database, static_cast<int>(the_patience.count()));
   // Requests come and go: each one that is alone for a moment would write everything back and wait
   // for the disk. The log is written back when it has grown to so many pages that reading it again,
   // which the next request that is alone does, begins to cost.
@@ -90,6 +96,12 @@ void Database::MakeSchema(const char* schema, int version) {
 void Database::Check(int result) {
   if (result == SQLITE_OK) {
     return;
+  }
+  if (result == SQLITE_NOMEM) {
+    ThrowMemoryShortage();
+  }
+  if (result == SQLITE_BUSY) {
+    TheShortage() = Shortage::kStore;
   }
   const std::string reason = sqlite3_errmsg(database_.get());
   if (result == SQLITE_CORRUPT || result == SQLITE_NOTADB) {
@@ -139,7 +151,7 @@ bool Database::EmptyLog() {
   sqlite3_busy_timeout(database_.get(), kEraseTimeoutMs);
   const int result = sqlite3_wal_checkpoint_v2(database_.get(), nullptr, SQLITE_CHECKPOINT_TRUNCATE,
                                                nullptr, nullptr);
-  sqlite3_busy_timeout(database_.get(), kBusyTimeoutMs);
+  sqlite3_busy_timeout(database_.get(), static_cast<int>(the_patience.count()));
   if (result != SQLITE_BUSY) {
     Check(result);
   }

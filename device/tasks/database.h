@@ -5,6 +5,7 @@
 #include <sqlite3.h>
 #include <sys/types.h>
 
+#include <chrono>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -17,6 +18,12 @@ namespace Device {
 // line of the log; the next to open it begins anew.
 class Database {
  public:
+  // Longer than any transaction of another process takes.
+  static constexpr std::chrono::seconds kLongPatience{30};
+  // How long this process's next connections wait for such a transaction, at first so long. When
+  // that is not enough, TheShortage tells.
+  static void SetPatience(std::chrono::milliseconds patience);
+
   // `version` is the schema's, above 0.
   Database(std::string path, const char* schema, int version);
 

@@ -4,8 +4,6 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include "device/base/file_io.h"
-#include "device/base/json_text.h"
 
 namespace Web {
 
@@ -23,10 +21,6 @@ Exchange::Exchange(Device::ControlKind kind, const std::string& text) {
   stream_ = Device::FileDescriptor(ends[0]);
   const Device::FileDescriptor other_side(ends[1]);
   Device::SendControl(kControl, kind, text, other_side.Get());
-}
-
-Exchange::Exchange(const Json::Value& request) : Exchange(Device::ControlKind::kRequest, "") {
-  Device::WriteFrame(stream_.Get(), Device::ToText(request));
 }
 
 Device::Answer Exchange::Receive() {

@@ -1,12 +1,11 @@
 // One exchange of the front end with the launcher.
 #pragma once
 
-#include <json/json.h>
-
 #include <optional>
 #include <string>
 
 #include "device/base/file_descriptor.h"
+#include "device/base/file_io.h"
 #include "device/host/wire.h"
 
 namespace Web {
@@ -15,8 +14,9 @@ class Exchange {
  public:
   // Tells the launcher. Where that fails, no frame will come.
   Exchange(Device::ControlKind kind, const std::string& text);
-  // Tells the launcher to have the request served, and sends it.
-  explicit Exchange(const Json::Value& request);
+
+  // Sends a part of the body; an empty one ends it. What nobody reads any more is dropped.
+  void Send(const std::string& part) { Device::WriteFrame(stream_.Get(), part); }
 
   // The answer; the status 500 when the other side went without one.
   Device::Answer Receive();

@@ -7,8 +7,9 @@
 #include <stdexcept>
 
 #include "device/base/json_text.h"
-#include "device/web/body.h"
-#include "device/web/connection_threads.h"
+#include "device/host/body.h"
+#include "device/web/connection.h"
+#include "device/web/exchange.h"
 #include "device/web/request_head.h"
 
 namespace Web {
@@ -19,11 +20,12 @@ using httplib::Request;
 using httplib::Response;
 
 constexpr std::size_t kMostBodyBytes = std::size_t{8} << 20U;
-constexpr std::size_t kMostStrangersBytes = std::size_t{64} << 10U;  // of one without a session
+constexpr std::size_t kMostSignInBytes = std::size_t{64} << 10U;
 constexpr int kBacklog = 1024;
-constexpr int kReadTimeout = 10;  // seconds without a byte from a client
+constexpr std::chrono::seconds kAnswerTime(60);  // to take an answer, an event of a stream
 constexpr int kHeartbeatMs = 5000;
 constexpr std::chrono::seconds kEndGrace(5);
+constexpr std::size_t kMostTypeBytes = 100;  // of a Content-Type, for what it begins with
 constexpr char kJson[] = "application/json";
 constexpr char kPolicy[] =
     "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self'; connect-src 'self'; "
@@ -44,18 +46,22 @@ void Refuse(Response& response, int status, const std::string& reason) {
 }
 
 Json::Value Asked(const Request& request, const char* kind) {
-  return Device::JsonObject({{"kind", kind}, {"session", SessionOf(request)}});
+  return Device::JsonObject({{"kind", kind},
+                             {"session", SessionOf(request)},
+                             {"client", Connection::OfThisThread().Client()}});
 }
 
 // Has the request served by a process of the launcher's.
-void Serve(const Json::Value& asked, Response& response) {
-  Respond(response, Exchange(asked).Receive());
+Exchange Ask(const Json::Value& asked) {
+  return {Device::ControlKind::kRequest, Device::ToText(asked)};
 }
 
 const char* ReasonFor(int status) {
   switch (status) {
     case Device::kHttpNotFound:
       return "no such route";
+    case Device::kHttpTimeout:
+      return "the body takes too long";
     case Device::kHttpTooLarge:
       return "the body is too long";
     case Device::kHttpInternal:
@@ -65,43 +71,31 @@ const char* ReasonFor(int status) {
   }
 }
 
-// The body as it came: the library would cut a long form. False, with the response's status, when
-// it is none, too long or breaks off.
-bool ReadBody(const Request& request, const httplib::ContentReader& reader, std::string& body,
-              Response& response) {
+// Reads the body as it came: the library would cut a long form. False, with the response's status,
+// when it is none, too long or late, or breaks off.
+bool ReadBody(const Request& request, const httplib::ContentReader& reader, std::size_t most,
+              const std::function<void(const std::string&)>& take, Response& response) {
   if (request.is_multipart_form_data() ||
       !(request.has_header("Content-Length") || request.has_header("Transfer-Encoding"))) {
     response.status = Device::kHttpBadRequest;
     return false;
   }
-  bool is_too_long = false;
+  std::size_t length = 0;
   const bool is_read = reader([&](const char* data, std::size_t size) {
-    is_too_long = is_too_long || body.size() + size > kMostBodyBytes;
-    if (!is_too_long) {
-      body.append(data, size);
+    length += size;
+    if (length <= most) {
+      take({data, size});
     }
     return true;  // to its end: closed with bytes unread, the connection would lose the answer
   });
-  if (is_too_long) {
+  Connection& connection = Connection::OfThisThread();
+  connection.EndReading();
+  if (length > most) {
     response.status = Device::kHttpTooLarge;
+  } else if (!is_read && connection.IsLate()) {
+    response.status = Device::kHttpTimeout;
   }
-  return is_read && !is_too_long;
-}
-
-// What is long is looked into for those alone who are signed in.
-bool MayParse(const Request& request, const std::string& body, Response& response) {
-  if (body.size() > kMostStrangersBytes) {
-    if (request.path == kSession) {
-      response.status = Device::kHttpTooLarge;
-      return false;
-    }
-    const Device::Answer answer = Exchange(Asked(request, Device::kKindSession)).Receive();
-    if (answer.status != Device::kHttpOk) {
-      Respond(response, answer);
-      return false;
-    }
-  }
-  return true;
+  return is_read && length <= most;
 }
 
 }  // namespace
@@ -109,11 +103,6 @@ bool MayParse(const Request& request, const std::string& body, Response& respons
 FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
   server_.new_task_queue = [] { return new ConnectionThreads; };
   server_.set_payload_max_length(kMostBodyBytes);
-  server_.set_read_timeout(kReadTimeout);
-  server_.set_keep_alive_timeout(kReadTimeout);
-  // What a refused request leaves unread, or its length read in another way by a proxy, would be
-  // taken for the next one of the connection, which the refusal was to prevent.
-  server_.set_keep_alive_max_count(1);
   server_.set_tcp_nodelay(true);
   server_.set_socket_options([this](int socket) {
     const int yes = 1;
@@ -126,6 +115,7 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
                                {"Cross-Origin-Resource-Policy", "same-origin"},
                                {"Cache-Control", "no-store"}});
   server_.set_pre_routing_handler([this](const Request& request, Response& response) {
+    Connection::OfThisThread().EndReading();
     // Whole answers only: the library would cut errors too, and send a file once for each range.
     const_cast<Request&>(request).ranges.clear();
     if (is_ending_) {
@@ -140,6 +130,9 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
       return httplib::Server::HandlerResponse::Unhandled;
     }
     return httplib::Server::HandlerResponse::Handled;
+  });
+  server_.set_post_routing_handler([](const Request& /*request*/, Response& /*response*/) {
+    Connection::OfThisThread().AllowForWriting(kAnswerTime);
   });
   server_.set_exception_handler(
       [](const Request& /*request*/, Response& response, const std::exception_ptr& /*error*/) {
@@ -170,11 +163,11 @@ void FrontEnd::AddRoutes() {
   Post(kSession, &FrontEnd::SignIn);
   Post(kWebApi, &FrontEnd::CallApi);
   server_.Delete(kSession,
-                 [this](const Request& request, Response& response,
-                        const httplib::ContentReader& /*body*/) { SignOut(request, response); });
+                 [](const Request& request, Response& response,
+                    const httplib::ContentReader& /*body*/) { SignOut(request, response); });
   for (const char* kind : {Device::kKindSession, Device::kKindTasks, Device::kKindCodes}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
-      Serve(Asked(request, kind), response);
+      Respond(response, Ask(Asked(request, kind)).Receive());
     });
   }
   server_.Get("/files", [](const Request& request, Response& response) {
@@ -182,72 +175,88 @@ void FrontEnd::AddRoutes() {
       Refuse(response, Device::kHttpBadRequest, "'path' is missing");
       return;
     }
-    Json::Value asked = Asked(request, Device::kKindFiles);
-    asked["path"] = request.get_param_value("path");
-    Serve(asked, response);
+    Exchange exchange = Ask(Asked(request, Device::kKindFiles));
+    Device::Answer answer = exchange.Receive();
+    if (answer.status == Device::kHttpContinue) {
+      exchange.Send(request.get_param_value("path"));
+      exchange.Send("");
+      answer = exchange.Receive();
+    }
+    Respond(response, answer);
   });
   server_.Get("/events", [this](const Request& request, Response& response) {
     StreamEvents(request, response);
   });
 }
 
-void FrontEnd::Post(const char* route,
-                    void (FrontEnd::*handler)(const Request&, const Json::Value&, Response&)) {
+void FrontEnd::Post(const char* route, void (*handler)(const Request&,
+                                                       const httplib::ContentReader&, Response&)) {
   server_.Post(route, [this, handler](const Request& request, Response& response,
                                       const httplib::ContentReader& reader) {
     ++serving_;
     const std::shared_ptr<void> counted(&serving_, [this](void*) { --serving_; });
-    std::string body;
-    try {
-      if (ReadBody(request, reader, body, response) && MayParse(request, body, response)) {
-        (this->*handler)(request, ParseBody(request.get_header_value("Content-Type"), body),
-                         response);
-      }
-    } catch (const std::runtime_error& error) {
-      Refuse(response, Device::kHttpBadRequest, error.what());
-    }
+    handler(request, reader, response);
   });
 }
 
-void FrontEnd::SignIn(const Request& /*request*/, const Json::Value& body, Response& response) {
-  const std::string text = Device::ToText(Device::JsonObject(
-      {{"user", TextField(body, "user")}, {"password", TextField(body, "password")}}));
-  if (text.size() > Device::kMostControlBytes) {
-    Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
+void FrontEnd::SignIn(const Request& request, const httplib::ContentReader& reader,
+                      Response& response) {
+  std::string body;
+  Connection::OfThisThread().ReadBody(false);
+  if (!ReadBody(
+          request, reader, kMostSignInBytes, [&](const std::string& part) { body += part; },
+          response)) {
     return;
   }
-  Respond(response, Exchange(Device::ControlKind::kSignIn, text).Receive());
+  try {
+    const Json::Value asked =
+        Device::ParseBody(request.get_header_value("Content-Type"), std::move(body));
+    const std::string text = Device::ToText(
+        Device::JsonObject({{"user", Device::TextField(asked, "user")},
+                            {"password", Device::TextField(asked, "password")},
+                            {"client", Connection::OfThisThread().Client()}}));
+    if (text.size() > Device::kMostControlBytes) {
+      Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
+      return;
+    }
+    Respond(response, Exchange(Device::ControlKind::kSignIn, text).Receive());
+  } catch (const std::runtime_error& error) {
+    Refuse(response, Device::kHttpBadRequest, error.what());
+  }
 }
 
 void FrontEnd::SignOut(const Request& request, Response& response) {
-  const std::string session = SessionOf(request).substr(0, Device::kMostControlBytes);
-  Respond(response, Exchange(Device::ControlKind::kSignOut, session).Receive());
+  Respond(response, Exchange(Device::ControlKind::kSignOut, SessionOf(request)).Receive());
 }
 
-void FrontEnd::CallApi(const Request& request, const Json::Value& body, Response& response) {
-  Json::Value asked = ApiRequest(body);
-  asked["kind"] = Device::kKindCall;
-  asked["session"] = SessionOf(request);
-  asked["followed"] = streams_.HasAny(asked["session"].asString());
-  Serve(asked, response);
+void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& reader,
+                       Response& response) {
+  Json::Value asked = Asked(request, Device::kKindCall);
+  asked["type"] = request.get_header_value("Content-Type").substr(0, kMostTypeBytes);
+  Exchange exchange = Ask(asked);
+  const Device::Answer answer = exchange.Receive();
+  const bool is_users = answer.status == Device::kHttpContinue;
+  Connection::OfThisThread().ReadBody(is_users);
+  const auto take = [&](const std::string& part) {
+    if (is_users) {
+      exchange.Send(part);
+    }
+  };
+  if (ReadBody(request, reader, kMostBodyBytes, take, response)) {
+    exchange.Send("");
+    Respond(response, is_users ? exchange.Receive() : answer);
+  }
 }
 
 void FrontEnd::StreamEvents(const Request& request, Response& response) {
-  const Json::Value asked = Asked(request, Device::kKindEvents);
-  const std::shared_ptr<void> counted = streams_.Open(asked["session"].asString());
-  if (counted == nullptr) {
-    response.set_header("Retry-After", "10");
-    Refuse(response, Device::kHttpTooMany, "too many event streams");
-    return;
-  }
-  const auto exchange = std::make_shared<Exchange>(asked);
+  const auto exchange = std::make_shared<Exchange>(Ask(Asked(request, Device::kKindEvents)));
   const Device::Answer answer = exchange->Receive();
   if (answer.status != Device::kHttpOk) {
     Respond(response, answer);
     return;
   }
   response.set_chunked_content_provider(
-      "text/event-stream", [exchange, counted, this](std::size_t /*at*/, httplib::DataSink& sink) {
+      "text/event-stream", [exchange, this](std::size_t /*at*/, httplib::DataSink& sink) {
         // A comment now and then tells whether the client is still there.
         std::string text = ":\n\n";
         if (exchange->Wait(kHeartbeatMs)) {
@@ -258,6 +267,7 @@ void FrontEnd::StreamEvents(const Request& request, Response& response) {
           }
           text = *event;
         }
+        Connection::OfThisThread().AllowForWriting(kAnswerTime);
         return !is_ending_ && sink.write(text.data(), text.size());
       });
 }

@@ -7,9 +7,8 @@
 #include <map>
 #include <string>
 
-#include "device/web/exchange.h"
+#include "device/web/connection.h"
 #include "device/web/page_files.h"
-#include "device/web/stream_count.h"
 
 namespace Web {
 
@@ -27,19 +26,19 @@ class FrontEnd {
  private:
   void AddRoutes();
   void AddPage(const std::map<std::string, PageFile>& files);
-  void Post(const char* route, void (FrontEnd::*handler)(const httplib::Request&,
-                                                         const Json::Value&, httplib::Response&));
+  void Post(const char* route,
+            void (*handler)(const httplib::Request&, const httplib::ContentReader&,
+                            httplib::Response&));
 
-  void SignIn(const httplib::Request& request, const Json::Value& body,
-              httplib::Response& response);
-  void SignOut(const httplib::Request& request, httplib::Response& response);
-  void CallApi(const httplib::Request& request, const Json::Value& body,
-               httplib::Response& response);
+  static void SignIn(const httplib::Request& request, const httplib::ContentReader& reader,
+                     httplib::Response& response);
+  static void SignOut(const httplib::Request& request, httplib::Response& response);
+  static void CallApi(const httplib::Request& request, const httplib::ContentReader& reader,
+                      httplib::Response& response);
   void StreamEvents(const httplib::Request& request, httplib::Response& response);
 
-  httplib::Server server_;
+  Server server_;
   int socket_ = -1;  // the server's
-  StreamCount streams_;
   std::atomic<int> serving_{0};
   std::atomic<bool> is_ending_{false};
 };

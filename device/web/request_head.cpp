@@ -1,5 +1,6 @@
 #include "device/web/request_head.h"
 
+#include <algorithm>
 #include <string>
 
 #include "device/host/wire.h"
@@ -7,6 +8,12 @@
 namespace Web {
 
 using httplib::Request;
+
+namespace {
+
+constexpr std::size_t kMostSessionBytes = 64;  // no id is as long
+
+}  // namespace
 
 std::string SessionOf(const Request& request) {
   const std::string cookies = "; " + request.get_header_value("Cookie");
@@ -16,7 +23,7 @@ std::string SessionOf(const Request& request) {
     return "";
   }
   const std::size_t value = begin + name.size();
-  return cookies.substr(value, cookies.find(';', value) - value);
+  return cookies.substr(value, std::min(cookies.find(';', value) - value, kMostSessionBytes));
 }
 
 bool IsForeignHost(const Request& request) {

@@ -158,6 +158,7 @@ pid_t ForkWorker() {
       BecomeWorker();
     } else {
       RegisterWorker(CurrentUser(), worker.Pid());
+      TheHost().worker = worker.Pid();
     }
     return worker.Release();
   } catch (const std::exception& error) {

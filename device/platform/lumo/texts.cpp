@@ -1,6 +1,7 @@
 // Splitting and encoding texts.
 #include <algorithm>
 #include <map>
+#include <stdexcept>
 #include <utility>
 
 #include "device/base/json_text.h"
@@ -45,12 +46,12 @@ Json::Value Explode(const Json::Value& value, const std::string& separator, int 
   if (!value.isString()) {
     return {Json::arrayValue};
   }
-  const std::string text = value.asString();
+  std::string text = value.asString();
   if (version >= kFirstVersionWithArrays && !text.empty() && text[0] == '[') {
     try {
-      Json::Value array = ParseJson(DecodeByteEscapes(text));
+      Json::Value array = ParseJson(DecodeByteEscapes(std::move(text)));
       return array.isArray() ? OnlyTexts(std::move(array)) : Json::Value(Json::arrayValue);
-    } catch (const std::exception&) {
+    } catch (const std::runtime_error&) {
       return {Json::arrayValue};  // begins like an array and is none
     }
   }

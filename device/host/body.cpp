@@ -1,12 +1,13 @@
-#include "device/web/body.h"
+#include "device/host/body.h"
 
 #include <cctype>
 #include <cstdlib>
 #include <stdexcept>
+#include <utility>
 
 #include "device/base/json_text.h"
 
-namespace Web {
+namespace Device {
 
 namespace {
 
@@ -70,13 +71,13 @@ int VersionOf(const Json::Value& field) {
 
 }  // namespace
 
-Json::Value ParseBody(const std::string& content_type, const std::string& body) {
+Json::Value ParseBody(const std::string& content_type, std::string body) {
   if (content_type.compare(0, sizeof kFormType - 1, kFormType) == 0) {
     return ParseForm(body);
   }
   Json::Value value;
   try {
-    value = Device::ParseJson(Device::DecodeByteEscapes(body), Device::kParamDepth);
+    value = ParseJson(DecodeByteEscapes(std::move(body)), kParamDepth);
   } catch (const std::runtime_error& error) {
     throw std::runtime_error(std::string("body: ") + error.what());
   }
@@ -86,18 +87,19 @@ Json::Value ParseBody(const std::string& content_type, const std::string& body) 
   return value;
 }
 
-Json::Value ApiRequest(const Json::Value& body) {
-  Json::Value request = Device::JsonObject({{"api", TextField(body, "api")},
-                                            {"method", TextField(body, "method")},
-                                            {"version", VersionOf(body["version"])},
-                                            {"params", body.get("params", body)}});
-  if (!request["params"].isObject()) {
-    throw std::runtime_error("'params' is not an object");
-  }
-  for (const char* name : {"api", "method", "version"}) {
-    if (!body.isMember("params")) {
-      request["params"].removeMember(name);
+Json::Value ApiRequest(Json::Value body) {
+  Json::Value request = JsonObject({{"api", TextField(body, "api")},
+                                    {"method", TextField(body, "method")},
+                                    {"version", VersionOf(body["version"])}});
+  Json::Value& params = request["params"];
+  if (!body.removeMember("params", &params)) {
+    params.swap(body);
+    for (const char* name : {"api", "method", "version"}) {
+      params.removeMember(name);
     }
+  }
+  if (!params.isObject()) {
+    throw std::runtime_error("'params' is not an object");
   }
   return request;
 }
@@ -109,4 +111,4 @@ std::string TextField(const Json::Value& body, const std::string& name) {
   return body[name].asString();
 }
 
-}  // namespace Web
+}  // namespace Device

@@ -1,0 +1,74 @@
+// Connections: a thread for each, so that slow clients hold up nobody else, and a deadline for what
+// a client sends or takes, so that none holds one for ever.
+#pragma once
+
+#include <httplib.h>
+
+#include <array>
+#include <chrono>
+#include <functional>
+#include <string>
+
+namespace Web {
+
+class Connection : public httplib::Stream {
+ public:
+  // Takes the socket. Waits for the head of a request from then on.
+  explicit Connection(int socket);
+  ~Connection() override;
+  Connection(const Connection&) = delete;
+  Connection& operator=(const Connection&) = delete;
+
+  // The one that this thread serves.
+  static Connection& OfThisThread();
+
+  // A name for where the client is: its address, in IPv6 its network's.
+  const std::string& Client() const { return client_; }
+
+  // From now on a body is read, of a signed-in user or not. Those that are being read, heads among
+  // them, make room for others, the oldest first: when there are too many of one client's without
+  // a session, or there is no thread for a new one.
+  void ReadBody(bool is_users);
+  // Nothing more is read, and the connection is not to be closed for another's sake.
+  void EndReading();
+  // What is written from now on has so much time.
+  void AllowForWriting(std::chrono::seconds time) { deadline_ = Clock::now() + time; }
+  bool IsLate() const { return Clock::now() >= deadline_; }
+
+  bool is_readable() const override;
+  bool is_writable() const override;
+  ssize_t read(char* to, std::size_t size) override;
+  using Stream::write;
+  ssize_t write(const char* from, std::size_t size) override;
+  void get_remote_ip_and_port(std::string& ip, int& port) const override;
+  void get_local_ip_and_port(std::string& ip, int& port) const override;
+  socket_t socket() const override { return socket_; }
+
+ private:
+  using Clock = std::chrono::steady_clock;
+
+  void BeginReading(const std::string& payer, std::chrono::seconds time);
+  // False at the deadline.
+  bool WaitFor(short event) const;
+
+  int socket_;
+  std::string client_;
+  Clock::time_point deadline_;
+  std::array<char, 4096> buffer_;  // what was received
+  std::size_t begin_ = 0;           // and not read yet
+  std::size_t end_ = 0;
+};
+
+class ConnectionThreads : public httplib::TaskQueue {
+ public:
+  void enqueue(std::function<void()> connection) override;
+  void shutdown() override {}  // they end with the process
+};
+
+// A server whose connections are the above.
+class Server : public httplib::Server {
+ private:
+  bool process_and_close_socket(socket_t socket) override;
+};
+
+}  // namespace Web
