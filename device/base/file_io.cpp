@@ -68,16 +68,22 @@ bool ReadAll(int fd, char* to, std::size_t size) {
 
 bool WriteFrame(int fd, const std::string& text) {
   const auto length = static_cast<std::uint32_t>(text.size());
-  return WriteAll(fd, std::string(reinterpret_cast<const char*>(&length), sizeof length) + text);
+  return WriteAll(fd, {reinterpret_cast<const char*>(&length), sizeof length}) &&
+         WriteAll(fd, text);
+}
+
+std::optional<std::size_t> ReadFrameLength(int fd) {
+  std::uint32_t length = 0;
+  return ReadAll(fd, reinterpret_cast<char*>(&length), sizeof length) && length <= kMostFrameBytes
+             ? std::optional<std::size_t>(length)
+             : std::nullopt;
 }
 
 std::optional<std::string> ReadFrame(int fd) {
-  std::uint32_t length = 0;
-  if (!ReadAll(fd, reinterpret_cast<char*>(&length), sizeof length) || length > kMostFrameBytes) {
-    return std::nullopt;
-  }
-  std::string text(length, '\0');
-  return ReadAll(fd, text.data(), text.size()) ? std::optional(std::move(text)) : std::nullopt;
+  const std::optional<std::size_t> length = ReadFrameLength(fd);
+  std::string text(length.value_or(0), '\0');
+  return length && ReadAll(fd, text.data(), text.size()) ? std::optional(std::move(text))
+                                                         : std::nullopt;
 }
 
 }  // namespace Device

@@ -35,5 +35,7 @@ bool WriteFrame(int fd, const std::string& text);
 
 // Nothing when the other side is gone without a whole frame, or the frame is too long.
 std::optional<std::string> ReadFrame(int fd);
+// The same, when the frame's bytes are to be read by ReadAll.
+std::optional<std::size_t> ReadFrameLength(int fd);
 
 }  // namespace Device

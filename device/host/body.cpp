@@ -23,6 +23,7 @@ int HexDigit(char digit) {
 // Throws std::runtime_error for a "%" without two digits.
 std::string UnquoteField(const std::string& text, std::size_t place) {
   std::string plain;
+  plain.reserve(text.size());
   for (std::size_t at = 0; at < text.size(); ++at) {
     if (text[at] != '%') {
       plain += text[at] == '+' ? ' ' : text[at];

@@ -25,25 +25,37 @@ const char* KindOf(mode_t mode) {
   return S_ISDIR(mode) ? "folder" : S_ISREG(mode) ? "file" : S_ISLNK(mode) ? "link" : "other";
 }
 
-Json::Value Entry(const std::string& name, const struct stat& status) {
-  return JsonObject({{"name", name},
-                     {"kind", KindOf(status.st_mode)},
-                     {"size", Json::Int64{S_ISDIR(status.st_mode) ? 0 : status.st_size}},
-                     {"modified", Json::Int64{status.st_mtime}}});
-}
+struct Entry {
+  explicit Entry(const struct stat& status)
+      : kind(KindOf(status.st_mode)),
+        size(S_ISDIR(status.st_mode) ? 0 : status.st_size),
+        modified(status.st_mtime) {}
 
-Json::Value Body(const std::string& path, bool is_writable,
-                 const std::map<std::string, Json::Value>& entries) {
-  Json::Value list(Json::arrayValue);
+  const char* kind;
+  Json::Int64 size;
+  Json::Int64 modified;
+};
+
+// Text by text: values of all entries would take too much memory.
+std::string Body(const std::string& path, bool is_writable,
+                 const std::map<std::string, Entry>& entries) {
+  std::string body = "{\"entries\":[";
   for (const auto& [name, entry] : entries) {
-    list.append(entry);
+    body += ToUtf8Text(JsonObject({{"name", name},
+                                   {"kind", entry.kind},
+                                   {"size", entry.size},
+                                   {"modified", entry.modified}}));
+    body += ',';
   }
-  return JsonObject({{"path", path}, {"writable", is_writable}, {"entries", list}});
+  if (!entries.empty()) {
+    body.pop_back();
+  }
+  return body + "],\"path\":" + ToUtf8Text(path) + ",\"writable\":" + ToText(is_writable) + "}";
 }
 
 // What the user has no access to at all is not shown.
 Listing ListShares(const std::string& user) {
-  std::map<std::string, Json::Value> entries;
+  std::map<std::string, Entry> entries;
   std::vector<std::string> names = {kHomeShare};
   for (const Share& share : TheDevice().config.shares) {
     names.push_back(share.name);
@@ -53,7 +65,7 @@ Listing ListShares(const std::string& user) {
     struct stat status {};
     if (share.error == 0 && AccessOf(share, user) != Access::kNone &&
         stat(share.real_path.c_str(), &status) == 0) {
-      entries[name] = Entry(name, status);
+      entries.emplace(name, status);
     }
   }
   return {0, Body("/", false, entries)};
@@ -89,14 +101,14 @@ Listing ListFolder(const std::string& user, const std::string& path) {
     return errno == ELOOP ? Listing{KAVO::kErrOutsideShare, {}} : FailWithErrno(errno);
   }
   const std::unique_ptr<DIR, int (*)(DIR*)> directory(fdopendir(fd), closedir);
-  std::map<std::string, Json::Value> entries;
+  std::map<std::string, Entry> entries;
   while (const dirent* const found = readdir(directory.get())) {
     const std::string name = found->d_name;
     struct stat status {};
     // One that has gone meanwhile is not there.
     if (name != "." && name != ".." && !IsWorkFolderName(name) &&
         fstatat(fd, found->d_name, &status, AT_SYMLINK_NOFOLLOW) == 0) {
-      entries[name] = Entry(name, status);
+      entries.emplace(name, status);
     }
   }
   return {0, Body(folder.user_path, IsWritable(folder, fd), entries)};

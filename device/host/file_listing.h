@@ -1,15 +1,14 @@
 // The folders of a user's shared folders, as the user sees them.
 #pragma once
 
-#include <json/json.h>
-
 #include <string>
 
 namespace Device {
 
 struct Listing {
   int error = 0;     // a KAVO::ErrorCode; 0: listed
-  Json::Value body;  // {"path", "writable", "entries": [{"name", "kind", "size", "modified"}]}
+  // JSON: {"entries": [{"kind", "modified", "name", "size"}], "path", "writable"}
+  std::string body = {};
 };
 
 // Lists a user's folder, "/" for the shared folders. To be called with the user's identity, by

@@ -27,7 +27,7 @@ namespace Device {
 
 namespace {
 
-constexpr std::size_t kMostMemory = std::size_t{48} << 20U;
+constexpr std::size_t kMostMemory = std::size_t{57} << 20U;
 constexpr std::chrono::seconds kStorePatience(2);
 
 void TakeIdentity(const std::string& session_id, const std::string& user) {
@@ -82,9 +82,9 @@ Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& a
 }
 
 Answer ListFiles(const std::string& user, const std::string& path) {
-  const Listing listing = ListFolder(user, path);
+  Listing listing = ListFolder(user, path);
   if (listing.error == 0) {
-    return Answer(kHttpOk, listing.body);
+    return {kHttpOk, std::move(listing.body)};
   }
   const bool is_forbidden =
       listing.error == KAVO::kErrNoPrivilege || listing.error == KAVO::kErrOutsideShare;

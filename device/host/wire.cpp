@@ -22,27 +22,31 @@ std::optional<ControlMessage> ReceiveControl(int socket) {
 }
 
 Answer::Answer(int http_status, const Json::Value& json)
-    : status(http_status), body(json.isNull() ? "" : ToUtf8Text(json) + "\n") {}
+    : Answer(http_status, json.isNull() ? "" : ToUtf8Text(json)) {}
+
+Answer::Answer(int http_status, std::string json_text)
+    : status(http_status), body(std::move(json_text)) {
+  body += body.empty() ? "" : "\n";
+}
 
 Answer Refusal(int status, const std::string& reason) {
   return Answer(status, JsonObject({{"error", reason}}));
 }
 
 bool SendAnswer(int stream, const Answer& answer) {
-  std::string text = std::to_string(answer.status) + "\n";
+  std::string head = std::to_string(answer.status) + "\n";
   for (const auto& [name, value] : answer.headers) {
-    text.append(name).append(": ").append(value).append("\n");
+    head.append(name).append(": ").append(value).append("\n");
   }
-  return WriteFrame(stream, text + "\n" + answer.body);
+  return WriteFrame(stream, head) && WriteFrame(stream, answer.body);
 }
 
-std::optional<Answer> ReceiveAnswer(int stream) {
+std::optional<Answer> ReceiveAnswerHead(int stream) {
   const std::optional<std::string> text = ReadFrame(stream);
-  const std::size_t head_end = text ? text->find("\n\n") : std::string::npos;
-  if (head_end == std::string::npos) {
+  if (!text || text->empty()) {
     return std::nullopt;
   }
-  std::istringstream head(text->substr(0, head_end + 1));
+  std::istringstream head(*text);
   std::string line;
   std::getline(head, line);
   Answer answer(std::stoi(line));
@@ -50,7 +54,6 @@ std::optional<Answer> ReceiveAnswer(int stream) {
     const std::size_t colon = line.find(": ");
     answer.headers.emplace_back(line.substr(0, colon), line.substr(colon + 2));
   }
-  answer.body = text->substr(head_end + 2);
   return answer;
 }
 

@@ -3,12 +3,12 @@
 // The front end sends the launcher control messages over a socket of sequenced packets (its
 // standard input): a kind, a text, and the end of a stream for the answer. Everything on that
 // stream is a frame (base/file_io.h). What comes back is an answer, made into text by who knows it
-// and passed through to the client:
+// and passed through to the client, first a frame with its head:
 //
 //     STATUS \n
 //     NAME: VALUE \n        any number of HTTP headers
-//     \n
-//     BODY                  as the client gets it
+//
+// and then the body in a frame of its own, as the client gets it.
 //
 // Of a request with a body the first answer may have the status 100: it is the request's turn. Then
 // the body goes there as it came, in frames that an empty one ends, and the answer comes. An answer
@@ -76,6 +76,7 @@ inline constexpr char kKindCodes[] = "codes";  // no session needed
 struct Answer {
   // Body in JSON, a line in UTF-8; none for null.
   explicit Answer(int http_status, const Json::Value& json = {});
+  Answer(int http_status, std::string json_text);
 
   int status;
   std::vector<std::pair<std::string, std::string>> headers;
@@ -88,7 +89,7 @@ Answer Refusal(int status, const std::string& reason);
 // False when the other side is gone.
 bool SendAnswer(int stream, const Answer& answer);
 
-// Nothing when the other side is gone without an answer.
-std::optional<Answer> ReceiveAnswer(int stream);
+// An answer whose body has still to be read. Nothing when the other side is gone without one.
+std::optional<Answer> ReceiveAnswerHead(int stream);
 
 }  // namespace Device

@@ -1,6 +1,7 @@
 // One exchange of the front end with the launcher.
 #pragma once
 
+#include <cstddef>
 #include <optional>
 #include <string>
 
@@ -18,8 +19,12 @@ class Exchange {
   // Sends a part of the body; an empty one ends it. What nobody reads any more is dropped.
   void Send(const std::string& part) { Device::WriteFrame(stream_.Get(), part); }
 
-  // The answer; the status 500 when the other side went without one.
+  // The answer, whose body, of so many bytes, is then to be read; the status 500, with a body, when
+  // the other side went without one.
   Device::Answer Receive();
+  std::size_t BodyLength() const { return body_length_; }
+  // False when the other side is gone.
+  bool ReadBody(char* to, std::size_t size) { return Device::ReadAll(stream_.Get(), to, size); }
   // The next of the events that follow the answer, as the client gets it. Nothing at their end.
   std::optional<std::string> Next();
   // Waits for the next frame. False after the time-out.
@@ -27,6 +32,7 @@ class Exchange {
 
  private:
   Device::FileDescriptor stream_;
+  std::size_t body_length_ = 0;
 };
 
 }  // namespace Web

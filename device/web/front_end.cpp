@@ -3,7 +3,10 @@
 #include <poll.h>
 #include <sys/socket.h>
 
+#include <algorithm>
+#include <array>
 #include <chrono>
+#include <memory>
 #include <stdexcept>
 
 #include "device/base/json_text.h"
@@ -51,9 +54,35 @@ Json::Value Asked(const Request& request, const char* kind) {
                              {"client", Connection::OfThisThread().Client()}});
 }
 
+using Asking = std::shared_ptr<Exchange>;
+
 // Has the request served by a process of the launcher's.
-Exchange Ask(const Json::Value& asked) {
-  return {Device::ControlKind::kRequest, Device::ToText(asked)};
+Asking Ask(Device::ControlKind kind, const Json::Value& asked) {
+  Connection::OfThisThread().EndReading();
+  return std::make_shared<Exchange>(kind, Device::ToText(asked));
+}
+
+Asking Ask(const Json::Value& asked) { return Ask(Device::ControlKind::kRequest, asked); }
+
+// Passes on an answer and what its body is still to bring, part by part: who sends that waits until
+// the client has taken it.
+void PassOn(Response& response, const Device::Answer& answer, const Asking& exchange) {
+  Respond(response, answer);
+  if (exchange->BodyLength() == 0) {
+    return;
+  }
+  response.set_content_provider(
+      exchange->BodyLength(), kJson,
+      [exchange](std::size_t /*at*/, std::size_t left, httplib::DataSink& sink) {
+        std::array<char, 65536> part;
+        const std::size_t size = std::min(left, part.size());
+        Connection::OfThisThread().AllowForWriting(kAnswerTime);
+        return exchange->ReadBody(part.data(), size) && sink.write(part.data(), size);
+      });
+}
+
+void PassOn(Response& response, const Asking& exchange) {
+  PassOn(response, exchange->Receive(), exchange);
 }
 
 const char* ReasonFor(int status) {
@@ -115,7 +144,6 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
                                {"Cross-Origin-Resource-Policy", "same-origin"},
                                {"Cache-Control", "no-store"}});
   server_.set_pre_routing_handler([this](const Request& request, Response& response) {
-    Connection::OfThisThread().EndReading();
     // Whole answers only: the library would cut errors too, and send a file once for each range.
     const_cast<Request&>(request).ranges.clear();
     if (is_ending_) {
@@ -139,7 +167,7 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
         Refuse(response, Device::kHttpInternal, ReasonFor(Device::kHttpInternal));
       });
   server_.set_error_handler([](const Request& /*request*/, Response& response) {
-    if (response.body.empty()) {
+    if (response.body.empty() && !response.content_provider_) {
       Refuse(response, response.status, ReasonFor(response.status));
     }
   });
@@ -167,7 +195,7 @@ void FrontEnd::AddRoutes() {
                     const httplib::ContentReader& /*body*/) { SignOut(request, response); });
   for (const char* kind : {Device::kKindSession, Device::kKindTasks, Device::kKindCodes}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
-      Respond(response, Ask(Asked(request, kind)).Receive());
+      PassOn(response, Ask(Asked(request, kind)));
     });
   }
   server_.Get("/files", [](const Request& request, Response& response) {
@@ -175,14 +203,14 @@ void FrontEnd::AddRoutes() {
       Refuse(response, Device::kHttpBadRequest, "'path' is missing");
       return;
     }
-    Exchange exchange = Ask(Asked(request, Device::kKindFiles));
-    Device::Answer answer = exchange.Receive();
+    const Asking exchange = Ask(Asked(request, Device::kKindFiles));
+    Device::Answer answer = exchange->Receive();
     if (answer.status == Device::kHttpContinue) {
-      exchange.Send(request.get_param_value("path"));
-      exchange.Send("");
-      answer = exchange.Receive();
+      exchange->Send(request.get_param_value("path"));
+      exchange->Send("");
+      answer = exchange->Receive();
     }
-    Respond(response, answer);
+    PassOn(response, answer, exchange);
   });
   server_.Get("/events", [this](const Request& request, Response& response) {
     StreamEvents(request, response);
@@ -211,48 +239,51 @@ void FrontEnd::SignIn(const Request& request, const httplib::ContentReader& read
   try {
     const Json::Value asked =
         Device::ParseBody(request.get_header_value("Content-Type"), std::move(body));
-    const std::string text = Device::ToText(
+    const Json::Value sign_in =
         Device::JsonObject({{"user", Device::TextField(asked, "user")},
                             {"password", Device::TextField(asked, "password")},
-                            {"client", Connection::OfThisThread().Client()}}));
-    if (text.size() > Device::kMostControlBytes) {
+                            {"client", Connection::OfThisThread().Client()}});
+    if (Device::ToText(sign_in).size() > Device::kMostControlBytes) {
       Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
       return;
     }
-    Respond(response, Exchange(Device::ControlKind::kSignIn, text).Receive());
+    PassOn(response, Ask(Device::ControlKind::kSignIn, sign_in));
   } catch (const std::runtime_error& error) {
     Refuse(response, Device::kHttpBadRequest, error.what());
   }
 }
 
 void FrontEnd::SignOut(const Request& request, Response& response) {
-  Respond(response, Exchange(Device::ControlKind::kSignOut, SessionOf(request)).Receive());
+  PassOn(response, std::make_shared<Exchange>(Device::ControlKind::kSignOut, SessionOf(request)));
 }
 
 void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& reader,
                        Response& response) {
   Json::Value asked = Asked(request, Device::kKindCall);
   asked["type"] = request.get_header_value("Content-Type").substr(0, kMostTypeBytes);
-  Exchange exchange = Ask(asked);
-  const Device::Answer answer = exchange.Receive();
+  const Asking exchange = Ask(asked);
+  Device::Answer answer = exchange->Receive();
   const bool is_users = answer.status == Device::kHttpContinue;
   Connection::OfThisThread().ReadBody(is_users);
   const auto take = [&](const std::string& part) {
     if (is_users) {
-      exchange.Send(part);
+      exchange->Send(part);
     }
   };
   if (ReadBody(request, reader, kMostBodyBytes, take, response)) {
-    exchange.Send("");
-    Respond(response, is_users ? exchange.Receive() : answer);
+    if (is_users) {
+      exchange->Send("");
+      answer = exchange->Receive();
+    }
+    PassOn(response, answer, exchange);
   }
 }
 
 void FrontEnd::StreamEvents(const Request& request, Response& response) {
-  const auto exchange = std::make_shared<Exchange>(Ask(Asked(request, Device::kKindEvents)));
+  const Asking exchange = Ask(Asked(request, Device::kKindEvents));
   const Device::Answer answer = exchange->Receive();
   if (answer.status != Device::kHttpOk) {
-    Respond(response, answer);
+    PassOn(response, answer, exchange);
     return;
   }
   response.set_chunked_content_provider(
