@@ -105,15 +105,18 @@ void TaskStore::WriteProperty(TaskRow& row, const std::string& name, StoredValue
   known = std::move(value);
 }
 
-bool TaskStore::ReadChanges(TaskRow& row) {
+bool TaskStore::ReadChanges(TaskRow& row, bool with_params) {
   Statement task(database_, "SELECT finished, updated, version FROM tasks WHERE id = ?");
   if (!task.Bind(row.id).Step()) {
     return false;
   }
   Statement changes(database_,
                     "SELECT name, member, value FROM members WHERE task = ? AND version > ? "
-                    "ORDER BY name, member");
+                    "AND member IS NOT ? ORDER BY name, member");
   changes.Bind(row.id).Bind(row.version);
+  if (!with_params) {
+    changes.Bind(kMemberMark + std::string(kDataParams));
+  }
   while (changes.Step()) {
     StoredValue& property = row.properties[changes.Text(0)];
     const std::string member = changes.Text(1);
@@ -134,7 +137,7 @@ bool TaskStore::ReadChanges(TaskRow& row) {
 
 bool TaskStore::RefreshTask(TaskRow& row) {
   bool is_found = false;
-  database_.InTransaction(kForReading, [&] { is_found = ReadChanges(row); });
+  database_.InTransaction(kForReading, [&] { is_found = ReadChanges(row, true); });
   return is_found;
 }
 
@@ -153,7 +156,7 @@ void TaskStore::RefreshTasks(std::map<std::string, TaskRow>& rows) {
       TaskRow& row = rows[id];
       row = std::move(known[id]);
       row.id = id;
-      ReadChanges(row);
+      ReadChanges(row, false);
     }
   });
 }
@@ -162,7 +165,7 @@ bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> prop
                            bool finished) {
   bool is_found = false;
   database_.InTransaction(kForWriting, [&] {
-    is_found = ReadChanges(row);
+    is_found = ReadChanges(row, true);
     if (!is_found) {
       return;
     }

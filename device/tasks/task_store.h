@@ -20,6 +20,7 @@ namespace Device {
 inline constexpr char kPropData[] = "data";
 inline constexpr char kDataPid[] = "pid";
 inline constexpr char kDataErrors[] = "errors";
+inline constexpr char kDataParams[] = "params";  // large when there are many sources
 
 // A task as the store had it at one moment.
 struct TaskRow {
@@ -66,7 +67,8 @@ class TaskStore {
   // Brings the row up to date. Only what has changed is read, of a property that is an object only
   // the members that have. False when there is no such task any more.
   bool RefreshTask(TaskRow& row);
-  // Brings all rows, by id, up to date: new ones come, and those that are gone go.
+  // Brings all rows, by id, up to date: new ones come, and those that are gone go. None gets
+  // kDataParams, which of many tasks would take too much memory.
   void RefreshTasks(std::map<std::string, TaskRow>& rows);
   // Stores the properties and the finished state together, and brings the row up to date. Only what
   // differs from the store is written. False when there is no such task.
@@ -99,7 +101,7 @@ class TaskStore {
 
  private:
   // Within a transaction.
-  bool ReadChanges(TaskRow& row);
+  bool ReadChanges(TaskRow& row, bool with_params);
   void WriteProperty(TaskRow& row, const std::string& name, StoredValue value);
   void WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
                    const std::string* text);
