@@ -107,7 +107,10 @@ void Connection::BeginReading(const std::string& payer, std::chrono::seconds tim
   all.changed.notify_all();
 }
 
-void Connection::ReadBody(bool is_users) { BeginReading(is_users ? "" : client_, kBodyTime); }
+void Connection::ReadBody(bool is_users) {
+  NotePart();
+  BeginReading(is_users ? "" : client_, kBodyTime);
+}
 
 void Connection::EndReading() {
   Connections& all = All();
@@ -139,9 +142,10 @@ ssize_t Connection::read(char* to, std::size_t size) {
     begin_ = 0;
     end_ = static_cast<std::size_t>(got);
   }
-  const std::size_t taken = std::min(size, end_ - begin_);
+  const std::size_t taken = std::min({size, end_ - begin_, allowed_});
   std::memcpy(to, buffer_.data() + begin_, taken);
   begin_ += taken;
+  allowed_ -= taken;
   return static_cast<ssize_t>(taken);
 }
 

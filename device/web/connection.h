@@ -29,6 +29,9 @@ class Connection : public httplib::Stream {
   // them, make room for others, the oldest first: when there are too many of one client's without
   // a session, or there is no thread for a new one.
   void ReadBody(bool is_users);
+  // A part of the body has come. Without that only so much is read as a head may have: the library
+  // keeps a line of any length, and any number of them.
+  void NotePart() { allowed_ = kMostHeadBytes; }
   // Nothing more is read, and the connection is not to be closed for another's sake.
   void EndReading();
   // What is written from now on has so much time.
@@ -46,6 +49,7 @@ class Connection : public httplib::Stream {
 
  private:
   using Clock = std::chrono::steady_clock;
+  static constexpr std::size_t kMostHeadBytes = std::size_t{64} << 10U;
 
   void BeginReading(const std::string& payer, std::chrono::seconds time);
   // False at the deadline.
@@ -57,6 +61,7 @@ class Connection : public httplib::Stream {
   std::array<char, 4096> buffer_;  // what was received
   std::size_t begin_ = 0;           // and not read yet
   std::size_t end_ = 0;
+  std::size_t allowed_ = kMostHeadBytes;
 };
 
 class ConnectionThreads : public httplib::TaskQueue {

@@ -109,15 +109,16 @@ bool ReadBody(const Request& request, const httplib::ContentReader& reader, std:
     response.status = Device::kHttpBadRequest;
     return false;
   }
+  Connection& connection = Connection::OfThisThread();
   std::size_t length = 0;
   const bool is_read = reader([&](const char* data, std::size_t size) {
+    connection.NotePart();
     length += size;
     if (length <= most) {
       take({data, size});
     }
     return true;  // to its end: closed with bytes unread, the connection would lose the answer
   });
-  Connection& connection = Connection::OfThisThread();
   connection.EndReading();
   if (length > most) {
     response.status = Device::kHttpTooLarge;
@@ -131,7 +132,6 @@ bool ReadBody(const Request& request, const httplib::ContentReader& reader, std:
 
 FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
   server_.new_task_queue = [] { return new ConnectionThreads; };
-  server_.set_payload_max_length(kMostBodyBytes);
   server_.set_tcp_nodelay(true);
   server_.set_socket_options([this](int socket) {
     const int yes = 1;
