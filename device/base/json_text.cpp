@@ -45,7 +45,7 @@ const Json::StreamWriterBuilder& LineWriter() {
 }
 
 // What the library does not refuse with a place, or not at all.
-void CheckBytes(const std::string& text, int most_depth) {
+void CheckBytes(const std::string& text, int most_depth, std::size_t most_values) {
   unsigned long line = 1;
   std::size_t line_begin = 0;
   std::size_t values = 1;
@@ -63,7 +63,7 @@ void CheckBytes(const std::string& text, int most_depth) {
       is_in_string = !is_in_string;
     } else if (is_in_string) {
       at += byte == '\\' ? 1 : 0;
-    } else if ((byte == ',' || byte == '[' || byte == '{') && ++values > kMostValues) {
+    } else if ((byte == ',' || byte == '[' || byte == '{') && ++values > most_values) {
       ThrowMemoryShortage();
     } else if ((byte == '[' || byte == '{') && ++depth > most_depth) {
       Fail(line, column, "nested too deep");
@@ -112,8 +112,8 @@ std::string ToUtf8Text(const Json::Value& value) {
   return safe;
 }
 
-Json::Value ParseJson(const std::string& text, int depth) {
-  CheckBytes(text, depth);
+Json::Value ParseJson(const std::string& text, int depth, std::size_t most_values) {
+  CheckBytes(text, depth, most_values);
   Json::CharReaderBuilder builder;
   Json::CharReaderBuilder::strictMode(&builder.settings_);
   builder["strictRoot"] = false;  // a text or a number alone is JSON too

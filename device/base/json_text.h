@@ -4,6 +4,7 @@
 #include <json/json.h>
 
 #include <cstddef>
+#include <cstdint>
 #include <initializer_list>
 #include <string>
 #include <utility>
@@ -26,14 +27,16 @@ std::string ToUtf8Text(const Json::Value& value);
 inline constexpr int kTextDepth = 1000;
 inline constexpr int kParamDepth = kTextDepth - 10;
 
-// How many values a text may have: each takes a hundred times the two bytes that it can be made of.
+// How many values what a client sends may have: each takes a hundred times the two bytes that it can
+// be made of.
 inline constexpr std::size_t kMostValues = std::size_t{1} << 17U;
 
 // Throws std::runtime_error, with line, column and reason, for a text that is no JSON, and
 // std::bad_alloc, as ThrowMemoryShortage does, for one of too many values. Comments,
 // trailing commas, repeated keys and zero bytes are refused. Of each value, getOffsetStart() tells
 // the byte of the text at which it begins.
-Json::Value ParseJson(const std::string& text, int depth = kTextDepth);
+Json::Value ParseJson(const std::string& text, int depth = kTextDepth,
+                      std::size_t most_values = SIZE_MAX);
 
 // Takes the escapes \udc80 to \udcff, where they stand alone, for the bytes 0x80 to 0xFF, so that a
 // JSON text in UTF-8 can hold any file name.

@@ -1,5 +1,6 @@
 #include "device/base/shortage.h"
 
+#include <malloc.h>
 #include <sys/resource.h>
 #include <unistd.h>
 
@@ -19,6 +20,8 @@ constexpr bool kCanBeLimited = false;  // its shadow of all memory would count
 constexpr bool kCanBeLimited = true;
 #endif
 
+constexpr int kLargeBlock = 128 << 10;
+
 void SetLimit(rlim_t bytes) {
   rlimit limit{};
   getrlimit(RLIMIT_DATA, &limit);
@@ -37,6 +40,7 @@ void LimitMemory(std::size_t bytes) {
   if (!kCanBeLimited) {
     return;
   }
+  mallopt(M_MMAP_THRESHOLD, kLargeBlock);  // so that it stays: what is large goes when it is freed
   unsigned long pages = 0;
   std::sscanf(ReadTextFile("/proc/self/statm").c_str(), "%*u %*u %*u %*u %*u %lu", &pages);
   SetLimit(pages * static_cast<unsigned long>(sysconf(_SC_PAGESIZE)) + bytes);

@@ -78,7 +78,7 @@ Json::Value ParseBody(const std::string& content_type, std::string body) {
   }
   Json::Value value;
   try {
-    value = ParseJson(DecodeByteEscapes(std::move(body)), kParamDepth);
+    value = ParseJson(DecodeByteEscapes(std::move(body)), kParamDepth, kMostValues);
   } catch (const std::runtime_error& error) {
     throw std::runtime_error(std::string("body: ") + error.what());
   }

@@ -192,7 +192,7 @@ Database::Statement::Statement(Database& database, const char* sql)
 
 Database::Statement& Database::Statement::Bind(const std::string& text) {
   database_.Check(sqlite3_bind_text(statement_.get(), ++bound_, text.data(),
-                                    static_cast<int>(text.size()), SQLITE_TRANSIENT));
+                                    static_cast<int>(text.size()), SQLITE_STATIC));
   return *this;
 }
 

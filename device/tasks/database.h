@@ -61,6 +61,7 @@ class Database::Statement {
  public:
   Statement(Database& database, const char* sql);
 
+  // The text, which can be large, stays the caller's until the last step.
   Statement& Bind(const std::string& text);
   Statement& Bind(std::int64_t number);
   Statement& BindNull();

@@ -113,9 +113,10 @@ bool TaskStore::ReadChanges(TaskRow& row, bool with_params) {
   Statement changes(database_,
                     "SELECT name, member, value FROM members WHERE task = ? AND version > ? "
                     "AND member IS NOT ? ORDER BY name, member");
+  const std::string left_out = kMemberMark + std::string(kDataParams);
   changes.Bind(row.id).Bind(row.version);
   if (!with_params) {
-    changes.Bind(kMemberMark + std::string(kDataParams));
+    changes.Bind(left_out);
   }
   while (changes.Step()) {
     StoredValue& property = row.properties[changes.Text(0)];

@@ -14,6 +14,8 @@ namespace Device {
 
 namespace {
 
+constexpr std::size_t kMostListedErrors = std::size_t{64} << 10U;  // bytes of text
+
 const StoredValue& Property(const TaskRow& row, const std::string& name) {
   static const StoredValue kNone;
   const auto found = row.properties.find(name);
@@ -44,11 +46,15 @@ Json::Value Destination(const TaskRow& row) {
   return dest.isString() ? dest : Json::Value("");
 }
 
-void StoreFailure(const std::string& user, TaskRow& row) {
+Json::Value GeneralError(const TaskRow& row) {
   Json::Value errors(Json::arrayValue);
   errors.append(JsonObject({{"path", Destination(row)}, {"code", KAVO::kErrGeneral}}));
+  return errors;
+}
+
+void StoreFailure(const std::string& user, TaskRow& row) {
   StoredValue data = Property(row, kPropData);
-  data.members[kDataErrors] = ToText(errors);
+  data.members[kDataErrors] = ToText(GeneralError(row));
   const std::int64_t version = row.version;
   try {
     StoreOf(user).UpdateTask(row, {{kPropData, data}}, true);
@@ -118,7 +124,8 @@ Json::Value TaskView(const TaskRow& row) {
                                  {"total_size", total_size.isNull() ? Json::Value(0U) : total_size},
                                  {"started", InfoOf(row).get("started", 0)}});
   if (HasFailed(row)) {
-    view[kDataErrors] = data.Member(kDataErrors);
+    const bool is_listed = data.members.at(kDataErrors).size() <= kMostListedErrors;
+    view[kDataErrors] = is_listed ? data.Member(kDataErrors) : GeneralError(row);
   }
   return view;
 }

@@ -49,7 +49,7 @@ Json::Value Explode(const Json::Value& value, const std::string& separator, int 
   std::string text = value.asString();
   if (version >= kFirstVersionWithArrays && !text.empty() && text[0] == '[') {
     try {
-      Json::Value array = ParseJson(DecodeByteEscapes(std::move(text)));
+      Json::Value array = ParseJson(DecodeByteEscapes(std::move(text)), kTextDepth, kMostValues);
       return array.isArray() ? OnlyTexts(std::move(array)) : Json::Value(Json::arrayValue);
     } catch (const std::runtime_error&) {
       return {Json::arrayValue};  // begins like an array and is none
