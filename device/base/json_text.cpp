@@ -134,7 +134,7 @@ Json::Value ParseJson(const std::string& text, int depth, std::size_t most_value
 std::string DecodeByteEscapes(std::string json) {
   constexpr std::size_t kDigits = 4;
   constexpr std::size_t kEscape = 2 + kDigits;  // "\\udc80"
-  std::size_t decoded = 0;                       // bytes, in place
+  std::size_t decoded = 0;                      // bytes, in place
   for (std::size_t at = 0; at < json.size();) {
     std::size_t length = json[at] == '\\' ? 2 : 1;  // as it stands
     if (json.compare(at, 2, "\\u") == 0 && at + kEscape <= json.size()) {

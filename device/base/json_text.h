@@ -27,8 +27,8 @@ std::string ToUtf8Text(const Json::Value& value);
 inline constexpr int kTextDepth = 1000;
 inline constexpr int kParamDepth = kTextDepth - 10;
 
-// How many values what a client sends may have: each takes a hundred times the two bytes that it can
-// be made of.
+// How many values what a client sends may have: each takes a hundred times the two bytes that it
+// can be made of.
 inline constexpr std::size_t kMostValues = std::size_t{1} << 17U;
 
 // Throws std::runtime_error, with line, column and reason, for a text that is no JSON, and

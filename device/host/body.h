@@ -11,9 +11,9 @@ namespace Device {
 // std::runtime_error with the place and the reason, std::bad_alloc when it holds too much.
 Json::Value ParseBody(const std::string& content_type, std::string body);
 
-// A request of the API: its "api", "version", "method" and "params". Where there are no "params", as in a
-// form, every field but "api", "version" and "method" is a parameter. Throws std::runtime_error
-// that names the field.
+// A request of the API: its "api", "version", "method" and "params". Where there are no "params",
+// as in a form, every field but "api", "version" and "method" is a parameter. Throws
+// std::runtime_error that names the field.
 Json::Value ApiRequest(Json::Value body);
 
 // A text field. Throws std::runtime_error that names it when it is missing or none.

@@ -6,7 +6,7 @@
 namespace Device {
 
 struct Listing {
-  int error = 0;     // a KAVO::ErrorCode; 0: listed
+  int error = 0;  // a KAVO::ErrorCode; 0: listed
   // JSON: {"entries": [{"kind", "modified", "name", "size"}], "path", "writable"}
   std::string body = {};
 };

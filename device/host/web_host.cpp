@@ -238,8 +238,7 @@ void WebHost::Enqueue(const Asker& asker, FileDescriptor stream,
 
 void WebHost::TakeSignIn(const std::string& text, FileDescriptor stream) {
   const Json::Value asked = ParseJson(text);
-  const std::chrono::seconds wait =
-      gate_.Try(asked["user"].asString(), SignInGate::Clock::now());
+  const std::chrono::seconds wait = gate_.Try(asked["user"].asString(), SignInGate::Clock::now());
   if (wait.count() > 0) {
     Answer answer = Refusal(kHttpTooMany, "too many wrong passwords");
     answer.headers = {{"Retry-After", std::to_string(wait.count())}};

@@ -29,9 +29,7 @@ ino_t FileOf(const std::string& path) {
 
 }  // namespace
 
-void Database::SetPatience(std::chrono::milliseconds patience) {
-  the_patience = patience;
-}
+void Database::SetPatience(std::chrono::milliseconds patience) { the_patience = patience; }
 
 Database::Database(std::string path, const char* schema, int version)
     : path_(std::move(path)), database_(nullptr, sqlite3_close) {

@@ -59,7 +59,7 @@ class Connection : public httplib::Stream {
   std::string client_;
   Clock::time_point deadline_;
   std::array<char, 4096> buffer_;  // what was received
-  std::size_t begin_ = 0;           // and not read yet
+  std::size_t begin_ = 0;          // and not read yet
   std::size_t end_ = 0;
   std::size_t allowed_ = kMostHeadBytes;
 };

@@ -217,8 +217,8 @@ void FrontEnd::AddRoutes() {
   });
 }
 
-void FrontEnd::Post(const char* route, void (*handler)(const Request&,
-                                                       const httplib::ContentReader&, Response&)) {
+void FrontEnd::Post(const char* route,
+                    void (*handler)(const Request&, const httplib::ContentReader&, Response&)) {
   server_.Post(route, [this, handler](const Request& request, Response& response,
                                       const httplib::ContentReader& reader) {
     ++serving_;

@@ -26,9 +26,8 @@ class FrontEnd {
  private:
   void AddRoutes();
   void AddPage(const std::map<std::string, PageFile>& files);
-  void Post(const char* route,
-            void (*handler)(const httplib::Request&, const httplib::ContentReader&,
-                            httplib::Response&));
+  void Post(const char* route, void (*handler)(const httplib::Request&,
+                                               const httplib::ContentReader&, httplib::Response&));
 
   static void SignIn(const httplib::Request& request, const httplib::ContentReader& reader,
                      httplib::Response& response);
