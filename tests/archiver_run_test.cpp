@@ -139,6 +139,18 @@ TEST_F(ArchiverTest, UpdatesAProtectedArchiveWithItsOwnPasswordAlone) {
   }
 }
 
+TEST_F(ArchiverTest, UpdatesAZipThatIsProtectedByAes) {
+  WriteFile(share / "zeros", std::string(300, '0'));
+  ASSERT_EQ(RunProgram(
+                {"/usr/bin/7z", "a", "-tzip", "-mem=AES256", "-sae", "-pfirst", out / "z", "zeros"},
+                share)
+                .status,
+            0);
+  Bad("z", {"a"}, "password", {"a", "", "other", ""});
+  Good("z", {"a"}, {"a", "", "first", ""});
+  EXPECT_EQ(RunProgram({"/usr/bin/7z", "t", "-pfirst", out / "z"}).status, 0);
+}
+
 TEST_F(ArchiverTest, NamesWhatIsMissingAndLeavesTheOldArchive) {
   Good("old", {"a"});
   const std::string old = ReadFile(out / "old");

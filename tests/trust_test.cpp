@@ -221,6 +221,7 @@ TEST(Fence, HoldsAProgramToWhatWasAllowed) {
     const char* script;
     bool is_allowed;
   } rows[] = {{"cat source/a >work/new && mv work/new work/z && rm work/old", true},
+              {"head -c 1 /dev/urandom", true},
               {"cat neighbour/b", false},
               {"ln -s ../neighbour/b work/l; cat work/l", false},
               {"echo x >beside", false},

@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <system_error>
+#include <utility>
 
 #include "device/archiver/failure.h"
 #include "device/base/file_io.h"
@@ -66,8 +67,16 @@ Device::FileDescriptor PasswordInput(const Request& request) {
     return Device::FileDescriptor();
   }
   // It asks once to open an old archive and once to encrypt new files.
-  const std::string answer = request.password + '\n';
-  return UnnamedFile(answer + answer);
+  const std::string answers = request.password + '\n' + request.password + '\n';
+  constexpr size_t kPipeBytes = 65536;
+  if (answers.size() > kPipeBytes) {
+    throw Failure("the password is too long");
+  }
+  Device::Pipe pipe;
+  if (!Device::WriteAll(pipe.writer.Get(), answers)) {
+    throw SystemFailure("cannot write", "the password for 7z", errno);
+  }
+  return std::move(pipe.reader);
 }
 
 }  // namespace Archiver

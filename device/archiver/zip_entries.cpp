@@ -130,7 +130,9 @@ void CheckMembers(const std::string& archive, const std::string& password) {
       throw Failure("it is protected by a password, and none is given");
     }
     OpenMember(zip.get(), member.index, password);
-    if (member.size > 0 && (!smallest || member.size < smallest->size)) {
+    // Of these a wrong password passes for the right one once in 256 times.
+    if (member.encryption_method == ZIP_EM_TRAD_PKWARE && member.size > 0 &&
+        (!smallest || member.size < smallest->size)) {
       smallest = member;
     }
   }

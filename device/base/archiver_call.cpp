@@ -1,5 +1,6 @@
 #include "device/base/archiver_call.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdlib>
 #include <utility>
@@ -12,6 +13,7 @@ namespace Device {
 namespace {
 
 constexpr char kMade[] = "made";
+constexpr std::size_t kBlock = 8192;
 constexpr std::size_t kMostCallBytes = 128 << 10U;  // what the socket holds before anybody reads
 
 void Add(std::string& texts, const std::string& text) { texts.append(text).push_back('\0'); }
@@ -26,6 +28,8 @@ bool SendArchiverCall(int socket, const ArchiverCall& call) {
   for (const std::string& folder : call.fixed_folders) {
     Add(texts, folder);
   }
+  // The length of what waits in a socket can be asked for by anybody.
+  texts.resize((texts.size() / kBlock + 1) * kBlock, '\0');
   if (texts.size() > kMostCallBytes) {
     errno = E2BIG;
     return false;
@@ -45,6 +49,7 @@ std::optional<ArchiverCall> ReceiveArchiverCall(int socket) {
   if (texts.size() < kHead) {
     return std::nullopt;
   }
+  texts.erase(std::find(texts.begin() + kHead, texts.end(), ""), texts.end());
   return ArchiverCall{
       texts[0], texts[1], std::atoi(texts[2].c_str()), {texts.begin() + kHead, texts.end()}};
 }

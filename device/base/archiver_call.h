@@ -2,8 +2,8 @@
 // its standard input, a socket.
 //
 // There it gets one frame: texts, each with a zero byte behind it, in the order of the fields
-// below. Back comes one message with a descriptor, the archive that was made (opened as a path,
-// O_PATH), before the run ends well.
+// below, and zero bytes to the next multiple of 8192. Back comes one message with a descriptor, the
+// archive that was made (opened as a path, O_PATH), before the run ends well.
 #pragma once
 
 #include <optional>

@@ -5,7 +5,9 @@
 
 namespace Device {
 
-// The program can open nothing that was not allowed here, connect to nothing and gain no rights.
+// The program can open nothing that was not allowed here, connect to nothing over TCP and gain no
+// rights. What it may do without opening, the kernel leaves to it: look at files' status, change
+// mode and times of the user's own ones, connect to a socket by its path.
 // Paths do not matter: what is allowed is the very file or folder that the descriptor holds, and
 // what lies below it at the moment of opening. Where the kernel cannot, it allows everything.
 class Fence {

@@ -51,7 +51,11 @@ void Remove(const FileDescriptor& folder) {
 bool IsOwn(const FileDescriptor& folder) {
   struct stat status {};
   return fstat(folder.Get(), &status) == 0 && status.st_uid == geteuid() &&
-         (status.st_mode & ACCESSPERMS) == kFolderMode;
+         (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
+}
+
+bool IsEmpty(const FileDescriptor& folder) {
+  return std::filesystem::is_empty(PathOf(folder.Get()));
 }
 
 bool Lock(const FileDescriptor& mark) {
@@ -76,7 +80,7 @@ WorkFolder::WorkFolder(const FileDescriptor& parent, const std::string& name) {
   }
   folder_ = FileDescriptor(openat(parent.Get(), name.c_str(), kOpenFolder));
   // Who can rename it may have put another in its place already.
-  if (!folder_ || !IsOwn(folder_)) {
+  if (!folder_ || !IsOwn(folder_) || !IsEmpty(folder_)) {
     errno = folder_ ? EPERM : errno;
     folder_.Close();
     ThrowErrno("cannot open the temporary folder");

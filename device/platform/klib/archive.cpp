@@ -22,10 +22,18 @@ namespace Device {
 
 namespace {
 
-struct MadeArchive {
+struct {
   std::string path;
   FileDescriptor file;
-} made_archive;
+} the_archive;
+
+FileDescriptor OpenSingleFile(const std::string& path) {
+  FileDescriptor file = OpenUserPath(TheDevice().FixedFolders(CurrentUser()), path, O_PATH);
+  struct stat status {};
+  const bool is_single =
+      file && fstat(file.Get(), &status) == 0 && S_ISREG(status.st_mode) && status.st_nlink == 1;
+  return is_single ? std::move(file) : FileDescriptor();
+}
 
 bool IsSameFolder(const FileDescriptor& folder) {
   struct stat one {};
@@ -94,6 +102,7 @@ ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun
     ThrowErrno("socket pair");
   }
   run = {FileDescriptor(ends[0]), arguments.archive};
+  the_archive = {run.archive, OpenSingleFile(run.archive)};
   const FileDescriptor input(ends[1]);
   NoteWhatIsLeft(arguments, call.work_folder);
   if (!SendArchiverCall(run.call.Get(), call)) {
@@ -109,18 +118,16 @@ ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun
 }
 
 void TakeArchive(const ArchiverRun& run) {
-  made_archive = {run.archive, ReceiveMadeArchive(run.call.Get())};
+  if (FileDescriptor made = ReceiveMadeArchive(run.call.Get())) {
+    the_archive = {run.archive, std::move(made)};
+  }
 }
 
 FileDescriptor OpenArchive(const std::string& path) {
-  if (made_archive.file && path == made_archive.path) {
-    return FileDescriptor(fcntl(made_archive.file.Get(), F_DUPFD_CLOEXEC, 0));
+  if (path != the_archive.path) {
+    return OpenSingleFile(path);
   }
-  FileDescriptor file = OpenUserPath(TheDevice().FixedFolders(CurrentUser()), path, O_PATH);
-  struct stat status {};
-  const bool is_single =
-      file && fstat(file.Get(), &status) == 0 && S_ISREG(status.st_mode) && status.st_nlink == 1;
-  return is_single ? std::move(file) : FileDescriptor();
+  return FileDescriptor(fcntl(the_archive.file.Get(), F_DUPFD_CLOEXEC, 0));
 }
 
 }  // namespace Device

@@ -23,9 +23,9 @@ ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun
 void TakeArchive(const ArchiverRun& run);
 
 // The file that operations on a job's archive are to touch, opened as a path: the one that the
-// archiver made for that path in this process, wherever it lies by now. When it made none, the
-// regular file with a single link that lies there with no link on the way below a shared folder.
-// Invalid when that is something else: nothing is to be touched then.
+// archiver made for that path in this process, wherever it lies by now. When it made none, the one
+// that lay there when the archiver was started: a regular file with a single link, and no link on
+// the way below a shared folder. Invalid when that was something else: nothing is to be touched.
 FileDescriptor OpenArchive(const std::string& path);
 
 }  // namespace Device
