@@ -42,8 +42,8 @@ Device::ProgramStart ProgramOf(const Job& job);
 Device::FileDescriptor UnnamedFile(const std::string& text);
 
 // A standard input for 7z that answers its questions for the password; invalid when there is none.
-// A pipe: a file could be packed, by a link to /proc/self/fd/0 that somebody puts among the sources.
-// Throws Failure.
+// A pipe: a file could be packed, by a link to /proc/self/fd/0 that somebody puts among the
+// sources. Throws Failure.
 Device::FileDescriptor PasswordInput(const Request& request);
 
 }  // namespace Archiver

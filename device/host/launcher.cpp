@@ -19,8 +19,10 @@
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
 #include "device/platform/kavo/request.h"
+#include "device/tasks/leftovers.h"
 #include "device/tasks/task_store.h"
 #include "platform/kavo/error_codes.h"
+#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -168,6 +170,17 @@ Outcome Launcher::Call(const Request& request) {
 
 void Launcher::Reap() {
   while (waitpid(-1, nullptr, WNOHANG) > 0) {
+  }
+}
+
+void RemoveLeftoversOfAll() {
+  for (const User& user : TheDevice().config.users) {
+    ChildProcess::Run([&] {
+      if (LumoLibUGIDSet(nullptr, user.name.c_str()) == 0) {
+        RemoveLeftovers(user.name);
+      }
+      return 0;
+    }).Wait();
   }
 }
 

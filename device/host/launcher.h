@@ -54,4 +54,7 @@ class Launcher {
   FileDescriptor answer_;
 };
 
+// Removes what killed jobs have left, each user's with that user's identity.
+void RemoveLeftoversOfAll();
+
 }  // namespace Device

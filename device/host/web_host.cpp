@@ -21,8 +21,6 @@
 #include "device/base/json_text.h"
 #include "device/host/web_request.h"
 #include "device/model/device.h"
-#include "device/tasks/leftovers.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -53,18 +51,6 @@ FileDescriptor LockDevice() {
 std::pair<std::string, std::string> SessionCookie(const std::string& value) {
   return {"Set-Cookie",
           std::string(kSessionCookie) + "=" + value + "; Path=/; HttpOnly; SameSite=Strict"};
-}
-
-// Each user's with that user's identity, so in a process of its own.
-void RemoveLeftoversOfAll() {
-  for (const User& user : TheDevice().config.users) {
-    ChildProcess::Run([&] {
-      if (LumoLibUGIDSet(nullptr, user.name.c_str()) == 0) {
-        RemoveLeftovers(user.name);
-      }
-      return 0;
-    }).Wait();
-  }
 }
 
 // Of a client who is not signed in, told apart from a user's name.

@@ -12,8 +12,8 @@
 #include "device/base/json_text.h"
 #include "device/host/body.h"
 #include "device/web/connection.h"
-#include "device/web/exchange.h"
 #include "device/web/request_head.h"
+#include "device/web/responses.h"
 
 namespace Web {
 
@@ -25,108 +25,12 @@ using httplib::Response;
 constexpr std::size_t kMostBodyBytes = std::size_t{8} << 20U;
 constexpr std::size_t kMostSignInBytes = std::size_t{64} << 10U;
 constexpr int kBacklog = 1024;
-constexpr std::chrono::seconds kAnswerTime(60);  // to take an answer, an event of a stream
 constexpr int kHeartbeatMs = 5000;
 constexpr std::chrono::seconds kEndGrace(5);
 constexpr std::size_t kMostTypeBytes = 100;  // of a Content-Type, for what it begins with
-constexpr char kJson[] = "application/json";
 constexpr char kPolicy[] =
     "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self'; connect-src 'self'; "
     "base-uri 'none'; form-action 'none'; frame-ancestors 'none'";
-
-void Respond(Response& response, const Device::Answer& answer) {
-  response.status = answer.status;
-  for (const auto& [name, value] : answer.headers) {
-    response.set_header(name, value);
-  }
-  if (!answer.body.empty()) {
-    response.set_content(answer.body, kJson);
-  }
-}
-
-void Refuse(Response& response, int status, const std::string& reason) {
-  Respond(response, Device::Refusal(status, reason));
-}
-
-Json::Value Asked(const Request& request, const char* kind) {
-  return Device::JsonObject({{"kind", kind},
-                             {"session", SessionOf(request)},
-                             {"client", Connection::OfThisThread().Client()}});
-}
-
-using Asking = std::shared_ptr<Exchange>;
-
-// Has the request served by a process of the launcher's.
-Asking Ask(Device::ControlKind kind, const Json::Value& asked) {
-  Connection::OfThisThread().EndReading();
-  return std::make_shared<Exchange>(kind, Device::ToText(asked));
-}
-
-Asking Ask(const Json::Value& asked) { return Ask(Device::ControlKind::kRequest, asked); }
-
-// Passes on an answer and what its body is still to bring, part by part: who sends that waits until
-// the client has taken it.
-void PassOn(Response& response, const Device::Answer& answer, const Asking& exchange) {
-  Respond(response, answer);
-  if (exchange->BodyLength() == 0) {
-    return;
-  }
-  response.set_content_provider(
-      exchange->BodyLength(), kJson,
-      [exchange](std::size_t /*at*/, std::size_t left, httplib::DataSink& sink) {
-        std::array<char, 65536> part;
-        const std::size_t size = std::min(left, part.size());
-        Connection::OfThisThread().AllowForWriting(kAnswerTime);
-        return exchange->ReadBody(part.data(), size) && sink.write(part.data(), size);
-      });
-}
-
-void PassOn(Response& response, const Asking& exchange) {
-  PassOn(response, exchange->Receive(), exchange);
-}
-
-const char* ReasonFor(int status) {
-  switch (status) {
-    case Device::kHttpNotFound:
-      return "no such route";
-    case Device::kHttpTimeout:
-      return "the body takes too long";
-    case Device::kHttpTooLarge:
-      return "the body is too long";
-    case Device::kHttpInternal:
-      return "the front end has failed";
-    default:
-      return "not a request that is understood";
-  }
-}
-
-// Reads the body as it came: the library would cut a long form. False, with the response's status,
-// when it is none, too long or late, or breaks off.
-bool ReadBody(const Request& request, const httplib::ContentReader& reader, std::size_t most,
-              const std::function<void(const std::string&)>& take, Response& response) {
-  if (request.is_multipart_form_data() ||
-      !(request.has_header("Content-Length") || request.has_header("Transfer-Encoding"))) {
-    response.status = Device::kHttpBadRequest;
-    return false;
-  }
-  Connection& connection = Connection::OfThisThread();
-  std::size_t length = 0;
-  const bool is_read = reader([&](const char* data, std::size_t size) {
-    connection.NotePart();
-    length += size;
-    if (length <= most) {
-      take({data, size});
-    }
-    return true;  // to its end: closed with bytes unread, the connection would lose the answer
-  });
-  connection.EndReading();
-  if (length > most) {
-    response.status = Device::kHttpTooLarge;
-  } else if (!is_read && connection.IsLate()) {
-    response.status = Device::kHttpTimeout;
-  }
-  return is_read && length <= most;
-}
 
 }  // namespace
 

@@ -7,8 +7,8 @@
 #include <cerrno>
 #include <climits>
 #include <filesystem>
-#include <system_error>
 #include <string_view>
+#include <system_error>
 #include <utility>
 
 #include "device/base/open_below.h"

@@ -1,0 +1,43 @@
+// From a request to the launcher, and from its answer to a response.
+#pragma once
+
+#include <httplib.h>
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <string>
+
+#include "device/web/exchange.h"
+
+namespace Web {
+
+inline constexpr std::chrono::seconds kAnswerTime(60);  // to take a part of an answer, an event
+inline constexpr char kJson[] = "application/json";
+
+using Asking = std::shared_ptr<Exchange>;
+
+// What the launcher is asked, as far as all requests are alike.
+Json::Value Asked(const httplib::Request& request, const char* kind);
+
+// Has the request served by a process of the launcher's.
+Asking Ask(Device::ControlKind kind, const Json::Value& asked);
+Asking Ask(const Json::Value& asked);
+
+void Respond(httplib::Response& response, const Device::Answer& answer);
+void Refuse(httplib::Response& response, int status, const std::string& reason);
+// What is said of a status that comes without a body.
+const char* ReasonFor(int status);
+
+// Passes on an answer and what its body is still to bring, part by part: who sends that waits until
+// the client has taken it.
+void PassOn(httplib::Response& response, const Device::Answer& answer, const Asking& exchange);
+void PassOn(httplib::Response& response, const Asking& exchange);
+
+// Reads the body. False, with the response's status, when it is none, too long or late, or breaks
+// off.
+bool ReadBody(const httplib::Request& request, const httplib::ContentReader& reader,
+              std::size_t most, const std::function<void(const std::string&)>& take,
+              httplib::Response& response);
+
+}  // namespace Web
