@@ -9,6 +9,7 @@
 #include "device/base/json_text.h"
 #include "device/model/config.h"
 #include "tests/device_fixture.h"
+#include "tests/emulation.h"
 
 namespace {
 
@@ -24,6 +25,16 @@ class CliTest : public DeviceTest {
   // On the test's own device.
   Ran As(const std::string& user, const std::string& command, const Strings& arguments = {}) {
     return Kavo(Strings{command, device_, "--user", user} + arguments);
+  }
+};
+
+// Commands as a shell starts them.
+class ShellTest : public CliTest {
+ protected:
+  void SetUp() override {
+    if (kIsEmulated) {
+      GTEST_SKIP() << "the shell is none of the emulated programs, and cannot start one";
+    }
   }
 };
 
@@ -81,7 +92,7 @@ TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
-TEST_F(CliTest, AnyStandardStreamMayBeClosed) {
+TEST_F(ShellTest, AnyStandardStreamMayBeClosed) {
   Add("vol1/photo/a.txt", "a");
   for (const std::string closed : {"<&-", ">&-", "2>&-", "<&- >&- 2>&-"}) {
     const std::string compress = Built("kavo-device") + " compress " + device_ +
@@ -98,7 +109,7 @@ TEST_F(CliTest, AnyStandardStreamMayBeClosed) {
   EXPECT_EQ(serve.Wait(), 0);
 }
 
-TEST_F(CliTest, OutputThatCannotBeWrittenIsNoSuccess) {
+TEST_F(ShellTest, OutputThatCannotBeWrittenIsNoSuccess) {
   Add("vol1/photo/a.txt", "a");
   const std::string device = " " + device_ + " --user alice ";
   for (const std::string& command :
@@ -114,7 +125,7 @@ TEST_F(CliTest, OutputThatCannotBeWrittenIsNoSuccess) {
   EXPECT_TRUE(fs::exists(At("vol1/photo/z.zip")));
 }
 
-TEST_F(CliTest, EndsQuietlyWhenTheReaderOfItsOutputIsGone) {
+TEST_F(ShellTest, EndsQuietlyWhenTheReaderOfItsOutputIsGone) {
   const std::string errors = temp_.Path() + "/err";
   Program unread({"/bin/sh", "-c", "kill -STOP $$; exec " + Built("kavo-device") + " --help"}, "/",
                  errors);

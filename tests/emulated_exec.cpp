@@ -18,9 +18,19 @@ using Device::FileDescriptor;
 
 constexpr char kDescriptors[] = "/proc/self/fd/";
 
-// Opened at once and inherited: a program that takes on another identity may have no way to walk
-// there.
-const int kSysroot = open(KAVO_SYSROOT, O_PATH | O_DIRECTORY);
+// Opened by the first of the programs and inherited by the others: one that has taken on another
+// identity may have no way to walk there.
+int OpenSysroot() {
+  constexpr char kVariable[] = "KAVO_SYSROOT_DESCRIPTOR";
+  if (const char* const inherited = getenv(kVariable)) {
+    return std::atoi(inherited);
+  }
+  const int sysroot = open(KAVO_SYSROOT, O_PATH | O_DIRECTORY);
+  setenv(kVariable, std::to_string(sysroot).c_str(), 1);
+  return sysroot;
+}
+
+const int kSysroot = OpenSysroot();
 
 template <typename Function>
 Function* Real(const char* name) {

@@ -40,9 +40,10 @@ FileDescriptor OpenBelow(int folder, const std::string& path, int flags) {
 
 FileDescriptor OpenUserPath(const std::vector<std::string>& fixed, const std::string& path,
                             int flags) {
-  std::string root = "/";
+  // The top folder's entries are the system's own.
+  std::string root = path.empty() ? "/" : path.substr(0, path.find('/', 1));
   for (const std::string& folder : fixed) {
-    if (folder.size() > root.size() && IsWithin(path, folder)) {
+    if (folder.size() >= root.size() && IsWithin(path, folder)) {
       root = folder;
     }
   }

@@ -13,8 +13,8 @@ namespace Device {
 // with errno, when it cannot; ELOOP for a link on the way.
 FileDescriptor OpenBelow(int folder, const std::string& path, int flags);
 
-// The same for an absolute path. Links are followed as far as the one of the shares that it lies
-// in, the innermost; where it lies in none, no link is followed at all.
+// The same for an absolute path, from the innermost of the `fixed` folders that it lies in: folders
+// that no user can rename or replace. Where it lies in none, from the folder below the top one.
 FileDescriptor OpenUserPath(const std::vector<std::string>& fixed, const std::string& path,
                             int flags);
 
