@@ -24,7 +24,7 @@ namespace {
 constexpr char kApi[] = "KAVO.Zantro.Compress";
 constexpr int kApiVersion = 3;
 constexpr std::chrono::milliseconds kFirstPause(50);
-constexpr std::chrono::milliseconds kLongestPause(250);
+constexpr std::chrono::milliseconds kLongestPause(1000);
 
 constexpr int kBarWidth = 40;
 constexpr char kEraseLine[] = "\r\x1b[K";
