@@ -100,8 +100,8 @@ TEST_F(TrustTest, WhoeverExchangesNamesReadsNothingAndChangesNothing) {
   };
   link_to(private_.substr(0, private_.rfind('/')), trap + "/home");
   link_to(private_, trap + "/file");
-  fs::create_directory(trap + "/work");
-  link_to(private_, trap + "/work/new");
+  fs::create_directory(trap + "/job");
+  link_to(private_, trap + "/job/new");
   constexpr char kStore[] = R"({"level":"store"})";
 
   // A selected folder, and one within.
@@ -117,7 +117,7 @@ TEST_F(TrustTest, WhoeverExchangesNamesReadsNothingAndChangesNothing) {
         std::error_code ignored;
         for (const auto& entry : fs::directory_iterator(photo_, ignored)) {
           if (Device::IsWorkFolderName(entry.path().filename())) {
-            exchange(entry.path(), trap + "/work");
+            exchange(entry.path(), trap + "/job");
           }
         }
       },
@@ -207,7 +207,7 @@ TEST(Fence, HoldsAProgramToWhatWasAllowed) {
     GTEST_SKIP() << "the kernel has no Landlock";
   }
   const TempFolder temp;
-  for (const char* name : {"/source/a", "/neighbour/b", "/work/old"}) {
+  for (const char* name : {"/source/a", "/neighbour/b", "/room/old"}) {
     WriteFile(temp.Path() + name, "x");
   }
   const auto open_folder = [&](const char* name) {
@@ -215,20 +215,20 @@ TEST(Fence, HoldsAProgramToWhatWasAllowed) {
   };
   Device::Fence fence;
   fence.AllowReading(open_folder("/source").Get());
-  fence.AllowWriting(open_folder("/work").Get());
+  fence.AllowWriting(open_folder("/room").Get());
   const Device::FileDescriptor folder = open_folder("");
   const struct {
     const char* script;
     bool is_allowed;
-  } rows[] = {{"cat source/a >work/new && mv work/new work/z && rm work/old", true},
+  } rows[] = {{"cat source/a >room/new && mv room/new room/z && rm room/old", true},
               {"head -c 1 /dev/urandom", true},
               {"cat neighbour/b", false},
-              {"ln -s ../neighbour/b work/l; cat work/l", false},
+              {"ln -s ../neighbour/b room/l; cat room/l", false},
               {"echo x >beside", false},
               {"echo x >source/a", false},
               {"rm source/a", false},
-              {"mv work/z beside", false},
-              {"ln source/a work/hard", false},
+              {"mv room/z beside", false},
+              {"ln source/a room/hard", false},
               {"ls neighbour", false},
               {"cat /etc/passwd", false},
               {"exec 3<>/dev/tcp/127.0.0.1/9", false},
