@@ -2,13 +2,11 @@
 
 #include <dirent.h>
 #include <poll.h>
-#include <sched.h>
 #include <sys/syscall.h>
 #include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cctype>
 #include <cerrno>
 #include <chrono>
 #include <cinttypes>
@@ -30,7 +28,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-constexpr std::size_t kJobsAtOnce = 4;  // of a user, that need not yield
 constexpr std::chrono::seconds kGrace(5);
 constexpr std::chrono::milliseconds kGroupPoll(5);
 
@@ -58,41 +55,20 @@ std::optional<ProcessStat> ReadStat(pid_t pid) {
 
 bool HasEnded(const ProcessStat& stat) { return stat.state == 'Z' || stat.state == 'X'; }
 
-// The entries of /proc, or of a process's folder "task", that are numbers.
-std::vector<pid_t> IdsIn(const std::string& folder) {
-  std::vector<pid_t> ids;
-  const std::unique_ptr<DIR, int (*)(DIR*)> entries(opendir(folder.c_str()), closedir);
-  while (const dirent* const entry = entries ? readdir(entries.get()) : nullptr) {
-    if (std::isdigit(static_cast<unsigned char>(entry->d_name[0])) != 0) {
-      ids.push_back(std::atoi(entry->d_name));
+bool IsEmpty(pid_t group) {
+  const std::unique_ptr<DIR, int (*)(DIR*)> processes(opendir("/proc"), closedir);
+  while (const dirent* const entry = processes ? readdir(processes.get()) : nullptr) {
+    const pid_t pid = std::atoi(entry->d_name);  // 0 of what is no process
+    const std::optional<ProcessStat> stat = pid > 0 ? ReadStat(pid) : std::nullopt;
+    if (stat && stat->group == group && !HasEnded(*stat)) {
+      return false;
     }
   }
-  return ids;
-}
-
-std::vector<pid_t> LivingProcesses(const std::set<pid_t>& groups) {
-  std::vector<pid_t> living;
-  for (const pid_t pid : IdsIn("/proc")) {
-    const std::optional<ProcessStat> stat = ReadStat(pid);
-    if (stat && groups.count(stat->group) != 0 && !HasEnded(*stat)) {
-      living.push_back(pid);
-    }
-  }
-  return living;
-}
-
-// The policy for all threads there. A failure costs time, no more.
-void Schedule(const std::set<pid_t>& groups, int policy) {
-  const sched_param none{};
-  for (const pid_t pid : LivingProcesses(groups)) {
-    for (const pid_t thread : IdsIn("/proc/" + std::to_string(pid) + "/task")) {
-      sched_setscheduler(thread, policy, &none);
-    }
-  }
+  return true;
 }
 
 bool WaitForGroup(pid_t group, Clock::time_point deadline) {
-  while (!LivingProcesses({group}).empty()) {
+  while (!IsEmpty(group)) {
     if (Clock::now() >= deadline) {
       return false;
     }
@@ -119,25 +95,6 @@ void WaitForProcess(const FileDescriptor& process, Clock::time_point deadline) {
   poll(&ended, 1, static_cast<int>(std::max<std::int64_t>(left.count(), 0)));
 }
 
-bool IsYielding(pid_t worker) { return sched_getscheduler(worker) == SCHED_IDLE; }
-
-// Answers come before the packing of a crowd. All its jobs yield, so that none waits for the
-// others.
-void YieldIfCrowded(const std::string& user, pid_t newest) {
-  std::set<pid_t> jobs;
-  for (const pid_t worker : StoreOf(user).AllWorkers()) {
-    if (IsWorkerAlive(user, worker)) {
-      jobs.insert(worker);
-    }
-  }
-  if (jobs.size() > kJobsAtOnce) {
-    // It may not lead its group yet; what it starts will yield like itself.
-    const sched_param none{};
-    sched_setscheduler(newest, SCHED_IDLE, &none);
-    Schedule(jobs, SCHED_IDLE);
-  }
-}
-
 }  // namespace
 
 void RegisterWorker(const std::string& user, pid_t pid) {
@@ -146,7 +103,6 @@ void RegisterWorker(const std::string& user, pid_t pid) {
     throw std::runtime_error("no process " + std::to_string(pid));
   }
   StoreOf(user).AddWorker(pid, stat->start_time);
-  YieldIfCrowded(user, pid);
 }
 
 bool IsWorkerAlive(const std::string& user, pid_t pid) {
@@ -184,9 +140,6 @@ bool EndWorker(const std::string& user, pid_t pid) {
     StoreOf(user).NoteStop(pid);
   } catch (const std::exception& no_room) {
     syslog(LOG_ERR, "stop: %s", no_room.what());
-  }
-  if (IsYielding(pid)) {
-    Schedule({pid}, SCHED_OTHER);
   }
   const Clock::time_point deadline = Clock::now() + kGrace;
   const bool is_told = has_descriptor

@@ -10,9 +10,7 @@
 
 namespace Device {
 
-// Enters a process that has just been forked. A user who has more than four workers gives way to
-// everybody else: all of these and their archivers then run with the policy SCHED_IDLE. Throws
-// std::runtime_error.
+// Enters a process that has just been forked. Throws std::runtime_error.
 void RegisterWorker(const std::string& user, pid_t pid);
 
 // True if the process is a worker of the user's and has not ended; a zombie has.
