@@ -8,6 +8,7 @@
 
 #include "device/base/json_text.h"
 #include "device/tasks/task_store.h"
+#include "device/tasks/user_tasks.h"
 #include "device/tasks/workers.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
@@ -101,6 +102,29 @@ TEST_F(TaskTest, AKilledJobIsReportedAsFailed) {
     EXPECT_TRUE(answer["finished"].asBool());
     EXPECT_EQ(Device::ToText(answer["errors"]), R"([{"code":1300,"path":"/photo/z.7z"}])");
     EXPECT_EQ(Ask("status", task_id).code, 599);
+  }
+}
+
+// What the module does not keep.
+TEST_F(TaskTest, ATaskShowsWhatTheArchiverTells) {
+  Add("vol1/photo/a.txt", "a");
+  const struct {
+    const char *output, *member, *expected;
+  } rows[] = {{"", "archive_size", "145"},
+              {"Progress: 29\nError: no", "progress", "0.28999999999999998"},
+              {"Error: no room for 'x'\nError: later\n", "reason", "\"no room for 'x'\""}};
+  for (const auto& row : rows) {
+    if (*row.output != '\0') {
+      ScriptArchiver(row.output);
+    }
+    Call("start", JobParams({"/photo/a.txt"}, "/photo/z.zip", R"({"level":"store"})"));
+    ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
+    const Device::TaskRow task = Device::AllTasks("alice").back();
+    const Json::Value view = Device::TaskView(task, {});
+    EXPECT_EQ(Device::ToText(view[row.member]), row.expected) << Device::ToText(view);
+    EXPECT_GE(view["ended"].asInt64(), view["started"].asInt64());
+    Device::StoreOf("alice").RemoveTask(task.id);
+    Device::CloseStores();
   }
 }
 

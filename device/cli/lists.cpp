@@ -11,6 +11,7 @@
 #include "device/cli/commands.h"
 #include "device/cli/output.h"
 #include "device/model/device.h"
+#include "device/tasks/job_queue.h"
 #include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
 #include "platform/lumo/file_manager.h"
@@ -35,8 +36,8 @@ int RunAs(const std::string& user, const std::function<void()>& body) {
   return WIFEXITED(status) ? WEXITSTATUS(status) : kExitFailed;
 }
 
-void PrintTask(const TaskRow& row) {
-  const Json::Value task = TaskView(row);
+void PrintTask(const TaskRow& row, const std::map<pid_t, std::size_t>& waiting) {
+  const Json::Value task = TaskView(row, waiting);
   std::cout << row.id << '\t' << task["state"].asString() << '\t'
             << std::lround(task["progress"].asDouble() * 100) << " %\t"
             << task["dest_file_path"].asString() << '\n';
@@ -55,8 +56,9 @@ std::string TimeText(std::time_t time) {
 int TasksCommand(const std::string& folder, const std::string& user) {
   Open(folder);
   return RunAs(user, [&] {
+    const auto waiting = WaitingWorkers();
     for (const TaskRow& row : AllTasks(user)) {
-      PrintTask(row);
+      PrintTask(row, waiting);
     }
   });
 }

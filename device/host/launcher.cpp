@@ -82,6 +82,7 @@ Launcher::Launcher(WorkerLog worker_log)
   };
   TheHost().leave_request = [this, worker_log] {
     answer_.Close();
+    KeepSessions();
     LiftMemoryLimit();
     Database::SetPatience(Database::kLongPatience);
     if (worker_log == WorkerLog::kSyslogOnly && IsStandardErrorRead()) {

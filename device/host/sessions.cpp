@@ -79,6 +79,12 @@ void SignOut(const std::string& session_id) {
   }
 }
 
+void KeepSessions() {
+  for (auto& [id, session] : Sessions()) {
+    session.has_ended = std::make_shared<Flag>(session.has_ended->load());
+  }
+}
+
 std::string UserOfSession(const std::string& session_id) {
   const auto& sessions = Sessions();
   const auto found = sessions.find(session_id);

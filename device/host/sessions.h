@@ -17,6 +17,10 @@ std::string SignIn(const std::string& user);
 // Any text may be given.
 void SignOut(const std::string& session_id);
 
+// From now on the sessions are for this process as they were, whoever ends them: a job that waits
+// for its turn goes on when its user has signed out.
+void KeepSessions();
+
 // The user of a session that has not ended; empty when there is none.
 std::string UserOfSession(const std::string& session_id);
 

@@ -9,6 +9,7 @@
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/host/sessions.h"
+#include "device/tasks/job_queue.h"
 #include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
 #include "device/tasks/workers.h"
@@ -28,8 +29,11 @@ class Watcher {
   bool Look() {
     const std::int64_t version = StoreOf(user_).Version();
     std::vector<pid_t> workers = WorkersAtWork();
+    auto waiting = WaitingWorkers();
+    const bool is_new = version != version_ || workers != workers_ || waiting != waiting_;
+    waiting_ = std::move(waiting);
     // All tasks are read only when there is something new: they can be large.
-    if (version != version_ || workers != workers_) {
+    if (is_new) {
       SendTasks();
       SendNotifications();
     }
@@ -62,7 +66,7 @@ class Watcher {
       if (!HasData(row)) {
         continue;
       }
-      const Json::Value view = TaskView(row);
+      const Json::Value view = TaskView(row, waiting_);
       tasks[id] = view;
       if (const auto known = tasks_.find(id); known == tasks_.end() || known->second != view) {
         Send("task", view);
@@ -92,6 +96,7 @@ class Watcher {
   std::int64_t last_;           // notification that was sent
   std::int64_t version_ = -1;   // of the store, when it was looked at
   std::vector<pid_t> workers_;  // that were at work
+  std::map<pid_t, std::size_t> waiting_;
   std::map<std::string, TaskRow> rows_;
   std::map<std::string, Json::Value> tasks_;  // as they were sent
   bool is_read_ = true;

@@ -19,6 +19,7 @@
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
 #include "device/platform/lumo/errors.h"
+#include "device/tasks/job_queue.h"
 #include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
 #include "platform/lumo/file_manager.h"
@@ -94,9 +95,10 @@ Answer ListFiles(const std::string& user, const std::string& path) {
 
 Answer ListTasks(const std::string& user) {
   Json::Value tasks(Json::arrayValue);
+  const auto waiting = WaitingWorkers();
   for (const TaskRow& row : AllTasks(user)) {
     if (HasData(row)) {
-      tasks.append(TaskView(row));
+      tasks.append(TaskView(row, waiting));
     }
   }
   return Answer(kHttpOk, JsonObject({{"tasks", tasks}}));

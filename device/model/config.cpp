@@ -18,7 +18,7 @@ namespace Device {
 namespace {
 
 const std::set<std::string> kReservedShares = {"home", "homes"};  // every user's own, and all
-const std::set<std::string> kReservedVolumes = {kUsersFolder, kConfigFile, kLockFile};
+const std::set<std::string> kReservedVolumes = {kUsersFolder, kConfigFile, kLockFile, kQueueFile};
 
 // Reads members of JSON objects and says on which line of the text something is wrong.
 class ConfigReader {
@@ -85,6 +85,13 @@ class ConfigReader {
       Fail(value, "'" + name + "' is not a valid name");
     }
     return name;
+  }
+
+  unsigned int Number(const Json::Value& value) const {
+    if (!value.isUInt() || value.asUInt() == 0) {
+      Fail(value, "expected a whole number above 0");
+    }
+    return value.asUInt();
   }
 
   [[noreturn]] void Fail(const Json::Value& value, const std::string& reason) const {
@@ -247,7 +254,11 @@ Config ParseConfig(const std::string& file) {
                     {{"volumes", read_volumes},
                      {"users", [&](const Json::Value& each) { users = each; }},
                      {"shares", [&](const Json::Value& each) { shares = each; }}},
-                    {});
+                    {{"jobs_at_once",
+                      [&](const Json::Value& each) { config.jobs_at_once = reader.Number(each); }},
+                     {"memory_for_jobs_mib", [&](const Json::Value& each) {
+                        config.memory_for_jobs = std::uint64_t{reader.Number(each)} << 20U;
+                      }}});
   reader.ReadArray(users, "users", [&](const Json::Value& each) { AddUser(reader, each, config); });
   reader.ReadArray(shares, "shares",
                    [&](const Json::Value& each) { AddShare(reader, each, config); });

@@ -3,6 +3,7 @@
 
 #include <sys/types.h>
 
+#include <cstdint>
 #include <map>
 #include <string>
 #include <vector>
@@ -32,6 +33,8 @@ struct Config {
   std::vector<User> users;
   std::vector<std::string> volumes;
   std::vector<Share> shares;
+  unsigned int jobs_at_once = 2;      // of one user
+  std::uint64_t memory_for_jobs = 0;  // bytes, of all that run; 0: half of what is installed
 
   // Null when there is none of that name.
   const User* FindUser(const std::string& name) const;

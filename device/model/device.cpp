@@ -53,6 +53,12 @@ std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
   device->archiver = OpenBesideProgram(kArchiverName, O_PATH);
   device->zip_program = OpenBesideProgram(kZipProgramName, O_PATH);
   device->module = OpenBesideProgram(kModuleName, O_RDONLY);
+  constexpr mode_t kPrivate = 0600;
+  const std::string queue = device->root + "/" + kQueueFile;
+  device->queue = FileDescriptor(open(queue.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, kPrivate));
+  if (!device->queue) {
+    ThrowErrno(queue);
+  }
   device->switches_identity = geteuid() == 0;
   if (device->switches_identity) {
     MakeReachable(device->root);

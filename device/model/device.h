@@ -3,7 +3,8 @@
 //
 // In the folder: device.json; a folder for each volume; in a volume its shared folders and, under
 // "homes", the users' homes; under "users" a folder for each user, that only that user can enter,
-// with the store of tasks; serve.lock while the device is served.
+// with the store of tasks; serve.lock and jobs.lock, empty files for the locks of who serves the
+// device and of its jobs.
 #pragma once
 
 #include <string>
@@ -22,6 +23,7 @@ inline constexpr gid_t kAdminsGroup = 65101;
 inline constexpr char kConfigFile[] = "device.json";
 inline constexpr char kUsersFolder[] = "users";
 inline constexpr char kLockFile[] = "serve.lock";
+inline constexpr char kQueueFile[] = "jobs.lock";
 inline constexpr char kHomeShare[] = "home";
 
 struct OpenDevice {
@@ -32,6 +34,7 @@ struct OpenDevice {
   FileDescriptor archiver;                // the program that runs in place of /usr/bin/7z
   FileDescriptor zip_program;             // which the archiver asks about zips
   FileDescriptor module;                  // the shared library that serves the requests
+  FileDescriptor queue;                   // that jobs are queued by locks on
 
   std::string VolumePath(const std::string& volume) const { return root + "/" + volume; }
   std::string HomePath(const User& user) const {

@@ -21,6 +21,11 @@ inline constexpr char kPropData[] = "data";
 inline constexpr char kDataPid[] = "pid";
 inline constexpr char kDataErrors[] = "errors";
 inline constexpr char kDataParams[] = "params";  // large when there are many sources
+// A property of the device's own: what the archiver has told, by member.
+inline constexpr char kPropArchiver[] = "archiver";
+inline constexpr char kArchiverFile[] = "file";          // that is packed
+inline constexpr char kArchiverReason[] = "reason";      // why it failed
+inline constexpr char kArchiverSize[] = "archive_size";  // bytes
 
 // A task as the store had it at one moment.
 struct TaskRow {

@@ -3,6 +3,7 @@
 #include <syslog.h>
 
 #include <algorithm>
+#include <cmath>
 #include <iterator>
 #include <utility>
 
@@ -46,6 +47,13 @@ Json::Value Destination(const TaskRow& row) {
   return dest.isString() ? dest : Json::Value("");
 }
 
+// The module stores a fraction of 32 bits, such as 0.28999999; meant are hundredths.
+double Progress(const TaskRow& row) {
+  constexpr double kSteps = 1000;
+  const Json::Value progress = Property(row, "progress").Value();
+  return progress.isNumeric() ? std::round(progress.asDouble() * kSteps) / kSteps : 0;
+}
+
 Json::Value GeneralError(const TaskRow& row) {
   Json::Value errors(Json::arrayValue);
   errors.append(JsonObject({{"path", Destination(row)}, {"code", KAVO::kErrGeneral}}));
@@ -57,7 +65,8 @@ void StoreFailure(const std::string& user, TaskRow& row) {
   data.members[kDataErrors] = ToText(GeneralError(row));
   const std::int64_t version = row.version;
   try {
-    StoreOf(user).UpdateTask(row, {{kPropData, data}}, true);
+    const Json::Value news = JsonObject({{kArchiverReason, "the job was killed"}});
+    StoreOf(user).UpdateTask(row, {{kPropData, data}, {kPropArchiver, news}}, true);
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "end of a killed worker: %s", error.what());
     row.properties[kPropData] = std::move(data);
@@ -111,21 +120,39 @@ std::vector<TaskRow> AllTasks(const std::string& user) {
 
 bool HasData(const TaskRow& row) { return Property(row, kPropData).IsObject(); }
 
-Json::Value TaskView(const TaskRow& row) {
+Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& waiting) {
   const StoredValue& data = Property(row, kPropData);
-  const Json::Value progress = Property(row, "progress").Value();
+  const StoredValue& archiver = Property(row, kPropArchiver);
   const Json::Value total_size = data.Member("total_size");
   Json::Value view = JsonObject({{"taskid", row.id},
                                  {"dest_file_path", Destination(row)},
-                                 {"state", HasFailed(row) ? "failed"
-                                           : row.finished ? "finished"
-                                                          : "running"},
-                                 {"progress", progress.isNumeric() ? progress.asDouble() : 0.0},
+                                 {"progress", Progress(row)},
                                  {"total_size", total_size.isNull() ? Json::Value(0U) : total_size},
                                  {"started", InfoOf(row).get("started", 0)}});
+  const auto add_if_known = [&](const char* name) {
+    if (archiver.HasMember(name)) {
+      view[name] = archiver.Member(name);
+    }
+  };
+  const Json::Value pid = data.Member(kDataPid);
+  const auto waits = pid.isInt() ? waiting.find(pid.asInt()) : waiting.end();
   if (HasFailed(row)) {
+    view["state"] = "failed";
     const bool is_listed = data.members.at(kDataErrors).size() <= kMostListedErrors;
     view[kDataErrors] = is_listed ? data.Member(kDataErrors) : GeneralError(row);
+    add_if_known(kArchiverReason);
+  } else if (row.finished) {
+    view["state"] = "finished";
+    add_if_known(kArchiverSize);
+  } else if (waits != waiting.end()) {
+    view["state"] = "waiting";
+    view["before"] = Json::UInt64{waits->second};
+  } else {
+    view["state"] = "running";
+    add_if_known(kArchiverFile);
+  }
+  if (row.finished) {
+    view["ended"] = Json::Int64{row.updated};
   }
   return view;
 }

@@ -30,8 +30,12 @@ std::vector<TaskRow> AllTasks(const std::string& user);
 // False for a moment, until "start" has stored what the task is about.
 bool HasData(const TaskRow& row);
 
-// "taskid", "dest_file_path", "state" ("running", "finished" or "failed"), "progress" (0 to 1),
-// "total_size" (bytes), "started" (seconds since 1970) and, of a failed one, "errors". No password.
-Json::Value TaskView(const TaskRow& row);
+// "taskid", "dest_file_path", "state" ("waiting", "running", "finished" or "failed"), "progress" (0
+// to 1), "total_size" (bytes), "started" and, of one that has ended, "ended" (seconds since 1970).
+// While it waits, "before": how many jobs come before it; while it runs, "file": what the archiver
+// packs; when it has finished, "archive_size" (bytes); when it has failed, "errors" and "reason":
+// what the archiver said. The last four stand where they are known. No password. `waiting` is what
+// WaitingWorkers says.
+Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& waiting);
 
 }  // namespace Device

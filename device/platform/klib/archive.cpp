@@ -85,6 +85,21 @@ void NoteWhatIsLeft(const Arguments& arguments, const std::string& work_folder) 
 
 }  // namespace
 
+void ArchiverNews::Take(const std::string& line) {
+  static const std::string kFile = "Compressing ";
+  static const std::string kError = "Error: ";
+  if (line.rfind(kFile, 0) == 0) {
+    file = line.substr(kFile.size());
+  } else if (reason.empty() && line.rfind(kError, 0) == 0) {  // what follows says less
+    reason = line.substr(kError.size());
+  }
+}
+
+ArchiverNews& TheArchiverNews() {
+  static ArchiverNews news;
+  return news;
+}
+
 ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun& run) {
   const Arguments arguments = TakeApart(argument_vector);
   const ArchiverCall call = {arguments.password, NewWorkFolderName(), TheDevice().zip_program.Get(),
@@ -119,6 +134,8 @@ ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun
 
 void TakeArchive(const ArchiverRun& run) {
   if (FileDescriptor made = ReceiveMadeArchive(run.call.Get())) {
+    struct stat status {};
+    TheArchiverNews().size = fstat(made.Get(), &status) == 0 ? status.st_size : 0;
     the_archive = {run.archive, std::move(made)};
   }
 }

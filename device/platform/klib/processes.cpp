@@ -5,6 +5,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <cstdarg>
 #include <cstring>
@@ -22,6 +23,7 @@
 #include "device/platform/klib/klib_error.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
+#include "device/tasks/job_queue.h"
 #include "device/tasks/leftovers.h"
 #include "device/tasks/task_store.h"
 #include "device/tasks/workers.h"
@@ -53,6 +55,17 @@ struct ProgramOutput {
   bool has_ended = false;
   int status = 0;         // wait status, once it has ended
   std::string last_line;  // what is left of it
+  std::string line;       // that is read, up to now
+
+  void TakeNews(const char* text, std::size_t size) {
+    for (const char* const end = text + size; text != end; ++text) {
+      if (*text != '\n') {
+        line += *text;
+      } else {
+        TheArchiverNews().Take(std::exchange(line, {}));
+      }
+    }
+  }
 
   void TakeEnd() {
     has_ended = true;
@@ -73,12 +86,14 @@ ssize_t ReadOutput(void* cookie, char* buffer, std::size_t size) {
   if (!source.has_ended) {
     const ssize_t got = TEMP_FAILURE_RETRY(read(source.output.Get(), buffer, size));
     if (got != 0) {
+      source.TakeNews(buffer, std::max<ssize_t>(got, 0));
       return got;
     }
     source.TakeEnd();
   }
   const std::size_t copied = source.last_line.copy(buffer, size);
   source.last_line.erase(0, copied);
+  source.TakeNews(buffer, copied);
   return static_cast<ssize_t>(copied);
 }
 
@@ -101,8 +116,8 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     ChildProcess child = std::strcmp(program, kArchiverProgram) == 0
                              ? StartArchiver(arguments, pipe.writer.Get(), archiver)
                              : StartProgram(program, arguments, pipe.writer.Get());
-    auto source = std::make_unique<ProgramOutput>(
-        ProgramOutput{std::move(pipe.reader), std::move(child), std::move(archiver), false, 0, {}});
+    auto source = std::make_unique<ProgramOutput>(ProgramOutput{
+        std::move(pipe.reader), std::move(child), std::move(archiver), false, 0, {}, {}});
     FILE* const stream = fopencookie(source.get(), mode, {ReadOutput, nullptr, nullptr, nullptr});
     if (stream == nullptr) {
       ThrowErrno("stream");
@@ -114,6 +129,7 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     return nullptr;
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s: %s", program, error.what());
+    TheArchiverNews().reason = error.what();
     KlibError(EPERM);
     return nullptr;
   }
@@ -134,8 +150,8 @@ int CloseProgram(FILE* stream) {
   return source->status;
 }
 
-// A process group of its own, and nothing of the request's.
-void BecomeWorker() {
+// A process group of its own, and nothing of the request's. Returns when it is the worker's turn.
+void BecomeWorker(Pipe& entered) {
   // No session of its own: where the kernel shares out time by sessions, the launcher would get no
   // more than each job does.
   setpgid(0, 0);
@@ -143,6 +159,9 @@ void BecomeWorker() {
   dup2(null.Get(), STDIN_FILENO);
   dup2(null.Get(), STDOUT_FILENO);
   TheHost().leave_request();
+  EnterQueue(TheDevice().config.FindUser(CurrentUser())->uid);
+  entered.writer.Close();
+  WaitForTurn();
 }
 
 pid_t ForkWorker() {
@@ -153,12 +172,21 @@ pid_t ForkWorker() {
   }
   CloseStores();
   try {
+    Pipe entered;  // closes when the worker has its place in the queue, before any that comes later
     ChildProcess worker = ChildProcess::Fork();
     if (worker.Pid() == 0) {
-      BecomeWorker();
+      try {
+        BecomeWorker(entered);
+      } catch (const std::exception& error) {
+        syslog(LOG_ERR, "worker: %s", error.what());
+        _exit(EXIT_FAILURE);
+      }
     } else {
       RegisterWorker(CurrentUser(), worker.Pid());
       TheHost().worker = worker.Pid();
+      entered.writer.Close();
+      char none = 0;
+      (void)!TEMP_FAILURE_RETRY(read(entered.reader.Get(), &none, 1));
     }
     return worker.Release();
   } catch (const std::exception& error) {

@@ -10,6 +10,7 @@
 
 #include "device/base/random_id.h"
 #include "device/platform/host_services.h"
+#include "device/platform/klib/archive.h"
 #include "device/platform/operations.h"
 #include "device/platform/vesk/task_state.h"
 #include "device/tasks/user_tasks.h"
@@ -47,6 +48,22 @@ auto LogAndThrow(const char* operation, Body body) {
   }
 }
 
+// For who watches the task: the module keeps no names of files and no reasons.
+Json::Value NewsOfArchiver() {
+  const Device::ArchiverNews& news = Device::TheArchiverNews();
+  Json::Value told(Json::objectValue);
+  for (const auto& [name, text] : {std::pair(Device::kArchiverFile, news.file),
+                                   std::pair(Device::kArchiverReason, news.reason)}) {
+    if (!text.empty()) {
+      told[name] = text;
+    }
+  }
+  if (news.size > 0) {
+    told[Device::kArchiverSize] = Json::UInt64{news.size};
+  }
+  return told;
+}
+
 }  // namespace
 
 const Device::StoredValue& Task::State::Find(const std::string& name) const {
@@ -76,6 +93,9 @@ bool Task::State::Store(bool is_finished) {
 
 bool Task::State::StoreNow(std::map<std::string, Device::StoredValue> properties,
                            bool is_finished) {
+  if (const Json::Value news = NewsOfArchiver(); !news.empty()) {
+    properties[Device::kPropArchiver] = news;
+  }
   try {
     return Device::StoreOf(user).UpdateTask(row, std::move(properties), is_finished);
   } catch (const std::exception& error) {

@@ -1,0 +1,239 @@
+#include "device/tasks/job_queue.h"
+
+#include <fcntl.h>
+#include <poll.h>
+#include <sched.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdio>
+#include <limits>
+#include <tuple>
+
+#include "device/base/file_descriptor.h"
+#include "device/model/device.h"
+
+namespace Device {
+
+namespace {
+
+// Where locks lie: the first byte is held while the queue changes, the others say by their bits
+// from above: running or waiting, ticket, user.
+constexpr off64_t kChange = 0;
+constexpr int kRunningBit = 62;
+constexpr int kTicketBit = 32;
+constexpr off64_t kLastByte = std::numeric_limits<off64_t>::max();
+
+off64_t PlaceOf(const QueuedJob& job) {
+  return off64_t{job.is_running} << kRunningBit | off64_t{job.ticket} << kTicketBit |
+         off64_t{job.user};
+}
+
+QueuedJob JobAt(off64_t place, pid_t worker) {
+  constexpr off64_t kTicketMask = (off64_t{1} << (kRunningBit - kTicketBit)) - 1;
+  return {worker, static_cast<uid_t>(place),
+          static_cast<std::uint32_t>(place >> kTicketBit & kTicketMask),
+          (place >> kRunningBit & 1) != 0};
+}
+
+struct flock64 Range(short type, off64_t first, off64_t length) {
+  struct flock64 range {};
+  range.l_type = type;
+  range.l_whence = SEEK_SET;
+  range.l_start = first;
+  range.l_len = length;
+  return range;
+}
+
+// Waits for the lock when the command is F_SETLKW64.
+void SetLock(int command, short type, off64_t place) {
+  struct flock64 range = Range(type, place, 1);
+  if (TEMP_FAILURE_RETRY(fcntl(TheDevice().queue.Get(), command, &range)) != 0) {
+    ThrowErrno("queue of jobs");
+  }
+}
+
+class Change {
+ public:
+  Change() { SetLock(F_SETLKW64, F_WRLCK, kChange); }
+  ~Change() {
+    struct flock64 range = Range(F_UNLCK, kChange, 1);
+    fcntl(TheDevice().queue.Get(), F_SETLK64, &range);
+  }
+  Change(const Change&) = delete;
+  Change& operator=(const Change&) = delete;
+};
+
+// The kernel tells one lock of a range, any: what lies beside it is asked for after.
+void AddJobsOfOthers(off64_t first, off64_t last, std::vector<QueuedJob>& jobs) {
+  if (first > last) {
+    return;
+  }
+  // A length of 0 reaches to the end of all files. Locks for reading, of who waits for the job, are
+  // not told.
+  struct flock64 found = Range(F_RDLCK, first, last == kLastByte ? 0 : last - first + 1);
+  if (fcntl(TheDevice().queue.Get(), F_GETLK64, &found) != 0) {
+    ThrowErrno("queue of jobs");
+  }
+  if (found.l_type != F_UNLCK) {
+    jobs.push_back(JobAt(found.l_start, found.l_pid));
+    AddJobsOfOthers(first, found.l_start - 1, jobs);
+    AddJobsOfOthers(found.l_start + found.l_len, last, jobs);
+  }
+}
+
+std::vector<QueuedJob> JobsOfOthers() {
+  std::vector<QueuedJob> jobs;
+  AddJobsOfOthers(kChange + 1, kLastByte, jobs);
+  return jobs;
+}
+
+struct RankedJob {
+  std::size_t rank;  // how many of its user's jobs go before it, or are at work
+  QueuedJob job;
+};
+
+std::vector<RankedJob> RankWaiting(std::vector<QueuedJob> jobs) {
+  std::sort(jobs.begin(), jobs.end(), [](const QueuedJob& one, const QueuedJob& other) {
+    return std::tuple(!one.is_running, one.ticket) < std::tuple(!other.is_running, other.ticket);
+  });
+  std::map<uid_t, std::size_t> counts;
+  std::vector<RankedJob> waiting;
+  for (const QueuedJob& job : jobs) {
+    const std::size_t rank = counts[job.user]++;
+    if (!job.is_running) {
+      waiting.push_back({rank, job});
+    }
+  }
+  std::stable_sort(
+      waiting.begin(), waiting.end(),
+      [](const RankedJob& one, const RankedJob& other) { return one.rank < other.rank; });
+  return waiting;
+}
+
+std::size_t CountRunning(const std::vector<QueuedJob>& jobs) {
+  return std::count_if(jobs.begin(), jobs.end(),
+                       [](const QueuedJob& job) { return job.is_running; });
+}
+
+bool IsIn(const QueuedJob& job, const std::vector<QueuedJob>& jobs) {
+  return std::any_of(jobs.begin(), jobs.end(), [&](const QueuedJob& each) {
+    return each.worker == job.worker && PlaceOf(each) == PlaceOf(job);
+  });
+}
+
+void WaitForEndOfAny(const std::vector<QueuedJob>& jobs) {
+  constexpr int kPauseMs = 50;  // where there are no such descriptors, under emulators
+  int timeout = -1;
+  std::vector<FileDescriptor> processes;
+  std::vector<pollfd> ends;
+  for (const QueuedJob& job : jobs) {
+    processes.emplace_back(static_cast<int>(syscall(SYS_pidfd_open, job.worker, 0)));
+    ends.push_back({processes.back().Get(), POLLIN, 0});
+    if (!processes.back()) {
+      timeout = kPauseMs;
+    }
+  }
+  // One that has ended meanwhile may have left its process id to another process.
+  const std::vector<QueuedJob> living = JobsOfOthers();
+  if (std::all_of(jobs.begin(), jobs.end(),
+                  [&](const QueuedJob& job) { return IsIn(job, living); })) {
+    poll(ends.data(), ends.size(), timeout);
+  }
+}
+
+QueuedJob& OwnJob() {
+  static QueuedJob job;
+  return job;
+}
+
+// The jobs at the time, and whether the own one has come to run.
+bool TakeTurn(std::vector<QueuedJob>& jobs) {
+  const Change change;
+  jobs = JobsOfOthers();
+  jobs.push_back(OwnJob());
+  if (!IsIn(OwnJob(), NextToRun(jobs, TheDevice().config.jobs_at_once, MostJobs()))) {
+    return false;
+  }
+  QueuedJob running = OwnJob();
+  running.is_running = true;
+  SetLock(F_SETLK64, F_WRLCK, PlaceOf(running));
+  SetLock(F_SETLK64, F_UNLCK, PlaceOf(OwnJob()));
+  OwnJob() = running;
+  return true;
+}
+
+// Until something has changed that this job waits for. Of each user's jobs the first alone waits
+// for the running ones: it would cost too much to wake all at each end.
+void WaitForChange(const std::vector<QueuedJob>& jobs) {
+  const QueuedJob* before = nullptr;  // the user's job that waits before this one
+  std::vector<QueuedJob> ahead = NextToRun(jobs, TheDevice().config.jobs_at_once, MostJobs());
+  for (const QueuedJob& job : jobs) {
+    if (job.is_running) {
+      ahead.push_back(job);
+    } else if (job.user == OwnJob().user && job.ticket < OwnJob().ticket &&
+               (before == nullptr || job.ticket > before->ticket)) {
+      before = &job;
+    }
+  }
+  if (before == nullptr) {
+    WaitForEndOfAny(ahead);
+  } else {
+    SetLock(F_SETLKW64, F_RDLCK, PlaceOf(*before));
+    SetLock(F_SETLK64, F_UNLCK, PlaceOf(*before));
+  }
+}
+
+}  // namespace
+
+std::vector<QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs) {
+  std::vector<QueuedJob> waiting;
+  for (const RankedJob& each : RankWaiting(std::move(jobs))) {
+    waiting.push_back(each.job);
+  }
+  return waiting;
+}
+
+std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t of_user,
+                                 std::size_t of_device) {
+  std::vector<QueuedJob> next;
+  std::size_t at_work = CountRunning(jobs);
+  for (const RankedJob& each : RankWaiting(jobs)) {
+    if (each.rank < of_user && at_work < of_device) {
+      next.push_back(each.job);
+      ++at_work;
+    }
+  }
+  return next;
+}
+
+std::size_t MostJobs() { return sysconf(_SC_NPROCESSORS_ONLN) + 1; }
+
+void EnterQueue(uid_t user) {
+  const Change change;
+  std::uint32_t ticket = 0;
+  for (const QueuedJob& job : JobsOfOthers()) {
+    ticket = std::max(ticket, job.ticket);
+  }
+  OwnJob() = {getpid(), user, ticket + 1, false};
+  SetLock(F_SETLK64, F_WRLCK, PlaceOf(OwnJob()));
+}
+
+void WaitForTurn() {
+  std::vector<QueuedJob> jobs;
+  while (!TakeTurn(jobs)) {
+    WaitForChange(jobs);
+  }
+}
+
+std::map<pid_t, std::size_t> WaitingWorkers() {
+  std::map<pid_t, std::size_t> before;
+  for (const QueuedJob& job : WaitingInOrder(JobsOfOthers())) {
+    before.emplace(job.worker, before.size());
+  }
+  return before;
+}
+
+}  // namespace Device

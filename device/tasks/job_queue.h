@@ -1,0 +1,47 @@
+// The queue of jobs: which workers run, and which wait until there is room.
+//
+// Of one user so many workers run as "jobs_at_once" in device.json says, of the device one more
+// than it has processors. Of those that wait, that worker is next whose user has the fewest at
+// work, and of one user's the one that was started first.
+//
+// The queue is the set of locks that the workers hold on a file which stays empty; where a lock
+// lies says whose it is. The kernel takes a lock back when its process ends, however that is, so
+// nothing is left behind, and the launchers of one device have one queue.
+#pragma once
+
+#include <sys/types.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <map>
+#include <vector>
+
+namespace Device {
+
+struct QueuedJob {
+  pid_t worker = -1;
+  uid_t user = 0;
+  std::uint32_t ticket = 0;  // grows in the order of start
+  bool is_running = false;
+};
+
+// The jobs that wait, in the order in which they are to run when each running one takes as long as
+// the others.
+std::vector<QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs);
+
+// The jobs that wait and for which there is room, in order.
+std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t of_user,
+                                 std::size_t of_device);
+
+// How many jobs run at most on the open device.
+std::size_t MostJobs();
+
+// The calling process's job. To be called in this order, once in a worker's process; each throws
+// std::system_error.
+void EnterQueue(uid_t user);
+void WaitForTurn();
+
+// For each waiting worker, how many jobs come before its own.
+std::map<pid_t, std::size_t> WaitingWorkers();
+
+}  // namespace Device
