@@ -5,9 +5,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
-#include <map>
 #include <memory>
+#include <set>
 
 #include "device/base/json_text.h"
 #include "device/base/open_below.h"
@@ -25,47 +26,40 @@ const char* KindOf(mode_t mode) {
   return S_ISDIR(mode) ? "folder" : S_ISREG(mode) ? "file" : S_ISLNK(mode) ? "link" : "other";
 }
 
-struct Entry {
-  explicit Entry(const struct stat& status)
-      : kind(KindOf(status.st_mode)),
-        size(S_ISDIR(status.st_mode) ? 0 : status.st_size),
-        modified(status.st_mtime) {}
+std::string Quoted(const std::string& name) {
+  const bool is_plain = std::all_of(name.begin(), name.end(), [](char each) {
+    return each >= ' ' && each <= '~' && each != '"' && each != '\\';
+  });
+  return is_plain ? '"' + name + '"' : ToUtf8Text(name);  // which takes its time
+}
 
-  const char* kind;
-  Json::Int64 size;
-  Json::Int64 modified;
-};
+// Text by text: values of all entries would take too much memory, and ten times as long.
+void AddEntry(std::string& entries, const std::string& name, const struct stat& status) {
+  const off_t size = S_ISDIR(status.st_mode) ? 0 : status.st_size;
+  entries.append(entries.empty() ? "" : ",").append("{\"kind\":\"").append(KindOf(status.st_mode));
+  entries.append("\",\"modified\":").append(std::to_string(status.st_mtime));
+  entries.append(",\"name\":").append(Quoted(name));
+  entries.append(",\"size\":").append(std::to_string(size)).append("}");
+}
 
-// Text by text: values of all entries would take too much memory.
-std::string Body(const std::string& path, bool is_writable,
-                 const std::map<std::string, Entry>& entries) {
-  std::string body = "{\"entries\":[";
-  for (const auto& [name, entry] : entries) {
-    body += ToUtf8Text(JsonObject({{"name", name},
-                                   {"kind", entry.kind},
-                                   {"size", entry.size},
-                                   {"modified", entry.modified}}));
-    body += ',';
-  }
-  if (!entries.empty()) {
-    body.pop_back();
-  }
-  return body + "],\"path\":" + ToUtf8Text(path) + ",\"writable\":" + ToText(is_writable) + "}";
+std::string Body(const std::string& path, bool is_writable, const std::string& entries) {
+  return "{\"entries\":[" + entries + "],\"path\":" + ToUtf8Text(path) +
+         ",\"writable\":" + ToText(is_writable) + "}";
 }
 
 // What the user has no access to at all is not shown.
 Listing ListShares(const std::string& user) {
-  std::map<std::string, Entry> entries;
-  std::vector<std::string> names = {kHomeShare};
+  std::string entries;
+  std::set<std::string> names = {kHomeShare};
   for (const Share& share : TheDevice().config.shares) {
-    names.push_back(share.name);
+    names.insert(share.name);
   }
   for (const std::string& name : names) {
     const ResolvedPath share = Resolve(TheDevice(), user, "/" + name);
     struct stat status {};
     if (share.error == 0 && AccessOf(share, user) != Access::kNone &&
         stat(share.real_path.c_str(), &status) == 0) {
-      entries.emplace(name, status);
+      AddEntry(entries, name, status);
     }
   }
   return {0, Body("/", false, entries)};
@@ -101,14 +95,20 @@ Listing ListFolder(const std::string& user, const std::string& path) {
     return errno == ELOOP ? Listing{KAVO::kErrOutsideShare, {}} : FailWithErrno(errno);
   }
   const std::unique_ptr<DIR, int (*)(DIR*)> directory(fdopendir(fd), closedir);
-  std::map<std::string, Entry> entries;
+  std::vector<std::string> names;
   while (const dirent* const found = readdir(directory.get())) {
     const std::string name = found->d_name;
+    if (name != "." && name != ".." && !IsWorkFolderName(name)) {
+      names.push_back(name);
+    }
+  }
+  std::sort(names.begin(), names.end());
+  std::string entries;
+  for (const std::string& name : names) {
     struct stat status {};
     // One that has gone meanwhile is not there.
-    if (name != "." && name != ".." && !IsWorkFolderName(name) &&
-        fstatat(fd, found->d_name, &status, AT_SYMLINK_NOFOLLOW) == 0) {
-      entries.emplace(name, status);
+    if (fstatat(fd, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0) {
+      AddEntry(entries, name, status);
     }
   }
   return {0, Body(folder.user_path, IsWritable(folder, fd), entries)};
