@@ -25,7 +25,7 @@ Exchange::Exchange(Device::ControlKind kind, const std::string& text) {
 Device::Answer Exchange::Receive() {
   const std::optional<Device::Answer> answer = Device::ReceiveAnswerHead(stream_.Get());
   const std::optional<std::size_t> length = Device::ReadFrameLength(stream_.Get());
-  body_length_ = length.value_or(0);
+  body_left_ = length.value_or(0);
   return answer && length
              ? *answer
              : Device::Refusal(Device::kHttpInternal, "the request ended without an answer");

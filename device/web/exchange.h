@@ -22,9 +22,12 @@ class Exchange {
   // The answer, whose body, of so many bytes, is then to be read; the status 500, with a body, when
   // the other side went without one.
   Device::Answer Receive();
-  std::size_t BodyLength() const { return body_length_; }
+  std::size_t BodyLeft() const { return body_left_; }
   // False when the other side is gone.
-  bool ReadBody(char* to, std::size_t size) { return Device::ReadAll(stream_.Get(), to, size); }
+  bool ReadBody(char* to, std::size_t size) {
+    body_left_ -= size;
+    return Device::ReadAll(stream_.Get(), to, size);
+  }
   // The next of the events that follow the answer, as the client gets it. Nothing at their end.
   std::optional<std::string> Next();
   // Waits for the next frame. False after the time-out.
@@ -32,7 +35,7 @@ class Exchange {
 
  private:
   Device::FileDescriptor stream_;
-  std::size_t body_length_ = 0;
+  std::size_t body_left_ = 0;
 };
 
 }  // namespace Web

@@ -50,6 +50,7 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
   server_.set_pre_routing_handler([this](const Request& request, Response& response) {
     // Whole answers only: the library would cut errors too, and send a file once for each range.
     const_cast<Request&>(request).ranges.clear();
+    ChooseEncoding(const_cast<Request&>(request).headers, request.version);
     if (is_ending_) {
       Refuse(response, Device::kHttpUnavailable, "the device is ending");
     } else if (IsForeign(request) || IsForeignHost(request)) {
@@ -99,7 +100,7 @@ void FrontEnd::AddRoutes() {
                     const httplib::ContentReader& /*body*/) { SignOut(request, response); });
   for (const char* kind : {Device::kKindSession, Device::kKindTasks, Device::kKindCodes}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
-      PassOn(response, Ask(Asked(request, kind)));
+      PassOn(request, response, Ask(Asked(request, kind)));
     });
   }
   server_.Get("/files", [](const Request& request, Response& response) {
@@ -114,7 +115,7 @@ void FrontEnd::AddRoutes() {
       exchange->Send("");
       answer = exchange->Receive();
     }
-    PassOn(response, answer, exchange);
+    PassOn(request, response, answer, exchange);
   });
   server_.Get("/events", [this](const Request& request, Response& response) {
     StreamEvents(request, response);
@@ -151,14 +152,15 @@ void FrontEnd::SignIn(const Request& request, const httplib::ContentReader& read
       Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
       return;
     }
-    PassOn(response, Ask(Device::ControlKind::kSignIn, sign_in));
+    PassOn(request, response, Ask(Device::ControlKind::kSignIn, sign_in));
   } catch (const std::runtime_error& error) {
     Refuse(response, Device::kHttpBadRequest, error.what());
   }
 }
 
 void FrontEnd::SignOut(const Request& request, Response& response) {
-  PassOn(response, std::make_shared<Exchange>(Device::ControlKind::kSignOut, SessionOf(request)));
+  PassOn(request, response,
+         std::make_shared<Exchange>(Device::ControlKind::kSignOut, SessionOf(request)));
 }
 
 void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& reader,
@@ -179,7 +181,7 @@ void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& rea
       exchange->Send("");
       answer = exchange->Receive();
     }
-    PassOn(response, answer, exchange);
+    PassOn(request, response, answer, exchange);
   }
 }
 
@@ -187,7 +189,7 @@ void FrontEnd::StreamEvents(const Request& request, Response& response) {
   const Asking exchange = Ask(Asked(request, Device::kKindEvents));
   const Device::Answer answer = exchange->Receive();
   if (answer.status != Device::kHttpOk) {
-    PassOn(response, answer, exchange);
+    PassOn(request, response, answer, exchange);
     return;
   }
   response.set_chunked_content_provider(

@@ -1,6 +1,7 @@
 #include "device/web/request_head.h"
 
 #include <algorithm>
+#include <regex>
 #include <string>
 
 #include "device/host/wire.h"
@@ -41,6 +42,17 @@ bool IsForeign(const Request& request) {
   return !origin.empty() && (origin.size() < host.size() ||
                              origin.compare(origin.size() - host.size(), host.size(), host) != 0 ||
                              origin.find("://") != origin.size() - host.size());
+}
+
+void ChooseEncoding(httplib::Headers& headers, const std::string& version) {
+  static const std::regex kGzip("gzip(?!\\s*;\\s*q=0)");
+  const auto accepted = headers.find("Accept-Encoding");
+  const bool is_gzip = accepted != headers.end() && version == "HTTP/1.1" &&
+                       std::regex_search(accepted->second, kGzip);
+  headers.erase("Accept-Encoding");
+  if (is_gzip) {
+    headers.emplace("Accept-Encoding", "gzip");
+  }
 }
 
 bool HasBodyRoute(const Request& request) {

@@ -39,23 +39,36 @@ Asking Ask(Device::ControlKind kind, const Json::Value& asked) {
 
 Asking Ask(const Json::Value& asked) { return Ask(Device::ControlKind::kRequest, asked); }
 
-void PassOn(Response& response, const Device::Answer& answer, const Asking& exchange) {
+void PassOn(const Request& request, Response& response, const Device::Answer& answer,
+            const Asking& exchange) {
   Respond(response, answer);
-  if (exchange->BodyLength() == 0) {
+  if (exchange->BodyLeft() == 0) {
     return;
   }
-  response.set_content_provider(
-      exchange->BodyLength(), kJson,
-      [exchange](std::size_t /*at*/, std::size_t left, httplib::DataSink& sink) {
-        std::array<char, 65536> part;
-        const std::size_t size = std::min(left, part.size());
-        Connection::OfThisThread().AllowForWriting(kAnswerTime);
-        return exchange->ReadBody(part.data(), size) && sink.write(part.data(), size);
-      });
+  const auto pass = [exchange](httplib::DataSink& sink) {
+    std::array<char, 65536> part;
+    const std::size_t size = std::min(exchange->BodyLeft(), part.size());
+    Connection::OfThisThread().AllowForWriting(kAnswerTime);
+    if (!exchange->ReadBody(part.data(), size) || !sink.write(part.data(), size)) {
+      return false;
+    }
+    if (exchange->BodyLeft() == 0 && sink.done) {
+      sink.done();
+    }
+    return true;
+  };
+  if (request.has_header("Accept-Encoding")) {  // the library compresses what has no length
+    response.set_chunked_content_provider(
+        kJson, [pass](std::size_t /*at*/, httplib::DataSink& sink) { return pass(sink); });
+  } else {
+    response.set_content_provider(exchange->BodyLeft(), kJson,
+                                  [pass](std::size_t /*at*/, std::size_t /*left*/,
+                                         httplib::DataSink& sink) { return pass(sink); });
+  }
 }
 
-void PassOn(Response& response, const Asking& exchange) {
-  PassOn(response, exchange->Receive(), exchange);
+void PassOn(const Request& request, Response& response, const Asking& exchange) {
+  PassOn(request, response, exchange->Receive(), exchange);
 }
 
 const char* ReasonFor(int status) {

@@ -31,8 +31,9 @@ const char* ReasonFor(int status);
 
 // Passes on an answer and what its body is still to bring, part by part: who sends that waits until
 // the client has taken it.
-void PassOn(httplib::Response& response, const Device::Answer& answer, const Asking& exchange);
-void PassOn(httplib::Response& response, const Asking& exchange);
+void PassOn(const httplib::Request& request, httplib::Response& response,
+            const Device::Answer& answer, const Asking& exchange);
+void PassOn(const httplib::Request& request, httplib::Response& response, const Asking& exchange);
 
 // Reads the body. False, with the response's status, when it is none, too long or late, or breaks
 // off.
