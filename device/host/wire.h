@@ -31,6 +31,7 @@ enum HttpStatus : int {
   kHttpContinue = 100,
   kHttpOk = 200,
   kHttpNoContent = 204,
+  kHttpNotModified = 304,
   kHttpBadRequest = 400,
   kHttpUnauthorized = 401,
   kHttpForbidden = 403,

@@ -34,7 +34,7 @@ constexpr char kPolicy[] =
 
 }  // namespace
 
-FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
+FrontEnd::FrontEnd(const PageFiles& page) {
   server_.new_task_queue = [] { return new ConnectionThreads; };
   server_.set_tcp_nodelay(true);
   server_.set_socket_options([this](int socket) {
@@ -76,18 +76,29 @@ FrontEnd::FrontEnd(const std::map<std::string, PageFile>& files) {
       Refuse(response, response.status, ReasonFor(response.status));
     }
   });
-  AddPage(files);
+  AddPage(page);
   AddRoutes();
 }
 
-void FrontEnd::AddPage(const std::map<std::string, PageFile>& files) {
-  for (const auto& [path, file] : files) {
+void FrontEnd::AddPage(const PageFiles& page) {
+  for (const auto& [path, file] : page.files) {
     std::string pattern;
     for (const char each : path) {
       pattern += each == '.' ? "\\." : std::string(1, each);
     }
-    server_.Get(pattern, [&file = file](const Request& /*request*/, Response& response) {
-      response.set_content(file.content, file.content_type);
+    const bool is_index = path == "/";
+    server_.Get(pattern, [&file = file, &page, is_index](const Request& request,
+                                                         Response& response) {
+      const std::string validator = "W/\"" + page.version + "\"";
+      response.headers.erase("Cache-Control");
+      response.set_header("Cache-Control", is_index ? "no-cache" : "max-age=31536000, immutable");
+      response.set_header("Vary", "Accept-Encoding");
+      response.set_header("ETag", validator);
+      if (request.get_header_value("If-None-Match").find(validator) != std::string::npos) {
+        response.status = Device::kHttpNotModified;
+      } else {
+        response.set_content(file.content, file.content_type);
+      }
     });
   }
 }

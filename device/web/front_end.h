@@ -4,7 +4,6 @@
 
 #include <httplib.h>
 
-#include <map>
 #include <string>
 
 #include "device/web/connection.h"
@@ -14,7 +13,7 @@ namespace Web {
 
 class FrontEnd {
  public:
-  explicit FrontEnd(const std::map<std::string, PageFile>& files);
+  explicit FrontEnd(const PageFiles& page);
 
   // Binds the port, any free one for 0, and returns it; -1 with errno when that fails.
   int Bind(const std::string& address, int port);
@@ -25,7 +24,7 @@ class FrontEnd {
 
  private:
   void AddRoutes();
-  void AddPage(const std::map<std::string, PageFile>& files);
+  void AddPage(const PageFiles& page);
   void Post(const char* route, void (*handler)(const httplib::Request&,
                                                const httplib::ContentReader&, httplib::Response&));
 

@@ -74,7 +74,7 @@ void WaitForTheEnd(const sigset_t& ending, Web::FrontEnd& front_end) {
 
 void Serve(const std::string& listen, int page) {
   const Address address = ParseAddress(listen);
-  const std::map<std::string, Web::PageFile> files = Web::ReadPageFiles(page);
+  const Web::PageFiles files = Web::ReadPageFiles(page);
   close(page);
   AllowManyDescriptors();
   Web::FrontEnd front_end(files);

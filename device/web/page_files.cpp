@@ -1,7 +1,10 @@
 #include "device/web/page_files.h"
 
 #include <filesystem>
+#include <functional>
+#include <regex>
 #include <stdexcept>
+#include <utility>
 
 #include "device/base/file_io.h"
 
@@ -28,14 +31,25 @@ std::string ContentType(const std::string& extension) {
 
 }  // namespace
 
-std::map<std::string, PageFile> ReadPageFiles(int folder) {
-  std::map<std::string, PageFile> files;
+PageFiles ReadPageFiles(int folder) {
+  std::map<std::string, PageFile> by_name;
+  std::string all;
   for (const auto& entry : fs::directory_iterator("/proc/self/fd/" + std::to_string(folder))) {
-    const std::string name = entry.path().filename().string();
-    files[name == kIndex ? "/" : "/" + name] = {Device::ReadTextFile(entry.path().string()),
-                                                ContentType(entry.path().extension().string())};
+    by_name[entry.path().filename().string()] = {Device::ReadTextFile(entry.path().string()),
+                                                 ContentType(entry.path().extension().string())};
   }
-  return files;
+  for (const auto& [name, file] : by_name) {
+    all.append(name).append(file.content);
+  }
+  PageFiles page{std::to_string(std::hash<std::string>()(all)), {}};
+  for (auto& [name, file] : by_name) {
+    if (name == kIndex) {
+      static const std::regex kFileUrl("(href|src)=\"/(?=[a-z])");
+      file.content = std::regex_replace(file.content, kFileUrl, "$1=\"/" + page.version + "/");
+    }
+    page.files[name == kIndex ? "/" : "/" + page.version + "/" + name] = std::move(file);
+  }
+  return page;
 }
 
 }  // namespace Web

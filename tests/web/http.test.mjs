@@ -17,7 +17,7 @@ const json = { 'Content-Type': 'application/json' };
 const guards = {
   'content-security-policy': /^default-src 'none'; (?!.*unsafe).*; frame-ancestors 'none'$/,
   'x-content-type-options': /^nosniff$/, 'referrer-policy': /^no-referrer$/,
-  'cross-origin-resource-policy': /^same-origin$/, 'cache-control': /^no-store$/ };
+  'cross-origin-resource-policy': /^same-origin$/, 'cache-control': /^no-(store|cache)$/ };
 let device;
 let plain;  // one that a plain user runs
 let alice;
@@ -62,7 +62,7 @@ test('each request is answered with its status and words, and guarded', async ()
   const id = alice.cookie.slice('session='.length);
   const rows = [
     [200, '<!DOCTYPE html>', '/'],
-    [200, 'import ', '/app.js'],
+    [404, 'no such route', '/app.js'],
     [200, '"alice"', '/session', cookie(`a=b; session=${id}; c=d`)],
     [401, 'no session', '/session', cookie(`xsession=${id}`)],
     [401, 'no session', '/session', cookie(`a=b; session2=${id}; csession=${id}`)],
@@ -95,6 +95,25 @@ test('each request is answered with its status and words, and guarded', async ()
   }
   const { stdout } = await run('curl', ['-s', '-H', 'Host: evil.example', `${device.url}/codes`]);
   assert.match(stdout, /another site's page/);
+});
+
+test('the page is asked for again by its validator, and what it consists of never', async () => {
+  const page = await alice.ask('/');
+  assert.equal(page.headers.get('cache-control'), 'no-cache');
+  const files = [...page.text.matchAll(/(?:href|src)="(\/.*?)"/g)].map(([, url]) => url);
+  assert.ok(files.length > 5);
+  for (const url of files) {
+    const { status, headers } = await fetch(device.url + url);
+    assert.deepEqual([status, headers.get('cache-control')], [200, 'max-age=31536000, immutable'], url);
+  }
+  const again = { headers: { 'If-None-Match': `W/"other", ${page.headers.get('etag')}` } };
+  assert.deepEqual([(await alice.ask('/', again)).status, (await alice.ask('/', again)).text], [304, '']);
+  for (const [accepted, sent] of [['br', null], ['br, gzip', 'gzip'], ['gzip; q=0', null]]) {
+    for (const route of ['/codes', files.at(-1)]) {
+      const { headers } = await fetch(device.url + route, { headers: { 'Accept-Encoding': accepted } });
+      assert.equal(headers.get('content-encoding'), sent, `${accepted} of ${route}`);
+    }
+  }
 });
 
 test('what a refused request leaves unread is no request', async () => {
