@@ -6,17 +6,13 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <memory>
 #include <set>
 
 #include "device/base/json_text.h"
-#include "device/base/open_below.h"
 #include "device/base/work_folder.h"
+#include "device/host/user_file.h"
 #include "device/model/device.h"
-#include "device/platform/lumo/errors.h"
-#include "device/platform/lumo/paths.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -48,7 +44,7 @@ std::string Body(const std::string& path, bool is_writable, const std::string& e
 }
 
 // What the user has no access to at all is not shown.
-Listing ListShares(const std::string& user) {
+std::string ListShares(const std::string& user) {
   std::string entries;
   std::set<std::string> names = {kHomeShare};
   for (const Share& share : TheDevice().config.shares) {
@@ -62,12 +58,7 @@ Listing ListShares(const std::string& user) {
       AddEntry(entries, name, status);
     }
   }
-  return {0, Body("/", false, entries)};
-}
-
-Listing FailWithErrno(int error_number) {
-  SetLastErrno(error_number);
-  return {LumoLibGetErr(), {}};
+  return Body("/", false, entries);
 }
 
 bool IsWritable(const ResolvedPath& folder, int fd) {
@@ -77,23 +68,12 @@ bool IsWritable(const ResolvedPath& folder, int fd) {
 
 }  // namespace
 
-Listing ListFolder(const std::string& user, const std::string& path) {
+std::string ListFolder(const std::string& user, const std::string& path) {
   if (path.find_first_not_of('/') == std::string::npos && !path.empty()) {
     return ListShares(user);
   }
-  const ResolvedPath folder = Resolve(TheDevice(), user, path);
-  if (folder.error != 0) {
-    return {folder.error, {}};
-  }
-  if (AccessOf(folder, user) == Access::kNone) {
-    return {KAVO::kErrNoPrivilege, {}};
-  }
-  const int fd =
-      OpenUserPath(TheDevice().FixedFolders(user), folder.real_path, O_RDONLY | O_DIRECTORY)
-          .Release();
-  if (fd < 0) {
-    return errno == ELOOP ? Listing{KAVO::kErrOutsideShare, {}} : FailWithErrno(errno);
-  }
+  const ResolvedPath folder = ResolveForUser(user, path);
+  const int fd = OpenForUser(user, folder, O_RDONLY | O_DIRECTORY).Release();
   const std::unique_ptr<DIR, int (*)(DIR*)> directory(fdopendir(fd), closedir);
   std::vector<std::string> names;
   while (const dirent* const found = readdir(directory.get())) {
@@ -111,7 +91,7 @@ Listing ListFolder(const std::string& user, const std::string& path) {
       AddEntry(entries, name, status);
     }
   }
-  return {0, Body(folder.user_path, IsWritable(folder, fd), entries)};
+  return Body(folder.user_path, IsWritable(folder, fd), entries);
 }
 
 }  // namespace Device

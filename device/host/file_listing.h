@@ -5,14 +5,9 @@
 
 namespace Device {
 
-struct Listing {
-  int error = 0;  // a KAVO::ErrorCode; 0: listed
-  // JSON: {"entries": [{"kind", "modified", "name", "size"}], "path", "writable"}
-  std::string body = {};
-};
-
-// Lists a user's folder, "/" for the shared folders. To be called with the user's identity, by
-// which the kernel decides. Links are listed, and not followed.
-Listing ListFolder(const std::string& user, const std::string& path);
+// Lists a user's folder, "/" for the shared folders, in JSON: {"entries": [{"kind", "modified",
+// "name", "size"}], "path", "writable"}. To be called with the user's identity, by which the kernel
+// decides. Links are listed, and not followed. Throws Refused.
+std::string ListFolder(const std::string& user, const std::string& path);
 
 }  // namespace Device

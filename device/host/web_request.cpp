@@ -4,6 +4,7 @@
 
 #include <chrono>
 #include <csignal>
+#include <map>
 #include <optional>
 #include <stdexcept>
 #include <utility>
@@ -12,9 +13,11 @@
 #include "device/base/json_text.h"
 #include "device/base/shortage.h"
 #include "device/host/body.h"
+#include "device/host/download.h"
 #include "device/host/file_listing.h"
 #include "device/host/sessions.h"
 #include "device/host/task_events.h"
+#include "device/host/user_file.h"
 #include "device/host/wire.h"
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
@@ -82,17 +85,6 @@ Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& a
              : Answer(kHttpOk, JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
 }
 
-Answer ListFiles(const std::string& user, const std::string& path) {
-  Listing listing = ListFolder(user, path);
-  if (listing.error == 0) {
-    return {kHttpOk, std::move(listing.body)};
-  }
-  const bool is_forbidden =
-      listing.error == KAVO::kErrNoPrivilege || listing.error == KAVO::kErrOutsideShare;
-  return Answer(is_forbidden ? kHttpForbidden : kHttpNotFound,
-                JsonObject({{"code", listing.error}, {"error", ErrorText(listing.error)}}));
-}
-
 Answer ListTasks(const std::string& user) {
   Json::Value tasks(Json::arrayValue);
   const auto waiting = WaitingWorkers();
@@ -124,12 +116,29 @@ void StreamEvents(int stream, const std::string& user, const std::string& sessio
   }
 }
 
+struct UserRequest {
+  int stream;
+  std::string user;
+  std::string body;
+};
+
+// What is asked about a user's files, with that user's identity.
+const std::map<std::string, void (*)(const UserRequest&)> kOfFiles = {
+    {kKindFiles,
+     [](const UserRequest& request) {
+       SendAnswer(request.stream, Answer(kHttpOk, ListFolder(request.user, request.body)));
+     }},
+    {kKindDownload,
+     [](const UserRequest& request) { SendFile(request.stream, request.user, request.body); }},
+};
+
 void Serve(Launcher& launcher, const Json::Value& asked) {
   const int stream = launcher.AnswerStream().Get();
   const std::string kind = asked["kind"].asString();
   const std::string session_id = asked["session"].asString();
+  const auto of_files = kOfFiles.find(kind);
   std::optional<std::string> body;
-  if ((kind == kKindCall || kind == kKindFiles) && !(body = ReceiveBody(stream))) {
+  if ((kind == kKindCall || of_files != kOfFiles.end()) && !(body = ReceiveBody(stream))) {
     return;
   }
   const std::string user = UserOfSession(session_id);
@@ -143,8 +152,8 @@ void Serve(Launcher& launcher, const Json::Value& asked) {
     SendAnswer(stream, Answer(kHttpOk, SessionBody(user)));
   } else {
     TakeIdentity(session_id, user);
-    if (kind == kKindFiles) {
-      SendAnswer(stream, ListFiles(user, *body));
+    if (of_files != kOfFiles.end()) {
+      of_files->second({stream, user, std::move(*body)});
     } else if (kind == kKindTasks) {
       SendAnswer(stream, ListTasks(user));
     } else {
@@ -166,6 +175,8 @@ void ServeWebRequest(Launcher& launcher, FileDescriptor stream, const Json::Valu
     LimitMemory(kMostMemory);
     Database::SetPatience(kStorePatience);
     Serve(launcher, asked);
+  } catch (const Refused& refused) {
+    SendAnswer(answer, refused.answer);
   } catch (const std::exception& error) {
     if (dynamic_cast<const Json::RuntimeError*>(&error) != nullptr) {
       TheShortage() = Shortage::kMemory;  // so the library says it

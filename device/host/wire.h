@@ -12,7 +12,8 @@
 //
 // Of a request with a body the first answer may have the status 100: it is the request's turn. Then
 // the body goes there as it came, in frames that an empty one ends, and the answer comes. An answer
-// to kKindEvents is followed by frames of server-sent events, as the client gets them.
+// to kKindEvents is followed by frames of server-sent events, as the client gets them; one to
+// kKindDownload without a body by a message, the user's name with the file's descriptor.
 #pragma once
 
 #include <json/json.h>
@@ -31,6 +32,7 @@ enum HttpStatus : int {
   kHttpContinue = 100,
   kHttpOk = 200,
   kHttpNoContent = 204,
+  kHttpPartialContent = 206,
   kHttpNotModified = 304,
   kHttpBadRequest = 400,
   kHttpUnauthorized = 401,
@@ -39,6 +41,7 @@ enum HttpStatus : int {
   kHttpTimeout = 408,
   kHttpTooLarge = 413,
   kHttpNotDecoded = 415,
+  kHttpNoSuchRange = 416,
   kHttpTooMany = 429,
   kHttpInternal = 500,
   kHttpUnavailable = 503
@@ -67,9 +70,10 @@ bool SendControl(int socket, ControlKind kind, const std::string& text, int stre
 std::optional<ControlMessage> ReceiveControl(int socket);
 
 // What a request asks for, by its "kind"; "client" is the address that it comes from.
-inline constexpr char kKindCall[] = "call";        // "type", the body's; body: the API's request
-inline constexpr char kKindSession[] = "session";  // who is signed in
-inline constexpr char kKindFiles[] = "files";      // body: the path
+inline constexpr char kKindCall[] = "call";          // "type", the body's; body: the API's request
+inline constexpr char kKindSession[] = "session";    // who is signed in
+inline constexpr char kKindFiles[] = "files";        // body: the path
+inline constexpr char kKindDownload[] = "download";  // body: the path; see below
 inline constexpr char kKindTasks[] = "tasks";
 inline constexpr char kKindEvents[] = "events";
 inline constexpr char kKindCodes[] = "codes";  // no session needed

@@ -33,6 +33,11 @@ Device::Answer Exchange::Receive() {
 
 std::optional<std::string> Exchange::Next() { return Device::ReadFrame(stream_.Get()); }
 
+std::optional<Device::SocketMessage> Exchange::ReceiveFile() {
+  constexpr std::size_t kMostNameBytes = 256;
+  return Device::ReceiveMessage(stream_.Get(), kMostNameBytes);
+}
+
 bool Exchange::Wait(int milliseconds) const {
   pollfd source = {stream_.Get(), POLLIN, 0};
   return poll(&source, 1, milliseconds) != 0;

@@ -7,6 +7,7 @@
 
 #include "device/base/file_descriptor.h"
 #include "device/base/file_io.h"
+#include "device/base/socket_message.h"
 #include "device/host/wire.h"
 
 namespace Web {
@@ -30,6 +31,8 @@ class Exchange {
   }
   // The next of the events that follow the answer, as the client gets it. Nothing at their end.
   std::optional<std::string> Next();
+  // The file that follows an answer about it, and its user's name; nothing when none does.
+  std::optional<Device::SocketMessage> ReceiveFile();
   // Waits for the next frame. False after the time-out.
   bool Wait(int milliseconds) const;
 

@@ -12,6 +12,7 @@
 #include "device/base/json_text.h"
 #include "device/host/body.h"
 #include "device/web/connection.h"
+#include "device/web/download.h"
 #include "device/web/request_head.h"
 #include "device/web/responses.h"
 
@@ -114,20 +115,11 @@ void FrontEnd::AddRoutes() {
       PassOn(request, response, Ask(Asked(request, kind)));
     });
   }
-  server_.Get("/files", [](const Request& request, Response& response) {
-    if (!request.has_param("path")) {
-      Refuse(response, Device::kHttpBadRequest, "'path' is missing");
-      return;
-    }
-    const Asking exchange = Ask(Asked(request, Device::kKindFiles));
-    Device::Answer answer = exchange->Receive();
-    if (answer.status == Device::kHttpContinue) {
-      exchange->Send(request.get_param_value("path"));
-      exchange->Send("");
-      answer = exchange->Receive();
-    }
-    PassOn(request, response, answer, exchange);
-  });
+  for (const char* kind : {Device::kKindFiles, Device::kKindDownload}) {
+    server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
+      AskAboutPath(kind, request, response);
+    });
+  }
   server_.Get("/events", [this](const Request& request, Response& response) {
     StreamEvents(request, response);
   });
@@ -193,6 +185,27 @@ void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& rea
       answer = exchange->Receive();
     }
     PassOn(request, response, answer, exchange);
+  }
+}
+
+void FrontEnd::AskAboutPath(const char* kind, const Request& request, Response& response) {
+  if (!request.has_param("path")) {
+    Refuse(response, Device::kHttpBadRequest, "'path' is missing");
+    return;
+  }
+  const Asking exchange = Ask(Asked(request, kind));
+  Device::Answer answer = exchange->Receive();
+  if (answer.status == Device::kHttpContinue) {
+    exchange->Send(request.get_param_value("path"));
+    exchange->Send("");
+    answer = exchange->Receive();
+  }
+  if (answer.status != Device::kHttpOk || exchange->BodyLeft() > 0) {
+    PassOn(request, response, answer, exchange);
+  } else if (std::optional<Device::SocketMessage> file = exchange->ReceiveFile()) {
+    SendFile(request, response, answer, std::move(*file));
+  } else {
+    Refuse(response, Device::kHttpInternal, "the request ended without an answer");
   }
 }
 

@@ -33,6 +33,8 @@ class FrontEnd {
   static void SignOut(const httplib::Request& request, httplib::Response& response);
   static void CallApi(const httplib::Request& request, const httplib::ContentReader& reader,
                       httplib::Response& response);
+  static void AskAboutPath(const char* kind, const httplib::Request& request,
+                           httplib::Response& response);
   void StreamEvents(const httplib::Request& request, httplib::Response& response);
 
   Server server_;

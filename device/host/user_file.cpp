@@ -1,0 +1,60 @@
+#include "device/host/user_file.h"
+
+#include <fcntl.h>
+
+#include <cerrno>
+
+#include "device/base/json_text.h"
+#include "device/base/open_below.h"
+#include "device/model/device.h"
+#include "device/platform/lumo/errors.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+void RefuseFor(int code) {
+  const bool is_forbidden = code == KAVO::kErrNoPrivilege || code == KAVO::kErrOutsideShare;
+  throw Refused(Answer(is_forbidden ? kHttpForbidden : kHttpNotFound,
+                       JsonObject({{"code", code}, {"error", ErrorText(code)}})));
+}
+
+void RefuseForErrno(int error_number) {
+  if (error_number == ELOOP) {
+    RefuseFor(KAVO::kErrOutsideShare);
+  }
+  SetLastErrno(error_number);
+  RefuseFor(LumoLibGetErr());
+}
+
+ResolvedPath ResolveForUser(const std::string& user, const std::string& path) {
+  ResolvedPath resolved = Resolve(TheDevice(), user, path);
+  if (resolved.error != 0) {
+    RefuseFor(resolved.error);
+  }
+  if (AccessOf(resolved, user) == Access::kNone) {
+    RefuseFor(KAVO::kErrNoPrivilege);
+  }
+  return resolved;
+}
+
+FileDescriptor OpenForUser(const std::string& user, const ResolvedPath& path, int flags) {
+  FileDescriptor opened = OpenUserPath(TheDevice().FixedFolders(user), path.real_path, flags);
+  if (!opened) {
+    RefuseForErrno(errno);
+  }
+  return opened;
+}
+
+FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, struct stat& status) {
+  const FileDescriptor found = OpenForUser(user, path, O_PATH);
+  if (fstat(found.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
+    throw Refused(Refusal(kHttpNotFound, "not a file"));
+  }
+  FileDescriptor file(open(PathOf(found.Get()).c_str(), O_RDONLY | O_CLOEXEC));
+  if (!file) {
+    RefuseForErrno(errno);
+  }
+  return file;
+}
+
+}  // namespace Device

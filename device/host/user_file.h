@@ -1,0 +1,37 @@
+// What a user's path names, opened for a request of that user.
+#pragma once
+
+#include <sys/stat.h>
+
+#include <exception>
+#include <string>
+#include <utility>
+
+#include "device/base/file_descriptor.h"
+#include "device/host/wire.h"
+#include "device/platform/lumo/paths.h"
+
+namespace Device {
+
+// Thrown where a request has no other answer.
+struct Refused : std::exception {
+  explicit Refused(Answer refusal) : answer(std::move(refusal)) {}
+
+  Answer answer;
+};
+
+// Throws Refused with a KAVO::ErrorCode and its words.
+[[noreturn]] void RefuseFor(int code);
+[[noreturn]] void RefuseForErrno(int error_number);
+
+// Opens it by the identity of the process, which must be the user's; follows no link. Throws
+// Refused.
+FileDescriptor OpenForUser(const std::string& user, const ResolvedPath& path, int flags);
+// For a path that leads to no place where the user has access, throws Refused.
+ResolvedPath ResolveForUser(const std::string& user, const std::string& path);
+
+// A regular file to be read, and no other is touched: to open a pipe or a device can have effects.
+// Throws Refused.
+FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, struct stat& status);
+
+}  // namespace Device
