@@ -48,7 +48,7 @@ std::string ContentDisposition(const std::string& name) {
   return "attachment; filename=\"" + ascii + "\"; filename*=UTF-8''" + quoted.str();
 }
 
-// Another one for each content that the file may have had.
+// Changes with the file's content.
 std::string Validator(const struct stat& status) {
   std::ostringstream text;
   text << '"' << std::hex << status.st_ino << '-' << status.st_size << '-' << status.st_ctim.tv_sec

@@ -29,15 +29,6 @@ std::string Quoted(const std::string& name) {
   return is_plain ? '"' + name + '"' : ToUtf8Text(name);  // which takes its time
 }
 
-// Text by text: values of all entries would take too much memory, and ten times as long.
-void AddEntry(std::string& entries, const std::string& name, const struct stat& status) {
-  const off_t size = S_ISDIR(status.st_mode) ? 0 : status.st_size;
-  entries.append(entries.empty() ? "" : ",").append("{\"kind\":\"").append(KindOf(status.st_mode));
-  entries.append("\",\"modified\":").append(std::to_string(status.st_mtime));
-  entries.append(",\"name\":").append(Quoted(name));
-  entries.append(",\"size\":").append(std::to_string(size)).append("}");
-}
-
 std::string Body(const std::string& path, bool is_writable, const std::string& entries) {
   return "{\"entries\":[" + entries + "],\"path\":" + ToUtf8Text(path) +
          ",\"writable\":" + ToText(is_writable) + "}";
@@ -67,6 +58,15 @@ bool IsWritable(const ResolvedPath& folder, int fd) {
 }
 
 }  // namespace
+
+// Text by text: values of all entries would take too much memory, and ten times as long.
+void AddEntry(std::string& entries, const std::string& name, const struct stat& status) {
+  const off_t size = S_ISDIR(status.st_mode) ? 0 : status.st_size;
+  entries.append(entries.empty() ? "" : ",").append("{\"kind\":\"").append(KindOf(status.st_mode));
+  entries.append("\",\"modified\":").append(std::to_string(status.st_mtime));
+  entries.append(",\"name\":").append(Quoted(name));
+  entries.append(",\"size\":").append(std::to_string(size)).append("}");
+}
 
 std::string ListFolder(const std::string& user, const std::string& path) {
   if (path.find_first_not_of('/') == std::string::npos && !path.empty()) {

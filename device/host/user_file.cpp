@@ -1,8 +1,11 @@
 #include "device/host/user_file.h"
 
 #include <fcntl.h>
+#include <poll.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <iterator>
 
 #include "device/base/json_text.h"
 #include "device/base/open_below.h"
@@ -55,6 +58,15 @@ FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, str
     RefuseForErrno(errno);
   }
   return file;
+}
+
+bool Patience::IsOver(int source) const {
+  using std::chrono::milliseconds;
+  const auto left = std::chrono::ceil<milliseconds>(end_ - std::chrono::steady_clock::now());
+  pollfd sources[] = {{stream_, POLLIN, 0}, {source, POLLIN, 0}};
+  poll(sources, std::size(sources),
+       source < 0 ? 0 : static_cast<int>(std::max(left, milliseconds(0)).count()));
+  return sources[0].revents != 0 || left.count() <= 0;
 }
 
 }  // namespace Device

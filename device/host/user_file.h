@@ -3,6 +3,7 @@
 
 #include <sys/stat.h>
 
+#include <chrono>
 #include <exception>
 #include <string>
 #include <utility>
@@ -33,5 +34,19 @@ ResolvedPath ResolveForUser(const std::string& user, const std::string& path);
 // A regular file to be read, and no other is touched: to open a pipe or a device can have effects.
 // Throws Refused.
 FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, struct stat& status);
+
+// How long a request may take: so long, and while the client waits.
+class Patience {
+ public:
+  Patience(int stream, std::chrono::seconds time)
+      : stream_(stream), end_(std::chrono::steady_clock::now() + time) {}
+
+  // Waits, when there is a source, until something can be read from it.
+  bool IsOver(int source = -1) const;
+
+ private:
+  int stream_;  // nothing is ever sent there: it becomes readable when the other side is closed
+  std::chrono::steady_clock::time_point end_;
+};
 
 }  // namespace Device

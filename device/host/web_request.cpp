@@ -2,19 +2,23 @@
 
 #include <syslog.h>
 
+#include <algorithm>
 #include <chrono>
 #include <csignal>
-#include <map>
 #include <optional>
+#include <set>
 #include <stdexcept>
 #include <utility>
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/base/shortage.h"
+#include "device/host/archive_contents.h"
 #include "device/host/body.h"
+#include "device/host/destination.h"
 #include "device/host/download.h"
 #include "device/host/file_listing.h"
+#include "device/host/selection_size.h"
 #include "device/host/sessions.h"
 #include "device/host/task_events.h"
 #include "device/host/user_file.h"
@@ -33,6 +37,8 @@ namespace {
 
 constexpr std::size_t kMostMemory = std::size_t{57} << 20U;
 constexpr std::chrono::seconds kStorePatience(2);
+constexpr std::chrono::seconds kArchiveTime(15);
+constexpr std::chrono::seconds kSizeTime(30);
 
 void TakeIdentity(const std::string& session_id, const std::string& user) {
   if (LumoLibUGIDSet(session_id.c_str(), user.c_str()) != 0) {
@@ -85,7 +91,7 @@ Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& a
              : Answer(kHttpOk, JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
 }
 
-Answer ListTasks(const std::string& user) {
+Json::Value TasksBody(const std::string& user) {
   Json::Value tasks(Json::arrayValue);
   const auto waiting = WaitingWorkers();
   for (const TaskRow& row : AllTasks(user)) {
@@ -93,15 +99,15 @@ Answer ListTasks(const std::string& user) {
       tasks.append(TaskView(row, waiting));
     }
   }
-  return Answer(kHttpOk, JsonObject({{"tasks", tasks}}));
+  return JsonObject({{"tasks", tasks}});
 }
 
-Answer ListCodes() {
+Json::Value CodesBody() {
   Json::Value body(Json::objectValue);
   for (const auto& [code, text] : ErrorTexts()) {
     body[std::to_string(code)] = text;
   }
-  return Answer(kHttpOk, body);
+  return body;
 }
 
 void StreamEvents(int stream, const std::string& user, const std::string& session_id) {
@@ -116,46 +122,53 @@ void StreamEvents(int stream, const std::string& user, const std::string& sessio
   }
 }
 
-struct UserRequest {
-  int stream;
-  std::string user;
-  std::string body;
-};
-
-// What is asked about a user's files, with that user's identity.
-const std::map<std::string, void (*)(const UserRequest&)> kOfFiles = {
-    {kKindFiles,
-     [](const UserRequest& request) {
-       SendAnswer(request.stream, Answer(kHttpOk, ListFolder(request.user, request.body)));
-     }},
-    {kKindDownload,
-     [](const UserRequest& request) { SendFile(request.stream, request.user, request.body); }},
-};
+Json::Value PathsOf(const Json::Value& asked, std::string body) {
+  try {
+    Json::Value paths = ParseBody(asked["type"].asString(), std::move(body))["paths"];
+    const auto is_text = [](const Json::Value& path) { return path.isString(); };
+    if (paths.isArray() && std::all_of(paths.begin(), paths.end(), is_text)) {
+      return paths;
+    }
+    throw std::runtime_error("'paths' is missing or no list of texts");
+  } catch (const std::runtime_error& error) {
+    throw Refused(Refusal(kHttpBadRequest, error.what()));
+  }
+}
 
 void Serve(Launcher& launcher, const Json::Value& asked) {
+  static const std::set<std::string> kWithBody = {kKindCall,    kKindFiles,       kKindDownload,
+                                                  kKindArchive, kKindDestination, kKindSize};
   const int stream = launcher.AnswerStream().Get();
   const std::string kind = asked["kind"].asString();
   const std::string session_id = asked["session"].asString();
-  const auto of_files = kOfFiles.find(kind);
   std::optional<std::string> body;
-  if ((kind == kKindCall || of_files != kOfFiles.end()) && !(body = ReceiveBody(stream))) {
+  if (kWithBody.count(kind) != 0 && !(body = ReceiveBody(stream))) {
     return;
   }
   const std::string user = UserOfSession(session_id);
+  const auto answer = [&](auto text) { SendAnswer(stream, Answer(kHttpOk, std::move(text))); };
   if (kind == kKindCodes) {
-    SendAnswer(stream, ListCodes());
+    answer(CodesBody());
   } else if (user.empty()) {
     SendAnswer(stream, Refusal(kHttpUnauthorized, "no session"));
   } else if (kind == kKindCall) {
     SendAnswer(stream, CallApi(launcher, user, asked, std::move(*body)));
   } else if (kind == kKindSession) {
-    SendAnswer(stream, Answer(kHttpOk, SessionBody(user)));
+    answer(SessionBody(user));
   } else {
     TakeIdentity(session_id, user);
-    if (of_files != kOfFiles.end()) {
-      of_files->second({stream, user, std::move(*body)});
+    if (kind == kKindFiles) {
+      answer(ListFolder(user, *body));
+    } else if (kind == kKindDownload) {
+      SendFile(stream, user, *body);
+    } else if (kind == kKindArchive) {
+      answer(ListArchive(user, *body, Patience(stream, kArchiveTime)));
+    } else if (kind == kKindDestination) {
+      answer(CheckDestination(user, session_id, *body));
+    } else if (kind == kKindSize) {
+      answer(SizeOf(user, PathsOf(asked, std::move(*body)), Patience(stream, kSizeTime)));
     } else if (kind == kKindTasks) {
-      SendAnswer(stream, ListTasks(user));
+      answer(TasksBody(user));
     } else {
       StreamEvents(stream, user, session_id);
     }

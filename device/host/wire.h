@@ -42,6 +42,7 @@ enum HttpStatus : int {
   kHttpTooLarge = 413,
   kHttpNotDecoded = 415,
   kHttpNoSuchRange = 416,
+  kHttpNoArchive = 422,
   kHttpTooMany = 429,
   kHttpInternal = 500,
   kHttpUnavailable = 503
@@ -74,6 +75,9 @@ inline constexpr char kKindCall[] = "call";          // "type", the body's; body
 inline constexpr char kKindSession[] = "session";    // who is signed in
 inline constexpr char kKindFiles[] = "files";        // body: the path
 inline constexpr char kKindDownload[] = "download";  // body: the path; see below
+inline constexpr char kKindArchive[] = "archive";    // body: the path
+inline constexpr char kKindDestination[] = "destination";  // body: the path
+inline constexpr char kKindSize[] = "size";                // "type", the body's; body: {"paths"}
 inline constexpr char kKindTasks[] = "tasks";
 inline constexpr char kKindEvents[] = "events";
 inline constexpr char kKindCodes[] = "codes";  // no session needed

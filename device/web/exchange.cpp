@@ -4,6 +4,10 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <iterator>
+
+#include "device/web/connection.h"
+
 namespace Web {
 
 namespace {
@@ -23,6 +27,13 @@ Exchange::Exchange(Device::ControlKind kind, const std::string& text) {
 }
 
 Device::Answer Exchange::Receive() {
+  pollfd sources[] = {{stream_.Get(), POLLIN, 0},
+                      {Connection::OfThisThread().socket(), POLLRDHUP, 0}};
+  while (stream_ && poll(sources, std::size(sources), -1) < 0) {
+  }
+  if (sources[0].revents == 0) {
+    stream_.Close();  // the client has gone, which the other side sees by this
+  }
   const std::optional<Device::Answer> answer = Device::ReceiveAnswerHead(stream_.Get());
   const std::optional<std::size_t> length = Device::ReadFrameLength(stream_.Get());
   body_left_ = length.value_or(0);

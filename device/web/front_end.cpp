@@ -9,6 +9,7 @@
 #include <memory>
 #include <stdexcept>
 
+#include "device/base/code_page.h"
 #include "device/base/json_text.h"
 #include "device/host/body.h"
 #include "device/web/connection.h"
@@ -32,6 +33,23 @@ constexpr std::size_t kMostTypeBytes = 100;  // of a Content-Type, for what it b
 constexpr char kPolicy[] =
     "default-src 'none'; script-src 'self'; style-src 'self'; img-src 'self'; connect-src 'self'; "
     "base-uri 'none'; form-action 'none'; frame-ancestors 'none'";
+
+// Those that people have zips in, and UTF-8.
+Json::Value CodePages() {
+  Json::Value names(Json::arrayValue);
+  names.append("");
+  for (const char* name :
+       {"CP437",      "CP850",  "CP852",  "CP855",      "CP857",      "CP861",      "CP862",
+        "CP863",      "CP865",  "CP866",  "CP869",      "CP874",      "CP932",      "CP936",
+        "CP949",      "CP950",  "CP1250", "CP1251",     "CP1252",     "CP1253",     "CP1254",
+        "CP1255",     "CP1256", "CP1257", "CP1258",     "EUC-JP",     "EUC-KR",     "GB18030",
+        "BIG5-HKSCS", "KOI8-R", "KOI8-U", "ISO-8859-1", "ISO-8859-2", "ISO-8859-15"}) {
+    if (Device::CodePage::Open(name) != nullptr) {
+      names.append(name);
+    }
+  }
+  return names;
+}
 
 }  // namespace
 
@@ -107,6 +125,10 @@ void FrontEnd::AddPage(const PageFiles& page) {
 void FrontEnd::AddRoutes() {
   Post(kSession, &FrontEnd::SignIn);
   Post(kWebApi, &FrontEnd::CallApi);
+  Post(kSize, &FrontEnd::CallApi);
+  server_.Get("/codepages", [](const Request& /*request*/, Response& response) {
+    response.set_content(Device::ToText(CodePages()) + "\n", kJson);
+  });
   server_.Delete(kSession,
                  [](const Request& request, Response& response,
                     const httplib::ContentReader& /*body*/) { SignOut(request, response); });
@@ -115,7 +137,8 @@ void FrontEnd::AddRoutes() {
       PassOn(request, response, Ask(Asked(request, kind)));
     });
   }
-  for (const char* kind : {Device::kKindFiles, Device::kKindDownload}) {
+  for (const char* kind : {Device::kKindFiles, Device::kKindDownload, Device::kKindArchive,
+                           Device::kKindDestination}) {
     server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
       AskAboutPath(kind, request, response);
     });
@@ -168,7 +191,8 @@ void FrontEnd::SignOut(const Request& request, Response& response) {
 
 void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& reader,
                        Response& response) {
-  Json::Value asked = Asked(request, Device::kKindCall);
+  Json::Value asked =
+      Asked(request, request.path == kWebApi ? Device::kKindCall : Device::kKindSize);
   asked["type"] = request.get_header_value("Content-Type").substr(0, kMostTypeBytes);
   const Asking exchange = Ask(asked);
   Device::Answer answer = exchange->Receive();

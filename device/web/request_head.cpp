@@ -57,7 +57,7 @@ void ChooseEncoding(httplib::Headers& headers, const std::string& version) {
 
 bool HasBodyRoute(const Request& request) {
   const std::string& path = request.path;
-  return request.method == "POST"     ? path == kSession || path == kWebApi
+  return request.method == "POST"     ? path == kSession || path == kWebApi || path == kSize
          : request.method == "DELETE" ? path == kSession
                                       : request.method == "GET" || request.method == "HEAD";
 }

@@ -9,6 +9,7 @@ namespace Web {
 
 inline constexpr char kSession[] = "/session";
 inline constexpr char kWebApi[] = "/webapi";
+inline constexpr char kSize[] = "/size";
 
 // The session cookie's value; empty when there is none.
 std::string SessionOf(const httplib::Request& request);

@@ -151,49 +151,6 @@ test('one user reaches neither tasks nor sessions nor files of another', async (
   }
 });
 
-test('a file is downloaded whole or in ranges, and nothing but a file', async () => {
-  const name = Buffer.from('vol1/photo/\xc3\xa9 "x"%\n\xff.txt', 'latin1');
-  device.add(name, '0123456789');
-  device.add('vol1/photo/empty', '');
-  const url = '/download?path=/photo/%C3%A9%20%22x%22%25%0A%FF.txt';
-  const whole = await alice.ask(url);
-  const [tag, time] = ['etag', 'last-modified'].map((header) => whole.headers.get(header));
-  assert.equal(whole.headers.get('content-disposition'),
-    'attachment; filename="_ _x____.txt"; filename*=UTF-8\'\'%C3%A9%20%22x%22%25%5F%5F.txt');
-  assert.equal(whole.headers.get('content-type'), 'application/octet-stream');
-  for (const [range, status, text, place, condition] of [
-    ['bytes=0-0', 206, '0', '0-0'], ['bytes=7-', 206, '789', '7-9'], ['bytes=-2', 206, '89', '8-9'],
-    ['bytes=-99', 200, '0123456789'], ['bytes=8-99999999999', 206, '89', '8-9'],
-    ['bytes=10-', 416, /^.*the file has 10 bytes.*$/m, '*'], ['bytes=-0', 416, /10 bytes/, '*'],
-    ['bytes=0-1,4-5', 200, '0123456789'], ['bytes=1-1', 206, '1', '1-1', tag], ['bytes=1-1', 206, '1', '1-1', time],
-    ['bytes=1-1', 200, '0123456789', undefined, '"other"'],
-  ]) {
-    const headers = { Range: range, ...condition && { 'If-Range': condition } };
-    const answer = await alice.ask(url, { headers });
-    assert.deepEqual([answer.status, answer.headers.get('content-range')],
-      [status, place ? `bytes ${place}/10` : null], range);
-    assert.match(answer.text, text instanceof RegExp ? text : new RegExp(`^${text}$`), range);
-  }
-  const head = await alice.ask(url, { method: 'HEAD', headers: { Range: 'bytes=1-1' } });
-  assert.deepEqual([head.status, head.headers.get('content-length'), head.text], [200, '10', '']);
-  const late = await alice.ask('/download?path=/photo/endless', { headers: { Range: `bytes=${2 ** 40 - 2}-` } });
-  assert.equal(late.text, '\0\0');
-  execFileSync('sh', ['-ec', `mkfifo pipe; ln -s cat.jpg link; ln -s /etc etc; echo x >closed
-    chmod 0600 closed`], { cwd: device.at('vol1/photo') });
-  const bob = await Guarded.signIn(device, 'bob');
-  for (const [path, status] of [['/photo/empty', 200], ['/photo/pipe', 404], ['/photo/link', 404], ['/photo/etc/passwd', 403],
-    ['/photo/trip', 404], ['/photo', 404], ['/', 404], ['/vault/x', 403], ['/home/../alice/x', 403],
-    ['/photo/closed', isRoot ? 403 : 200], ['/photo/none', 404]]) {
-    assert.equal((await bob.ask(`/download?path=${path}`)).status, status, path);
-  }
-  const stuck = [];
-  while (stuck.length < 17) stuck.push(await bob.fetch('/download?path=/photo/endless'));
-  assert.deepEqual(stuck.map(({ status }) => status), [...Array(16).fill(200), 429]);
-  assert.equal(device.processes('request').length, 0);
-  await Promise.all(stuck.map(({ body }) => body.cancel()));
-  await until(() => bob.ask('/download?path=/photo/cat.jpg').then(({ status }) => status === 200));
-});
-
 test('each process has its user\'s rights, and the front end none', { skip }, async () => {
   const [{ pid }] = device.processes('front end');
   assert.match(readFileSync(`/proc/${pid}/status`, 'utf8'),

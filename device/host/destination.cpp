@@ -1,0 +1,131 @@
+#include "device/host/destination.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+
+#include "device/base/json_text.h"
+#include "device/base/open_below.h"
+#include "device/model/device.h"
+#include "device/platform/lumo/errors.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+namespace {
+
+constexpr int kPrivilegeWrite = 2;
+constexpr int kFlagWriteSuspended = 0x2;
+constexpr int kCheckPathFlags = 32;
+constexpr int kAccessWrite = 2;
+
+// In the order of the worker's questions. 0, or a KAVO::ErrorCode.
+int CheckFolder(const std::string& user, const std::string& session_id, const std::string& path,
+                std::string& full_path) {
+  std::string in_home;
+  std::string unused[2];
+  if (LumoFullPathGet(path.c_str(), &full_path, &in_home, &unused[0], &unused[1], &user, "UTF-8") ==
+      0) {
+    return LumoLibGetErr();
+  }
+  int level = kPrivilegeWrite;
+  int flags = 0;
+  if (IsDirUserHome(in_home, nullptr) == 0 &&
+      LumoLibGetPrivilege(path.c_str(), user.c_str(), session_id.c_str(), &level, &flags) != 0) {
+    return LumoLibGetErr();
+  }
+  if (level != kPrivilegeWrite || (flags & kFlagWriteSuspended) != 0) {
+    return KAVO::kErrNoPrivilege;
+  }
+  const std::string folder = full_path.substr(0, full_path.rfind('/'));
+  const bool is_good =
+      LumoCheckPath(folder.c_str(), false, kCheckPathFlags, nullptr, true, false, nullptr) == 0 &&
+      ACLAccess(folder.c_str(), kAccessWrite) == 0;
+  return is_good ? 0 : LumoLibGetErr();
+}
+
+const char* FolderText(int code, const std::string& folder) {
+  struct stat status {};
+  switch (code) {
+    case KAVO::kErrNotFound:
+      return lstat(folder.c_str(), &status) == 0 ? "this is not a folder"
+                                                 : "there is no such folder";
+    case KAVO::kErrNoPrivilege:
+      return "you may not write in this folder";
+    default:
+      return ErrorText(code);
+  }
+}
+
+bool IsTaken(const FileDescriptor& folder, const std::string& name, struct stat& status) {
+  return fstatat(folder.Get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0;
+}
+
+// Where it begins.
+std::size_t LastLetter(const std::string& text) {
+  std::size_t at = text.size() - 1;
+  while (at > 0 && (static_cast<unsigned char>(text[at]) & 0xC0U) == 0x80) {
+    --at;
+  }
+  return at;
+}
+
+// "album (2).zip"; empty when no such name is short enough.
+std::string FreeName(const std::string& path, const FileDescriptor& folder,
+                     const std::string& name) {
+  const std::size_t dot = std::min(name.rfind('.'), name.size());
+  std::string stem = name.substr(0, dot);
+  std::string free = name;
+  struct stat status {};
+  for (int number = 2; IsTaken(folder, free, status); ++number) {
+    const std::string ending = " (" + std::to_string(number) + ")" + name.substr(dot);
+    for (free = stem + ending; LumoCheckFileName(path.c_str(), free.c_str()) < 0;
+         free = stem + ending) {
+      if (stem.empty()) {
+        return "";
+      }
+      stem.resize(LastLetter(stem));
+    }
+  }
+  return free;
+}
+
+}  // namespace
+
+Json::Value CheckDestination(const std::string& user, const std::string& session_id,
+                             const std::string& path) {
+  Json::Value answer = JsonObject({{"exists", false}, {"error", {}}, {"field", {}}});
+  const auto fail = [&](const char* field, const char* error) {
+    answer["field"] = field;
+    answer["error"] = error;
+    return answer;
+  };
+  std::string full_path;
+  const int code = CheckFolder(user, session_id, path, full_path);
+  const std::size_t slash = std::min(full_path.rfind('/'), full_path.size());
+  const std::string parent = full_path.substr(0, slash);
+  if (code != 0) {
+    return fail("folder", FolderText(code, parent));
+  }
+  const std::string name = full_path.substr(slash + 1);
+  if (LumoCheckFileName(parent.c_str(), name.c_str()) < 0) {
+    return fail("name", ErrorText(LumoLibGetErr()));
+  }
+  const FileDescriptor folder =
+      OpenUserPath(TheDevice().FixedFolders(user), parent, O_PATH | O_DIRECTORY);
+  struct stat status {};
+  if (IsTaken(folder, name, status)) {
+    if (!S_ISREG(status.st_mode)) {
+      return fail("name", S_ISDIR(status.st_mode) ? "a folder has this name"
+                                                  : "something else than a file has this name");
+    }
+    answer["exists"] = true;
+    answer["size"] = Json::Int64{status.st_size};
+    answer["modified"] = Json::Int64{status.st_mtime};
+  }
+  answer["free_name"] = FreeName(parent, folder, name);
+  return answer;
+}
+
+}  // namespace Device
