@@ -61,6 +61,10 @@ class Watcher {
 
   void SendTasks() {
     std::map<std::string, Json::Value> tasks;
+    std::map<std::string, pid_t> workers;
+    for (const auto& [id, row] : rows_) {
+      workers[id] = WorkerOf(row);
+    }
     ReadTasks(user_, rows_);
     for (const auto& [id, row] : rows_) {
       if (!HasData(row)) {
@@ -74,7 +78,11 @@ class Watcher {
     }
     for (const auto& [id, task] : tasks_) {
       if (tasks.count(id) == 0) {
-        Send("gone", JsonObject({{"taskid", id}}));
+        Json::Value gone = JsonObject({{"taskid", id}});
+        if (IsBeingStopped(user_, workers[id])) {
+          gone["stopped"] = true;
+        }
+        Send("gone", gone);
       }
     }
     tasks_ = std::move(tasks);

@@ -188,7 +188,9 @@ bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> prop
 
 void TaskStore::RemoveTask(const std::string& id, pid_t worker) {
   database_.InTransaction(kForWriting, [&] {
-    RemoveWorker(worker);
+    Statement(database_, "DELETE FROM workers WHERE pid = ? AND stopped = 0")
+        .Bind(std::int64_t{worker})
+        .Step();
     Statement secret(database_, "SELECT 1 FROM members WHERE task = ? AND instr(value, ?) LIMIT 1");
     if (secret.Bind(id).Bind(kSecret).Step()) {
       database_.MarkErasure();

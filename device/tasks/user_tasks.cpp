@@ -26,8 +26,7 @@ const StoredValue& Property(const TaskRow& row, const std::string& name) {
 bool HasFailed(const TaskRow& row) { return Property(row, kPropData).HasMember(kDataErrors); }
 
 bool HasLostWorker(const std::string& user, const TaskRow& row) {
-  const Json::Value pid = Property(row, kPropData).Member(kDataPid);
-  return !row.finished && !HasFailed(row) && pid.isInt() && HasDied(user, pid.asInt());
+  return !row.finished && !HasFailed(row) && HasDied(user, WorkerOf(row));
 }
 
 // What the task manager noted when the task was made.
@@ -116,6 +115,11 @@ std::vector<TaskRow> AllTasks(const std::string& user) {
     return one.updated < other.updated;
   });
   return all;
+}
+
+pid_t WorkerOf(const TaskRow& row) {
+  const Json::Value pid = Property(row, kPropData).Member(kDataPid);
+  return pid.isInt() ? pid.asInt() : -1;
 }
 
 bool HasData(const TaskRow& row) { return Property(row, kPropData).IsObject(); }

@@ -7,6 +7,7 @@
 #pragma once
 
 #include <json/json.h>
+#include <sys/types.h>
 
 #include <map>
 #include <optional>
@@ -29,6 +30,9 @@ std::vector<TaskRow> AllTasks(const std::string& user);
 
 // False for a moment, until "start" has stored what the task is about.
 bool HasData(const TaskRow& row);
+
+// The process that does or did it; -1 while there is none.
+pid_t WorkerOf(const TaskRow& row);
 
 // "taskid", "dest_file_path", "state" ("waiting", "running", "finished" or "failed"), "progress" (0
 // to 1), "total_size" (bytes), "started" and, of one that has ended, "ended" (seconds since 1970).

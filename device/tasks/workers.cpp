@@ -161,7 +161,7 @@ bool EndWorker(const std::string& user, pid_t pid) {
 void ForgetEndedWorkers(const std::string& user, const std::vector<pid_t>& workers,
                         const std::set<pid_t>& kept) {
   for (const pid_t pid : workers) {
-    if (kept.count(pid) == 0 && !IsWorkerAlive(user, pid)) {
+    if (kept.count(pid) == 0 && !IsWorkerAlive(user, pid) && !IsBeingStopped(user, pid)) {
       StoreOf(user).RemoveWorker(pid);
     }
   }

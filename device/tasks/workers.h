@@ -16,7 +16,8 @@ void RegisterWorker(const std::string& user, pid_t pid);
 // True if the process is a worker of the user's and has not ended; a zombie has.
 bool IsWorkerAlive(const std::string& user, pid_t pid);
 
-// True for 30 s after "stop" has begun to end the worker: its task is going to be removed.
+// True for 30 s after "stop" has begun to end the worker: its task is going to be removed, or has
+// been.
 bool IsBeingStopped(const std::string& user, pid_t pid);
 
 // True of a worker that is gone without having done all that a worker does, unless "stop" is ending
@@ -28,7 +29,7 @@ bool HasDied(const std::string& user, pid_t pid);
 // never registered as this user's worker, or could not be ended.
 bool EndWorker(const std::string& user, pid_t pid);
 
-// Forgets those of the workers that have ended, but those to be kept.
+// Forgets those of the workers that have ended, but those to be kept and those being stopped.
 void ForgetEndedWorkers(const std::string& user, const std::vector<pid_t>& workers,
                         const std::set<pid_t>& kept);
 

@@ -16,6 +16,7 @@
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
 #include "device/platform/vesk/task_state.h"
+#include "device/tasks/user_tasks.h"
 #include "device/tasks/workers.h"
 
 namespace Device {
@@ -48,14 +49,6 @@ bool WaitForTask(Vesk::Task::State& task, int seconds, const std::function<bool(
 
 bool HoldsErrors(const Vesk::Task::State& task) {
   return task.Find(kPropData).HasMember(kDataErrors);
-}
-
-// The worker that the task's data names, -1 when it names none.
-pid_t WorkerOf(const TaskRow& row) {
-  const auto data = row.properties.find(kPropData);
-  const Json::Value pid =
-      data == row.properties.end() ? Json::Value() : data->second.Member(kDataPid);
-  return pid.isInt() ? pid.asInt() : -1;
 }
 
 // When a worker went is not known; its last word in the store counts.
