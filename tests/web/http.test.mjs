@@ -206,6 +206,12 @@ test('the end of a job that nobody follows is told once, to the streams of then'
   const second = await other.start(['/photo/cat.jpg'], '/photo/second.zip');
   await until(() => [open, late].every((stream) => told(stream).includes(second)));
   assert.deepEqual([open, late].map(told), [[first, second], [second]]);
+  const { taskid } = await other.startEndless();
+  await until(() => open.events('task').some((task) => task.taskid === taskid));
+  await other.call('stop', { taskid });
+  await other.call('status', { taskid: first });
+  const gone = (id) => until(() => open.events('gone').find((event) => event.taskid === id));
+  assert.deepEqual([await gone(taskid), await gone(first)], [{ stopped: true, taskid }, { taskid: first }]);
   [open, late].forEach(({ close }) => close());
 });
 
