@@ -1,5 +1,3 @@
-#include "device/host/archive_contents.h"
-
 #include <unistd.h>
 
 #include <algorithm>
@@ -14,7 +12,7 @@
 #include "device/base/json_text.h"
 #include "device/base/open_below.h"
 #include "device/base/shortage.h"
-#include "device/host/file_listing.h"
+#include "device/host/user_files.h"
 
 namespace Device {
 

@@ -1,5 +1,3 @@
-#include "device/host/destination.h"
-
 #include <fcntl.h>
 #include <sys/stat.h>
 
@@ -7,6 +5,7 @@
 
 #include "device/base/json_text.h"
 #include "device/base/open_below.h"
+#include "device/host/user_files.h"
 #include "device/model/device.h"
 #include "device/platform/lumo/errors.h"
 #include "platform/lumo/file_manager.h"
@@ -62,31 +61,13 @@ bool IsTaken(const FileDescriptor& folder, const std::string& name, struct stat&
   return fstatat(folder.Get(), name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0;
 }
 
-// Where it begins.
-std::size_t LastLetter(const std::string& text) {
-  std::size_t at = text.size() - 1;
-  while (at > 0 && (static_cast<unsigned char>(text[at]) & 0xC0U) == 0x80) {
-    --at;
-  }
-  return at;
-}
-
-// "album (2).zip"; empty when no such name is short enough.
-std::string FreeName(const std::string& path, const FileDescriptor& folder,
-                     const std::string& name) {
+// "album (2).zip".
+std::string FreeName(const FileDescriptor& folder, const std::string& name) {
   const std::size_t dot = std::min(name.rfind('.'), name.size());
-  std::string stem = name.substr(0, dot);
   std::string free = name;
   struct stat status {};
   for (int number = 2; IsTaken(folder, free, status); ++number) {
-    const std::string ending = " (" + std::to_string(number) + ")" + name.substr(dot);
-    for (free = stem + ending; LumoCheckFileName(path.c_str(), free.c_str()) < 0;
-         free = stem + ending) {
-      if (stem.empty()) {
-        return "";
-      }
-      stem.resize(LastLetter(stem));
-    }
+    free = name.substr(0, dot) + " (" + std::to_string(number) + ")" + name.substr(dot);
   }
   return free;
 }
@@ -124,7 +105,10 @@ Json::Value CheckDestination(const std::string& user, const std::string& session
     answer["size"] = Json::Int64{status.st_size};
     answer["modified"] = Json::Int64{status.st_mtime};
   }
-  answer["free_name"] = FreeName(parent, folder, name);
+  const std::string free = FreeName(folder, name);
+  if (LumoCheckFileName(parent.c_str(), free.c_str()) >= 0) {
+    answer["free_name"] = free;
+  }
   return answer;
 }
 

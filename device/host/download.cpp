@@ -1,16 +1,11 @@
-#include "device/host/download.h"
-
-#include <algorithm>
 #include <array>
 #include <cctype>
-#include <cstring>
 #include <ctime>
-#include <iomanip>
 #include <sstream>
 
 #include "device/base/socket_message.h"
 #include "device/base/utf8.h"
-#include "device/host/user_file.h"
+#include "device/host/user_files.h"
 
 namespace Device {
 
@@ -25,35 +20,19 @@ std::string HttpTime(std::time_t time) {
 
 // How a browser is to name what it saves: for old ones in ASCII, for others in UTF-8.
 std::string ContentDisposition(const std::string& name) {
+  constexpr char kHexDigits[] = "0123456789ABCDEF";
   std::string ascii;
-  std::ostringstream quoted;
-  quoted << std::hex << std::uppercase << std::setfill('0');
-  for (std::size_t at = 0; at < name.size();) {
-    const std::size_t length = Utf8SequenceLength(name, at);
-    const auto first = static_cast<unsigned char>(name[at]);
-    const bool is_safe = std::isalnum(first) != 0 || std::strchr(" -._()", first) != nullptr;
-    const std::string letter =
-        length == 0 || first < ' ' || first == 0x7F ? "_" : name.substr(at, length);
-    ascii += is_safe ? name[at] : '_';
-    for (const char each : letter) {
-      const auto byte = static_cast<unsigned char>(each);
-      if (std::isalnum(byte) != 0 || byte == '.') {
-        quoted << each;
-      } else {
-        quoted << '%' << std::setw(2) << int{byte};
-      }
-    }
-    at += std::max<std::size_t>(length, 1);
+  std::string quoted;
+  for (const char each : name) {
+    const auto byte = static_cast<unsigned char>(each);
+    const bool is_plain = std::isalnum(byte) != 0 || each == '.' || each == '-';
+    ascii += is_plain || each == ' ' ? each : '_';
+    quoted += is_plain     ? std::string{each}
+              : byte < ' ' ? "_"
+                           : std::string{'%', kHexDigits[byte / 16], kHexDigits[byte % 16]};
   }
-  return "attachment; filename=\"" + ascii + "\"; filename*=UTF-8''" + quoted.str();
-}
-
-// Changes with the file's content.
-std::string Validator(const struct stat& status) {
-  std::ostringstream text;
-  text << '"' << std::hex << status.st_ino << '-' << status.st_size << '-' << status.st_ctim.tv_sec
-       << '-' << status.st_ctim.tv_nsec << '"';
-  return text.str();
+  return "attachment; filename=\"" + ascii +
+         (IsUtf8(name) ? "\"; filename*=UTF-8''" + quoted : "\"");
 }
 
 }  // namespace
@@ -63,9 +42,12 @@ void SendFile(int stream, const std::string& user, const std::string& path) {
   struct stat status {};
   const FileDescriptor file = OpenFileOf(user, resolved, status);
   const std::string name = resolved.user_path.substr(resolved.user_path.rfind('/') + 1);
+  std::ostringstream validator;  // changes with the content
+  validator << '"' << status.st_ino << '-' << status.st_size << '-' << status.st_ctim.tv_sec << '-'
+            << status.st_ctim.tv_nsec << '"';
   Answer answer(kHttpOk);
   answer.headers = {{"Content-Disposition", ContentDisposition(name)},
-                    {"ETag", Validator(status)},
+                    {"ETag", validator.str()},
                     {"Last-Modified", HttpTime(status.st_mtime)}};
   if (SendAnswer(stream, answer)) {
     SendMessage(stream, user, file.Get());

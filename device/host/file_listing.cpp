@@ -1,5 +1,3 @@
-#include "device/host/file_listing.h"
-
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
@@ -11,7 +9,7 @@
 
 #include "device/base/json_text.h"
 #include "device/base/work_folder.h"
-#include "device/host/user_file.h"
+#include "device/host/user_files.h"
 #include "device/model/device.h"
 
 namespace Device {

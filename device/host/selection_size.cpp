@@ -1,5 +1,3 @@
-#include "device/host/selection_size.h"
-
 #include <dirent.h>
 #include <fcntl.h>
 
@@ -9,6 +7,7 @@
 #include "device/base/json_text.h"
 #include "device/base/open_below.h"
 #include "device/base/work_folder.h"
+#include "device/host/user_files.h"
 #include "device/model/device.h"
 
 namespace Device {

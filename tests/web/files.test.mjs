@@ -22,14 +22,17 @@ before(async () => {
 after(() => device.remove());
 
 test('a file is downloaded whole or in ranges, and nothing but a file', async () => {
-  const name = Buffer.from('vol1/photo/\xc3\xa9 "x"%\n\xff.txt', 'latin1');
+  const name = Buffer.from('vol1/photo/\xc3\xa9 "x"%\n.txt', 'latin1');
   device.add(name, '0123456789');
+  device.add(Buffer.from('vol1/photo/a\xff', 'latin1'));
   device.add('vol1/photo/empty', '');
-  const url = '/download?path=/photo/%C3%A9%20%22x%22%25%0A%FF.txt';
+  const url = '/download?path=/photo/%C3%A9%20%22x%22%25%0A.txt';
   const whole = await alice.ask(url);
   const [tag, time] = ['etag', 'last-modified'].map((header) => whole.headers.get(header));
   assert.equal(whole.headers.get('content-disposition'),
-    'attachment; filename="_ _x____.txt"; filename*=UTF-8\'\'%C3%A9%20%22x%22%25%5F%5F.txt');
+    'attachment; filename="__ _x___.txt"; filename*=UTF-8\'\'%C3%A9%20%22x%22%25_.txt');
+  assert.equal((await alice.ask('/download?path=/photo/a%FF')).headers.get('content-disposition'),
+    'attachment; filename="a_"');
   assert.equal(whole.headers.get('content-type'), 'application/octet-stream');
   for (const [range, status, text, place, condition] of [
     ['bytes=0-0', 206, '0', '0-0'], ['bytes=7-', 206, '789', '7-9'], ['bytes=-2', 206, '89', '8-9'],
@@ -82,7 +85,7 @@ test('what would be wrong with a destination is told before there is a job', asy
   }
   for (const [path, exists, free] of [
     ['/photo/new.zip', false, 'new.zip'], ['/photo/a.zip', true, 'a (3).zip'], ['/home/a.zip', false, 'a.zip'],
-    [`/vault/${name(142)}`, false, name(142)], [`/photo/${name(254)}`, true, `${'x'.repeat(247)} (2).zip`],
+    [`/vault/${name(142)}`, false, name(142)], [`/photo/${name(254)}`, true, undefined],
   ]) {
     const { body } = await at(path);
     assert.deepEqual([body.error, body.exists, body.free_name], [null, exists, free], path);
@@ -154,4 +157,14 @@ test('a selection is counted as it would be packed, for as long as the client wa
   leaving.abort();
   await assert.rejects(counted);
   await until(() => device.processes('request').length === 0, 20);
+});
+
+test('every code page that is listed can be used', async () => {
+  const pages = JSON.parse((await alice.ask('/codepages')).text);
+  const state = async (codepage, index) => {
+    const taskid = await alice.start(['/photo/cat.jpg'], `/photo/in${index}.zip`, { codepage });
+    return until(async () => (await alice.tasks())
+      .find((task) => task.taskid === taskid && /finished|failed/.test(task.state))?.state);
+  };
+  assert.deepEqual(await Promise.all([...pages, 'CP1'].map(state)), [...pages.map(() => 'finished'), 'failed']);
 });

@@ -1,4 +1,4 @@
-#include "device/host/user_file.h"
+#include "device/host/user_path.h"
 
 #include <fcntl.h>
 #include <poll.h>
