@@ -6,6 +6,7 @@
 #include "device/archiver/command_line.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/list_file.h"
+#include "device/archiver/memory.h"
 #include "device/archiver/output_of_7z.h"
 #include "device/archiver/stock_7z.h"
 #include "device/base/code_page.h"
@@ -27,6 +28,33 @@ TEST(ListFile, NamesEachSourceOnceWithoutItsDots) {
             (Strings{"b", "a b ", "bx", "c/d"}));
   for (const char* text : {"", "\n", "./\n", "/etc\n", "./a/../../b\n", "..\n"}) {
     EXPECT_THROW(ReadSources(text, "l"), Failure) << text;
+  }
+}
+
+TEST(Memory, FewerThreadsGoBeforeASmallerDictionary) {
+  const struct {
+    const char* level;
+    unsigned int mebibytes, processors;
+    const char* switches;
+  } rows[] = {
+      {"-mx9", 4096, 2, ""},
+      {"-mx9", 1024, 2, "-md=67108864b"},
+      {"-mx6", 1024, 8, "-mmt=2"},
+      {"-mx6", 784, 2, ""},
+      {"-mx6", 783, 2, "-md=33554432b"},
+      {"", 500, 1, ""},
+      {"", 3000, 8, ""},
+      {"", 2000, 8, "-mmt=6"},
+      {"-mx3", 85, 2, "-mmt=1"},
+      {"-mx3", 85, 1, ""},
+      {"-mx0", 1, 8, ""},
+      {"-mx6", 1, 2, "-md=65536b"},
+      {"-mx6", 0, 4, "-mmt=2 -md=65536b"},
+  };
+  for (const auto& row : rows) {
+    EXPECT_EQ(SwitchesWithin(std::uint64_t{row.mebibytes} << 20U, row.level, row.processors),
+              Words(row.switches))
+        << row.level << " within " << row.mebibytes;
   }
 }
 

@@ -1,6 +1,10 @@
 #include "device/archiver/archive_job.h"
 
+#include <syslog.h>
+#include <unistd.h>
+
 #include <algorithm>
+#include <cinttypes>
 #include <iterator>
 #include <set>
 #include <unordered_set>
@@ -9,6 +13,7 @@
 #include "device/archiver/failure.h"
 #include "device/archiver/job.h"
 #include "device/archiver/list_file.h"
+#include "device/archiver/memory.h"
 #include "device/archiver/old_archive.h"
 #include "device/archiver/output_of_7z.h"
 #include "device/archiver/special_files.h"
@@ -122,6 +127,23 @@ void PackWithSpecials(Job& job, const WorkPlace& place, PackRun run,
   }
 }
 
+std::vector<std::string> MemorySwitches(const Request& request, std::uint64_t memory) {
+  if (request.zip) {
+    return {};  // takes little
+  }
+  const auto processors = static_cast<unsigned int>(sysconf(_SC_NPROCESSORS_ONLN));
+  const std::vector<std::string> switches = SwitchesWithin(memory, request.level, processors);
+  std::string text;
+  for (const std::string& each : switches) {
+    text += " " + each;
+  }
+  if (!text.empty()) {
+    syslog(LOG_NOTICE, "%s: within %" PRIu64 " MiB of memory by%s", request.archive.c_str(),
+           memory >> 20U, text.c_str());
+  }
+  return switches;
+}
+
 }  // namespace
 
 Device::FileDescriptor PackArchive(const Request& request, const Device::ArchiverCall& call,
@@ -142,6 +164,7 @@ Device::FileDescriptor PackArchive(const Request& request, const Device::Archive
 
   PackRun run;
   run.sources = DivideNames(sources);
+  run.memory = MemorySwitches(request, call.memory);
   PrepareArchive(job, run);
   const std::vector<std::string> left_out = NamesOf(place, job.target);
   if (place.shares.empty() && !request.zip) {  // a 7z archive has empty files without opening them

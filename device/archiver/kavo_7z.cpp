@@ -6,9 +6,12 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <syslog.h>
 #include <unistd.h>
 
 #include <exception>
+#include <fstream>
+#include <limits>
 #include <optional>
 #include <utility>
 
@@ -36,8 +39,12 @@ std::optional<Device::ArchiverCall> CallOfDevice() {
 
 Device::ArchiverCall CallByHand() {
   const int zip_program = Device::OpenBesideProgram(kZipProgram, O_PATH).Release();
-  return {{}, Device::NewWorkFolderName(), zip_program, {}};
+  return {
+      {}, Device::NewWorkFolderName(), zip_program, std::numeric_limits<std::uint64_t>::max(), {}};
 }
+
+// When memory runs out, it is this program and its 7z that the kernel kills.
+void BeFirstToGo() { std::ofstream("/proc/self/oom_score_adj") << 1000 << std::flush; }
 
 }  // namespace
 
@@ -46,6 +53,8 @@ int main(int argc, char** argv) {
     return 1;  // nobody to report to
   }
   Device::OccupyStandardStreams();
+  openlog("kavo-7z", LOG_PID | LOG_PERROR, LOG_USER);
+  BeFirstToGo();
   try {
     const Archiver::Cancel cancel(STDOUT_FILENO);
     Archiver::Report report(cancel);

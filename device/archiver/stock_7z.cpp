@@ -102,9 +102,10 @@ void Run7z(Device::ProgramStart start, const std::set<std::string>& left_out, co
       text.Empty()) {
     return;
   }
-  const std::string end = WIFSIGNALED(status)
-                              ? "7z was killed by signal " + std::to_string(WTERMSIG(status))
-                              : "7z failed with status " + std::to_string(WEXITSTATUS(status));
+  const std::string end =
+      WIFSIGNALED(status) ? "7z was killed by signal " + std::to_string(WTERMSIG(status)) +
+                                (WTERMSIG(status) == SIGKILL ? ", maybe for want of memory" : "")
+                          : "7z failed with status " + std::to_string(WEXITSTATUS(status));
   throw Failure(text.Empty() ? end : end + ": " + text.Line());
 }
 

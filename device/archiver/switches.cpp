@@ -37,6 +37,7 @@ std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& ru
   if (!request.level.empty()) {
     switches.push_back(request.level);
   }
+  switches.insert(switches.end(), run.memory.begin(), run.memory.end());
   if (!request.password.empty()) {
     switches.emplace_back("-p");  // asks on standard input
   }

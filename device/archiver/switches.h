@@ -17,6 +17,7 @@ struct PackRun {
   NamesFor7z left_out;       // likewise; each stands for one file or folder
   std::string sources_file;  // path under which 7z finds the text of sources.list
   std::string left_out_file;
+  std::vector<std::string> memory;  // SwitchesWithin
   bool follow_links = false;
   std::set<std::string> left_out_links;  // among left_out; 7z warns of those that lead nowhere
 };

@@ -25,6 +25,7 @@ bool SendArchiverCall(int socket, const ArchiverCall& call) {
   Add(texts, call.password);
   Add(texts, call.work_folder);
   Add(texts, std::to_string(call.zip_program));
+  Add(texts, std::to_string(call.memory));
   for (const std::string& folder : call.fixed_folders) {
     Add(texts, folder);
   }
@@ -45,13 +46,17 @@ std::optional<ArchiverCall> ReceiveArchiverCall(int socket) {
        begin = end + 1) {
     texts.push_back(frame->substr(begin, end - begin));
   }
-  constexpr std::size_t kHead = 3;  // before the folders
+  constexpr std::size_t kHead = 4;  // before the folders
   if (texts.size() < kHead) {
     return std::nullopt;
   }
   texts.erase(std::find(texts.begin() + kHead, texts.end(), ""), texts.end());
-  return ArchiverCall{
-      texts[0], texts[1], std::atoi(texts[2].c_str()), {texts.begin() + kHead, texts.end()}};
+  constexpr int kDecimal = 10;
+  return ArchiverCall{texts[0],
+                      texts[1],
+                      std::atoi(texts[2].c_str()),
+                      std::strtoull(texts[3].c_str(), nullptr, kDecimal),
+                      {texts.begin() + kHead, texts.end()}};
 }
 
 bool SendMadeArchive(int socket, const FileDescriptor& archive) {

@@ -14,6 +14,7 @@
 
 #include "device/base/file_descriptor.h"
 #include "device/model/device.h"
+#include "device/model/memory.h"
 
 namespace Device {
 
@@ -209,7 +210,16 @@ std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t
   return next;
 }
 
-std::size_t MostJobs() { return sysconf(_SC_NPROCESSORS_ONLN) + 1; }
+std::size_t MostJobs() {
+  const Config& config = TheDevice().config;
+  return std::min<std::size_t>(sysconf(_SC_NPROCESSORS_ONLN) + 1,
+                               config.users.size() * config.jobs_at_once);
+}
+
+std::uint64_t MemoryOfJob() {
+  const std::uint64_t granted = TheDevice().config.memory_for_jobs;
+  return (granted != 0 ? granted : InstalledMemory() / 2) / MostJobs();
+}
 
 void EnterQueue(uid_t user) {
   const Change change;

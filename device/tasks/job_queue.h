@@ -33,8 +33,9 @@ std::vector<QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs);
 std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t of_user,
                                  std::size_t of_device);
 
-// How many jobs run at most on the open device.
+// How many jobs run at most on the open device, and how many bytes of memory each may take.
 std::size_t MostJobs();
+std::uint64_t MemoryOfJob();
 
 // The calling process's job. To be called in this order, once in a worker's process; each throws
 // std::system_error.

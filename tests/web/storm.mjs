@@ -2,10 +2,10 @@
 // the exit status tells whether all held. The seed of a run is printed, so that it can be repeated.
 import { Device, isRoot } from './device.mjs';
 import { archiver, stores, volumes } from './storm/faults.mjs';
-import { jobs, kills, stops } from './storm/load.mjs';
+import { jobs, kills, memory, stops } from './storm/load.mjs';
 import { calmCheck, names, seed } from './storm/tools.mjs';
 
-const storms = { jobs, stops, kills, volumes, archiver, stores };
+const storms = { jobs, memory, stops, kills, volumes, archiver, stores };
 for (const name of names.filter((each) => !(each in storms))) {
   console.error(`no storm '${name}'; there are ${Object.keys(storms).join(', ')}`);
   process.exit(2);

@@ -16,6 +16,7 @@
 #include "device/model/device.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/lumo/paths.h"
+#include "device/tasks/job_queue.h"
 #include "device/tasks/leftovers.h"
 
 namespace Device {
@@ -103,7 +104,7 @@ ArchiverNews& TheArchiverNews() {
 ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun& run) {
   const Arguments arguments = TakeApart(argument_vector);
   const ArchiverCall call = {arguments.password, NewWorkFolderName(), TheDevice().zip_program.Get(),
-                             TheDevice().FixedFolders(CurrentUser())};
+                             MemoryOfJob(), TheDevice().FixedFolders(CurrentUser())};
   const std::string& folder = SourcesFolder();
   if (!folder.empty() &&
       !IsSameFolder(OpenUserPath(call.fixed_folders, folder, O_PATH | O_DIRECTORY))) {

@@ -1,7 +1,8 @@
 // Load: many jobs at once, jobs that are stopped, processes that are killed.
 import assert from 'node:assert/strict';
 import { execFileSync } from 'node:child_process';
-import { existsSync, readFileSync } from 'node:fs';
+import { existsSync, mkdirSync, readFileSync, rmdirSync, writeFileSync } from 'node:fs';
+import path from 'node:path';
 
 import { Client, contents, kill, listing, until } from '../device.mjs';
 import { assertDone, assertFailed, ended, moment, pick, random, runJob, scale, signInAll, users }
@@ -33,6 +34,57 @@ export async function jobs(device) {
   }
   return [`${all.length} jobs`, { folders: all.filter(({ paths }) => paths.length > 1).length }];
 }
+
+// The median of the time that an answer takes, in milliseconds, until `isOver`.
+async function answers(client, isOver) {
+  const times = [];
+  do {
+    const begin = performance.now();
+    await client.tasks();
+    times.push(performance.now() - begin);
+    await moment(40);
+  } while (!await isOver(times.length));
+  return times.sort((one, other) => one - other)[times.length >> 1];
+}
+
+// A device that has little memory: jobs wait and keep within it, and nothing is killed.
+export async function memory(device) {
+  const isOld = existsSync('/sys/fs/cgroup/memory/cgroup.procs');  // the first version of the groups
+  const group = `/sys/fs/cgroup/${isOld ? 'memory/' : ''}${path.basename(device.base)}`;
+  mkdirSync(group);
+  try {
+    writeFileSync(`${group}/${isOld ? 'memory.limit_in_bytes' : 'memory.max'}`, `${2 ** 29}`);
+    device.processes().forEach(({ pid }) => writeFileSync(`${group}/cgroup.procs`, `${pid}`));
+    const big = device.at('vol1/photo/big');
+    execFileSync('sh', ['-c', 'head -c $2 /dev/urandom > "$1" && chown 65001 "$1"', 'sh', big,
+      scale(150e6, 30e6)]);
+    const clients = (await signInAll(device)).slice(0, 2);
+    const idle = await answers(clients[0], (count) => count >= 50);
+    const tasks = await Promise.all(Array.from({ length: scale(8, 4) }, async (_, index) => {
+      const client = clients[index % 2];
+      const dest = `/photo/${index}.7z`;
+      return { client, dest, id: await client.start(['/photo/big'], dest, { format: '7z', level: 'best' }) };
+    }));
+    let peak = 0;
+    const busy = await answers(clients[0], async () => {
+      const used = device.processes().map(({ pid }) => Number(execFileSync('sh', ['-c',
+        `cat /proc/${pid}/smaps_rollup 2>/dev/null || :`], { encoding: 'utf8' }).match(/^Pss: +(\d+)/m)?.[1] ?? 0));
+      peak = Math.max(peak, used.reduce((sum, each) => sum + each, 0));
+      const states = (await Promise.all(clients.map((client) => client.tasks()))).flat();
+      return states.every(({ state }) => ['finished', 'failed'].includes(state));
+    });
+    for (const { client, dest, id } of tasks) assertDone(await ended(client, id), dest);
+    assert.ok(busy < 10 * idle, `an answer takes ${busy.toFixed(1)} ms, idle ${idle.toFixed(1)} ms`);
+    return [`${tasks.length} jobs, all processes ${peak >> 10} MiB at most, ` +
+      `answers ${idle.toFixed(1)} ms idle, ${busy.toFixed(1)} ms beside the jobs`];
+  } finally {
+    await device.stop();
+    await until(() => device.processes().length === 0);
+    rmdirSync(group);
+    await device.serve();
+  }
+}
+memory.takesRoot = true;
 
 export async function stops(device) {
   let [left, folders, running] = [scale(1000, 60), 0, 0];
