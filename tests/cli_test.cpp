@@ -3,8 +3,10 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <csignal>
 #include <filesystem>
+#include <regex>
 
 #include "device/base/json_text.h"
 #include "device/model/config.h"
@@ -15,7 +17,9 @@ namespace {
 
 namespace fs = std::filesystem;
 
+using testing::Each;
 using testing::HasSubstr;
+using testing::Not;
 
 class CliTest : public DeviceTest {
  protected:
@@ -44,7 +48,7 @@ TEST_F(CliTest, SampleDevicePacksFromTwoShares) {
   const Ran ran = Kavo({"compress", sample, "--user", "alice", "/photo/trip/day1/b, the second.jpg",
                         "/music/album", "/photo/both.7z", "--level", "store"});
   EXPECT_EQ(ran.status, 0) << ran.err;
-  EXPECT_THAT(ran.out, testing::EndsWith("/photo/both.7z\n"));
+  EXPECT_EQ(ran.out, "/photo/both.7z\n");
   const Ran listing = RunProgram({"/usr/bin/7z", "l", "-ba", sample + "/vol1/photo/both.7z"});
   EXPECT_THAT(listing.out, HasSubstr("photo/trip/day1/b, the second.jpg"));
   EXPECT_THAT(listing.out, HasSubstr("music/album/02.mp3"));
@@ -66,16 +70,57 @@ TEST_F(CliTest, CallAnswersOnOneLineAndDoesNotWaitForTheWorker) {
   EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
-TEST_F(CliTest, CompressShowsEachErrorInWordsAndTheLogOnStandardError) {
+TEST_F(CliTest, CompressShowsEachErrorInWordsAndTheLogWhenItIsWatched) {
   Add("vol1/photo/a.txt", "a");
-  const Ran ran =
-      As("alice", "compress",
-         {"/photo/a.txt", "/photo/no.txt", "/photo/z.zip", "--fault", "ACLAccess#2=1:407"});
-  EXPECT_EQ(ran.status, 1);
-  EXPECT_THAT(ran.out, testing::EndsWith("/photo/a.txt: 407 no privilege\n"
-                                         "/photo/no.txt: 408 no such file or folder\n"));
-  EXPECT_THAT(ran.err, HasSubstr("KAVO.Zantro.Compress:"));
-  EXPECT_THAT(ran.err, HasSubstr(" Can't access source files\n"));
+  const Strings job = {"/photo/a.txt", "/photo/no.txt", "/photo/z.zip"};
+  const Ran watched = As("alice", "compress", job + Strings{"--fault", "ACLAccess#2=1:407"});
+  EXPECT_EQ(watched.status, 1);
+  EXPECT_EQ(watched.out, "");
+  EXPECT_THAT(watched.err, HasSubstr("kavo-device: /photo/a.txt: no privilege (407)\n"
+                                     "kavo-device: /photo/no.txt: no such file or folder (408)\n"));
+  EXPECT_THAT(watched.err, HasSubstr(" Can't access source files\n"));
+  const Ran json = As("alice", "compress", job + Strings{"--json"});
+  EXPECT_EQ(Device::ParseJson(json.out)["errors"][0]["error"], "no such file or folder");
+  EXPECT_THAT(json.err,
+              testing::EndsWith("kavo-device: /photo/no.txt: no such file or folder (408)\n"));
+  EXPECT_THAT(json.err, Not(HasSubstr("Can't access")));
+}
+
+// The API tells a folder's full path there.
+TEST_F(CliTest, NamesFoldersAsUsersDo) {
+  Add("vol1/homes/alice/a.txt", "a");
+  const Ran missing = As("alice", "compress", {"a.txt", "/photo/none/z.zip"});
+  EXPECT_THAT(missing.err, HasSubstr("device: /photo/none: no such file or folder (408)\n"));
+  const Ran homeless = As("alice", "compress", {"a.txt", "none/z.zip"});
+  EXPECT_THAT(homeless.err, HasSubstr("device: /home/none: no such file or folder (408)\n"));
+  EXPECT_EQ(As("alice", "compress", {"a.txt", "z.ZIP"}).out, "/home/z.ZIP\n");
+  EXPECT_EQ(As("alice", "ls", {"."}).out, "a.txt\nz.ZIP\n");
+  EXPECT_THAT(As("carol", "ls").out, Not(HasSubstr("vault")));
+}
+
+TEST_F(CliTest, ADetachedJobIsFoundStoppedAndDismissed) {
+  fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
+  const auto detach = [&](const Strings& paths) {
+    const Ran ran = As("alice", "compress", paths + Strings{"--detach"});
+    return ran.out.substr(0, ran.out.find('\n'));
+  };
+  const auto state = [&](const std::string& task) {
+    const Ran ran = As("alice", "status", {task, "--json"});
+    return Device::ParseJson(ran.out)["state"].asString();
+  };
+  const std::string endless = detach({"/photo/zeros", "/photo/z.7z"});
+  EXPECT_EQ(As("alice", "dismiss", {endless}).status, 1);
+  EXPECT_EQ(state(endless), "running");
+  EXPECT_EQ(As("bob", "stop", {endless}).status, 1);
+  EXPECT_EQ(As("alice", "stop", {endless}).status, 0);
+  EXPECT_THAT(As("alice", "status", {endless}).err, HasSubstr(endless + ": no such task"));
+
+  const std::string failed = detach({"/photo/none", "/photo/z.7z"});
+  ASSERT_TRUE(WaitUntil([&] { return state(failed) == "failed"; }));
+  EXPECT_THAT(As("alice", "tasks").out,
+              HasSubstr("\t/photo/z.7z\t/photo/none: no such file or folder (408)\n"));
+  EXPECT_EQ(As("alice", "dismiss", {failed}).status, 0);
+  EXPECT_EQ(As("alice", "tasks", {"--json"}).out, "{\"tasks\":[]}\n");
 }
 
 TEST_F(CliTest, InterruptedCompressStopsItsJob) {
@@ -83,12 +128,13 @@ TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   const std::string trace = temp_.Path() + "/cli-trace";
   Program compress({Built("kavo-device"), "compress", device_, "--user", "alice", "/photo/zeros",
                     "/photo/z.7z", "--trace", trace},
-                   "/");
+                   "/", temp_.Path() + "/err");
   ASSERT_TRUE(WaitUntil([&] { return ReadFile(trace).find("KLIBCPopenv") != std::string::npos; }));
   kill(compress.Pid(), SIGINT);
-  EXPECT_EQ(compress.Wait(), 1);
+  EXPECT_EQ(compress.Wait(), 128 + SIGINT);
   compress.ReadToEnd();
-  EXPECT_THAT(compress.Seen(), testing::EndsWith("/photo/z.7z: stopped\n"));
+  EXPECT_EQ(compress.Seen(), "");
+  EXPECT_THAT(ReadFile(temp_.Path() + "/err"), testing::EndsWith("/photo/z.7z: stopped\n"));
   EXPECT_EQ(As("alice", "tasks").out, "");
 }
 
@@ -113,7 +159,7 @@ TEST_F(ShellTest, OutputThatCannotBeWrittenIsNoSuccess) {
   Add("vol1/photo/a.txt", "a");
   const std::string device = " " + device_ + " --user alice ";
   for (const std::string& command :
-       {"init " + temp_.Path() + "/new", std::string("--help"),
+       {"init --json " + temp_.Path() + "/new", std::string("--help"),
         "call" + device + "start path=/photo/a.txt dest_file_path=/photo/c.zip", "tasks" + device,
         "compress" + device + "/photo/a.txt /photo/z.zip",
         "serve " + device_ + " --listen 127.0.0.1:0"}) {
@@ -123,6 +169,25 @@ TEST_F(ShellTest, OutputThatCannotBeWrittenIsNoSuccess) {
     EXPECT_THAT(full.err, HasSubstr("standard output: No space left on device\n")) << command;
   }
   EXPECT_TRUE(fs::exists(At("vol1/photo/z.zip")));
+}
+
+// Each line drawn over the one before, on terminals of several widths.
+TEST_F(ShellTest, TheBarKeepsInsideTheWindowAndEndsAtAHundred) {
+  Add("vol1/photo/日本 の写真.jpg", std::string(1 << 20, 'x'));
+  for (const std::size_t columns : {8U, 30U, 60U, 200U}) {
+    const std::string command = "stty cols " + std::to_string(columns) +
+                                "; NO_COLOR=1 TERM=xterm " + Built("kavo-device") + " compress " +
+                                device_ + " --user alice /photo /home/z.7z";
+    const Ran ran = RunProgram({"/usr/bin/script", "-qec", command, "/dev/null"});
+    Strings drawn = Lines(std::regex_replace(ran.out, std::regex("\r(\x1b\\[K)?"), "\n"));
+    drawn.erase(std::remove(drawn.begin(), drawn.end(), ""), drawn.end());
+    ASSERT_GE(drawn.size(), 2U) << ran.out;
+    EXPECT_EQ(drawn.back(), "/home/z.7z");
+    drawn.pop_back();
+    EXPECT_THAT(drawn.back(), testing::StartsWith("100 %"));
+    EXPECT_EQ(drawn.back().find("1.0 MiB") != std::string::npos, columns >= 60);
+    EXPECT_THAT(drawn, Each(testing::SizeIs(testing::Lt(columns))));
+  }
 }
 
 TEST_F(ShellTest, EndsQuietlyWhenTheReaderOfItsOutputIsGone) {

@@ -3,6 +3,7 @@
 #include <stdexcept>
 
 #include "device/base/json_text.h"
+#include "device/cli/client.h"
 #include "device/cli/commands.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
@@ -33,15 +34,15 @@ void AddParam(const std::string& text, Json::Value& params) {
 
 }  // namespace
 
-int CallCommand(const CallOptions& options) {
-  Open(options.folder);
+int CallCommand(const Target& target, const CallOptions& options) {
+  OpenFor({target.folder, "", target.is_json, target.is_quiet});  // the API itself refuses users
   Launcher launcher(WorkerLog::kSyslogOnly);
   Request request;
   request.api = options.api;
   request.method = options.method;
   request.version = options.version;
-  request.user = options.user;
-  request.session_id = SignIn(options.user);
+  request.user = target.user;
+  request.session_id = SignIn(target.user);
   for (const std::string& param : options.params) {
     AddParam(param, request.params);
   }

@@ -1,223 +1,193 @@
 // "compress": one job from start to end, with its progress.
 #include <poll.h>
-#include <unistd.h>
+#include <strings.h>
 
 #include <algorithm>
 #include <chrono>
-#include <cmath>
 #include <csignal>
 #include <iostream>
 #include <stdexcept>
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/cli/client.h"
 #include "device/cli/commands.h"
-#include "device/host/launcher.h"
-#include "device/host/sessions.h"
+#include "device/cli/output.h"
+#include "device/cli/progress_bar.h"
 #include "device/model/device.h"
-#include "device/platform/lumo/errors.h"
+#include "device/platform/lumo/paths.h"
+#include "platform/kavo/error_codes.h"
 
 namespace Device {
 
 namespace {
 
-constexpr char kApi[] = "KAVO.Zantro.Compress";
-constexpr int kApiVersion = 3;
 constexpr std::chrono::milliseconds kFirstPause(50);
 constexpr std::chrono::milliseconds kLongestPause(1000);
 
-constexpr int kBarWidth = 40;
-constexpr char kEraseLine[] = "\r\x1b[K";
-
-volatile std::sig_atomic_t is_interrupted = 0;
+volatile std::sig_atomic_t interrupted_by = 0;
 
 void NoteInterrupt(int signal_number) {
   if (signal_number != SIGCHLD) {
-    is_interrupted = 1;
+    interrupted_by = signal_number;
   }
 }
 
-// Paths as the text of a JSON array, so that a name may hold a comma.
-std::string ListText(std::vector<std::string>::const_iterator begin,
-                     std::vector<std::string>::const_iterator end) {
-  return ToText(JsonArray({begin, end}));
+std::string FormatOf(const std::string& archive) {
+  const std::string ending = archive.substr(std::min(archive.rfind('.'), archive.size()));
+  for (const char* format : {".zip", ".7z"}) {
+    if (strcasecmp(ending.c_str(), format) == 0) {
+      return format + 1;
+    }
+  }
+  throw std::runtime_error("'" + archive +
+                           "' does not end in .zip or .7z: name it so, or give --format");
 }
 
-bool EndsWith(const std::string& text, const std::string& ending) {
-  return text.size() >= ending.size() &&
-         text.compare(text.size() - ending.size(), ending.size(), ending) == 0;
+std::string ReadPassword(const std::string& file, bool is_for_zip) {
+  const std::string text = ReadTextFile(file);
+  std::string password = text.substr(0, text.find_first_of("\r\n"));
+  const auto is_refused = [](char each) { return each < ' ' || each > '~'; };
+  if (password.empty()) {
+    throw std::runtime_error("password file '" + file + "' has an empty line");
+  }
+  if (is_for_zip && std::any_of(password.begin(), password.end(), is_refused)) {
+    throw std::runtime_error("password file '" + file +
+                             "': the password of a zip is printable ASCII");
+  }
+  return password;
 }
 
-Json::Value StartParams(const CompressOptions& options) {
-  const auto dest = options.paths.end() - 1;
-  Json::Value params = JsonObject({{"path", ListText(options.paths.begin(), dest)},
-                                   {"dest_file_path", ListText(dest, options.paths.end())},
-                                   {"format", !options.format.empty()  ? options.format
-                                              : EndsWith(*dest, ".7z") ? "7z"
-                                                                       : "zip"}});
-  if (!options.level.empty()) {
-    params["level"] = options.level;
+Json::Value StartParams(const Target& target, const CompressOptions& options) {
+  const std::string& archive = options.paths.back();
+  const ResolvedPath resolved = Resolve(TheDevice(), target.user, archive);
+  if (resolved.error == 0 && resolved.user_path == "/" + resolved.share_name) {
+    throw std::runtime_error("'" + archive +
+                             "' is a shared folder: name an archive in it, such as '" +
+                             resolved.user_path + "/" + resolved.share_name + ".zip'");
   }
-  if (!options.mode.empty()) {
-    params["mode"] = options.mode;
+  // Paths as the text of a JSON array, so that a name may hold a comma.
+  Json::Value params =
+      JsonObject({{"path", ToText(JsonArray({options.paths.begin(), options.paths.end() - 1}))},
+                  {"dest_file_path", ToText(JsonArray({archive}))}});
+  for (const auto& [name, value] : options.params) {
+    if (!value.empty()) {
+      params[name] = value;
+    }
   }
-  if (!options.codepage.empty()) {
-    params["codepage"] = options.codepage;
+  if (!params.isMember("format")) {
+    params["format"] = FormatOf(archive);
+  }
+  if (params["mode"] == "synchronize") {
+    params["mode"] = "synchroize";  // the API's word
   }
   if (!options.password_file.empty()) {
-    const std::string text = ReadTextFile(options.password_file);
-    const std::string password = text.substr(0, text.find_first_of("\r\n"));
-    if (password.empty()) {
-      throw std::runtime_error("password file '" + options.password_file + "' has an empty line");
-    }
-    params["password"] = password;
+    params["password"] = ReadPassword(options.password_file, params["format"] == "zip");
   }
   return params;
 }
 
-void PrintError(const std::string& path, int code) {
-  std::cout << path << ": " << code << ' ' << ErrorText(code) << '\n';
-}
-
-// A job's progress on standard output: a bar on a terminal, a line per change elsewhere.
-class ProgressDisplay {
- public:
-  ProgressDisplay();
-
-  // `percent` from 0 to 100. Draws nothing when it has not changed.
-  void Show(int percent);
-  // Takes the bar off the terminal.
-  void Clear() const;
-
- private:
-  bool is_terminal_;
-  int shown_ = -1;
-};
-
-ProgressDisplay::ProgressDisplay() : is_terminal_(isatty(STDOUT_FILENO) != 0) {}
-
-void ProgressDisplay::Show(int percent) {
-  if (percent == shown_) {
-    return;
-  }
-  shown_ = percent;
-  if (!is_terminal_) {
-    std::cout << percent << " %" << std::endl;
-    return;
-  }
-  const int filled = std::clamp(percent, 0, 100) * kBarWidth / 100;
-  std::cout << kEraseLine << '[' << std::string(filled, '#') << std::string(kBarWidth - filled, ' ')
-            << "] " << percent << " %" << std::flush;
-}
-
-void ProgressDisplay::Clear() const {
-  if (is_terminal_) {
-    std::cout << kEraseLine << std::flush;
-  }
-}
-
-// One job: the requests that a client of the API makes.
 class Job {
  public:
-  explicit Job(const CompressOptions& options)
-      : dest_(options.paths.back()), params_(StartParams(options)), user_(options.user) {
-    session_id_ = SignIn(user_);
-  }
+  Job(const Target& target, const CompressOptions& options)
+      : target_(target),
+        is_detached_(options.is_detached),
+        client_(target, !is_detached_),
+        dest_(options.paths.back()),
+        params_(StartParams(target, options)),
+        bar_(target.is_quiet) {}
 
   int Run() {
-    const Outcome started = Ask("start", params_);
+    const Outcome started = client_.Ask("start", params_);
     if (started.code != 0) {
-      PrintError(dest_, started.code);
-      return kExitFailed;
+      return EndWith(started.code);
     }
     task_id_ = started.data["taskid"].asString();
-    return Follow();
+    if (!is_detached_) {
+      return Follow();
+    }
+    Print(started.data, task_id_);
+    return kExitDone;
   }
 
  private:
-  Outcome Ask(const std::string& method, const Json::Value& params) {
-    Request request;
-    request.api = kApi;
-    request.method = method;
-    request.version = kApiVersion;
-    request.params = params;
-    request.user = user_;
-    request.session_id = session_id_;
-    request.is_followed = true;
-    return launcher_.Call(request);
-  }
-
-  Outcome AskAboutTask(const std::string& method) {
-    return Ask(method, JsonObject({{"taskid", task_id_}}));
-  }
-
   int Follow() {
-    ProgressDisplay display;
-    std::chrono::milliseconds pause = kFirstPause;
-    for (;;) {
-      poll(nullptr, 0,
-           static_cast<int>(pause.count()));  // the worker's end, a signal, ends it early
+    for (std::chrono::milliseconds pause = kFirstPause;;
+         pause = std::min(2 * pause, kLongestPause)) {
+      // The worker's end, a signal, ends it early.
+      poll(nullptr, 0, static_cast<int>(pause.count()));
       Launcher::Reap();
-      pause = std::min(2 * pause, kLongestPause);
-      if (is_interrupted != 0) {
-        display.Clear();
-        return Stop();
+      if (interrupted_by != 0) {
+        return Stop(interrupted_by);
       }
-      const Outcome outcome = AskAboutTask("status");
-      if (outcome.code != 0 || outcome.data["finished"].asBool()) {
-        display.Clear();
-        return Report(outcome);
+      const Json::Value task = client_.Task(task_id_);
+      if (task.isNull()) {
+        return EndWith(KAVO::kErrNoTask);  // another client has stopped or dismissed it
       }
-      display.Show(static_cast<int>(std::lround(outcome.data["progress"].asDouble() * 100)));
+      bar_.Show(task);
+      if (task["state"] == "finished" || task["state"] == "failed") {
+        client_.AskAbout("status", task_id_);  // which takes it off the list
+        return End(task);
+      }
     }
   }
 
-  int Stop() {
-    const Outcome outcome = AskAboutTask("stop");
-    if (outcome.code != 0) {
-      PrintError(dest_, outcome.code);
-    } else {
-      std::cout << dest_ << ": stopped\n";
+  int Stop(int signal_number) {
+    const int code = client_.AskAbout("stop", task_id_).code;
+    if (code != 0) {
+      return EndWith(code);
     }
-    return kExitFailed;
+    bar_.Clear();
+    PrintError(dest_ + ": stopped");
+    Print(JsonObject({{"dest_file_path", dest_}, {"state", "stopped"}, {"taskid", task_id_}}), "");
+    return kExitSignal + signal_number;
   }
 
-  int Report(const Outcome& outcome) const {
-    if (outcome.code != 0) {
-      // Another client has stopped the task or has seen its end, or the request itself went wrong.
-      PrintError(dest_, outcome.code);
-      return kExitFailed;
+  int End(const Json::Value& task) const {
+    const bool is_finished = task["state"] == "finished";
+    if (!is_finished) {
+      bar_.Clear();
     }
-    if (!outcome.data.isMember("errors")) {
-      std::cout << dest_ << '\n';
-      return kExitDone;
+    for (const std::string& line : ErrorLines(task)) {
+      PrintError(line);
     }
-    const Json::Value& errors = outcome.data["errors"];
-    for (const Json::Value& item : errors) {
-      const std::string path = item["path"].asString();
-      PrintError(path.empty() ? dest_ : path, item["code"].asInt());
-    }
-    if (errors.empty()) {
-      std::cout << dest_ << ": failed without a reason\n";
-    }
-    return kExitFailed;
+    Print(task, is_finished ? dest_ : "");
+    return is_finished ? kExitDone : kExitFailed;
   }
 
+  // What a request was answered.
+  int EndWith(int code) const {
+    Json::Value task = JsonObject({{"dest_file_path", dest_}, {"state", "failed"}});
+    task["errors"].append(JsonObject({{"path", dest_}, {"code", code}}));
+    CompleteTask(target_.user, task);
+    return End(task);
+  }
+
+  void Print(const Json::Value& result, const std::string& text) const {
+    if (target_.is_json) {
+      PrintJson(result);
+    } else if (!text.empty()) {
+      std::cout << Shown(text) << '\n';
+    }
+  }
+
+  const Target target_;
+  const bool is_detached_;
+  Client client_;
   const std::string dest_;
   const Json::Value params_;
-  const std::string user_;
-  std::string session_id_;
+  ProgressBar bar_;
   std::string task_id_;
-  Launcher launcher_;
 };
 
 }  // namespace
 
-int CompressCommand(const CompressOptions& options) {
-  Open(options.folder);
-  Job job(options);
+int CompressCommand(const Target& target, const CompressOptions& options) {
+  Job job(target, options);
   for (const int signal_number : {SIGINT, SIGTERM, SIGHUP, SIGCHLD}) {
-    std::signal(signal_number, NoteInterrupt);
+    if (std::signal(signal_number, NoteInterrupt) == SIG_IGN && signal_number == SIGHUP) {
+      std::signal(signal_number, SIG_IGN);  // as nohup has it
+    }
   }
   return job.Run();
 }

@@ -9,7 +9,9 @@
 #include <stdexcept>
 
 #include "device/base/file_io.h"
+#include "device/base/json_text.h"
 #include "device/cli/commands.h"
+#include "device/cli/output.h"
 #include "device/model/config.h"
 #include "device/model/device.h"
 
@@ -121,15 +123,19 @@ void AddSampleFiles(const fs::path& root) {
 
 }  // namespace
 
-int InitCommand(const std::string& folder, const std::string& config_file) {
+int InitCommand(const Target& target, const std::string& config_file) {
   umask(0022);
   if (!config_file.empty()) {
-    Make(folder, ReadTextFile(config_file));
+    Make(target.folder, ReadTextFile(config_file));
   } else {
-    Make(folder, kSampleConfig);
-    AddSampleFiles(folder);
+    Make(target.folder, kSampleConfig);
+    AddSampleFiles(target.folder);
   }
-  std::cout << "made device '" << folder << "'\n";
+  if (target.is_json) {
+    PrintJson(JsonObject({{"device", target.folder}}));
+  } else if (!target.is_quiet) {
+    std::cerr << "made device '" << target.folder << "'\n";
+  }
   return kExitDone;
 }
 

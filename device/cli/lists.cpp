@@ -1,79 +1,127 @@
-// "tasks" and "notifications": what the device keeps for a user, read under that user's identity.
-#include <sys/wait.h>
-
+// What there is for a user: tasks, one or all, a folder, notifications.
+#include <algorithm>
 #include <cmath>
 #include <ctime>
-#include <functional>
 #include <iostream>
-#include <stdexcept>
 
-#include "device/base/child_process.h"
+#include "device/base/json_text.h"
+#include "device/cli/client.h"
 #include "device/cli/commands.h"
 #include "device/cli/output.h"
-#include "device/model/device.h"
+#include "device/host/file_listing.h"
+#include "device/host/task_events.h"
+#include "device/platform/lumo/errors.h"
 #include "device/tasks/job_queue.h"
-#include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
 namespace {
 
-// Runs the body in a process that has the user's identity.
-int RunAs(const std::string& user, const std::function<void()>& body) {
-  if (TheDevice().config.FindUser(user) == nullptr) {
-    throw std::runtime_error("no user '" + user + "'");
+void PrintTask(const Json::Value& task) {
+  std::cout << task["taskid"].asString() << '\t' << task["state"].asString();
+  if (task.isMember("before")) {
+    std::cout << ", " << task["before"] << " jobs before it";
   }
-  const int status = ChildProcess::Run([&] {
-                       if (LumoLibUGIDSet(nullptr, user.c_str()) < 0) {
-                         throw std::runtime_error("cannot take on the identity of '" + user + "'");
-                       }
-                       body();
-                       CloseStores();
-                       return FinishOutput() ? kExitDone : kExitFailed;
-                     }).Wait();
-  return WIFEXITED(status) ? WEXITSTATUS(status) : kExitFailed;
+  std::cout << '\t' << std::floor(task["progress"].asDouble() * 100) << " %\t"
+            << Shown(task["dest_file_path"].asString());
+  const char* separator = "\t";
+  for (const std::string& line : ErrorLines(task)) {
+    std::cout << separator << Shown(line);
+    separator = "; ";
+  }
+  std::cout << '\n';
 }
 
-void PrintTask(const TaskRow& row, const std::map<pid_t, std::size_t>& waiting) {
-  const Json::Value task = TaskView(row, waiting);
-  std::cout << row.id << '\t' << task["state"].asString() << '\t'
-            << std::lround(task["progress"].asDouble() * 100) << " %\t"
-            << task["dest_file_path"].asString() << '\n';
+void PrintEntry(const Json::Value& entry) {
+  std::cout << Shown(entry["name"].asString()) << (entry["kind"] == "folder" ? "/" : "") << '\n';
 }
 
-std::string TimeText(std::time_t time) {
-  std::tm local{};
+void PrintNotification(const Json::Value& view) {
+  const std::time_t time = view["time"].asInt64();
   char text[sizeof "2000-01-01 00:00:00"];
-  localtime_r(&time, &local);
-  std::strftime(text, sizeof text, "%F %T", &local);
-  return text;
+  std::strftime(text, sizeof text, "%F %T", std::localtime(&time));
+  std::cout << text << '\t' << view["taskid"].asString() << '\t' << view["message"].asString();
+  for (const Json::Value& argument : view["arguments"]) {
+    std::cout << '\t' << Shown(argument.asString());
+  }
+  std::cout << '\n';
+}
+
+// `body` returns an object whose array `items` is to be printed, when not as JSON.
+int PrintList(const Target& target, const char* items, void (*print)(const Json::Value&),
+              const std::function<Json::Value()>& body) {
+  OpenFor(target);
+  const Json::Value list = AskAs(target.user, body);
+  if (target.is_json) {
+    PrintJson(list);
+  } else {
+    std::for_each(list[items].begin(), list[items].end(), print);
+  }
+  return kExitDone;
 }
 
 }  // namespace
 
-int TasksCommand(const std::string& folder, const std::string& user) {
-  Open(folder);
-  return RunAs(user, [&] {
+int TasksCommand(const Target& target) {
+  return PrintList(target, "tasks", PrintTask, [&] {
+    Json::Value list = JsonObject({{"tasks", Json::arrayValue}});
     const auto waiting = WaitingWorkers();
-    for (const TaskRow& row : AllTasks(user)) {
-      PrintTask(row, waiting);
+    for (const TaskRow& row : AllTasks(target.user)) {
+      CompleteTask(target.user, list["tasks"].append(TaskView(row, waiting)));
     }
+    return list;
   });
 }
 
-int NotificationsCommand(const std::string& folder, const std::string& user) {
-  Open(folder);
-  return RunAs(user, [&] {
-    for (const NotificationRow& row : StoreOf(user).NotificationsAfter(0)) {
-      std::cout << TimeText(row.time) << '\t' << row.task << '\t' << row.message;
-      for (const std::string& argument : row.arguments) {
-        std::cout << '\t' << argument;
-      }
-      std::cout << '\n';
+int LsCommand(const Target& target, const std::string& folder) {
+  return PrintList(target, "entries", PrintEntry, [&] {
+    const Listing listing = ListFolder(target.user, folder);
+    if (listing.error != 0) {
+      throw Failure(folder + ": " + ErrorText(listing.error));
     }
+    return ParseJson(DecodeByteEscapes(listing.body));
   });
+}
+
+int NotificationsCommand(const Target& target) {
+  return PrintList(target, "notifications", PrintNotification, [&] {
+    Json::Value list = JsonObject({{"notifications", Json::arrayValue}});
+    for (const NotificationRow& row : StoreOf(target.user).NotificationsAfter(0)) {
+      list["notifications"].append(NotificationView(row));
+    }
+    return list;
+  });
+}
+
+int TaskCommand(const Target& target, const std::string& command,
+                const std::vector<std::string>& ids) {
+  Client client(target, false);
+  int status = kExitDone;
+  for (const std::string& id : ids) {
+    const Json::Value task = client.Task(id);
+    const bool has_ended = task["state"] == "finished" || task["state"] == "failed";
+    Json::Value result = command == "status" ? task : JsonObject({{"taskid", id}});
+    std::string error = task.isNull() ? "no such task" : "";
+    if (command == "dismiss" && !task.isNull() && !has_ended) {
+      error = "the job has not ended; \"stop\" ends it";
+    } else if (error.empty() && command != "status") {
+      // A "status" that reports the end of a task takes it off the list.
+      const int code = client.AskAbout(command == "stop" ? "stop" : "status", id).code;
+      error = code == 0 ? "" : ErrorText(code);
+    }
+    if (!error.empty()) {
+      PrintError(id + ": " + error);
+      result = JsonObject({{"taskid", id}, {"error", error}});
+      status = kExitFailed;
+    }
+    if (target.is_json) {
+      PrintJson(result);
+    } else if (error.empty() && command == "status") {
+      PrintTask(task);
+    }
+  }
+  return status;
 }
 
 }  // namespace Device

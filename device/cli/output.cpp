@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <csignal>
 #include <cstring>
@@ -9,50 +10,61 @@
 #include <sstream>
 
 #include "device/base/file_io.h"
+#include "device/base/json_text.h"
 
 namespace Device {
 
 namespace {
 
-class Output : public std::stringbuf {
- public:
-  Output() : std::stringbuf(std::ios::out), replaced_(std::cout.rdbuf(this)) {}
-  ~Output() override { std::cout.rdbuf(replaced_); }
-
-  int Error() const { return error_; }
-
- protected:
+struct Output : std::stringbuf {
   // Once it has failed, std::cout does not get here again.
   int sync() override {
-    error_ = WriteAll(STDOUT_FILENO, str()) ? 0 : errno;
+    error = WriteAll(STDOUT_FILENO, str()) ? 0 : errno;
     str("");
-    return error_ == 0 ? 0 : -1;
+    return error == 0 ? 0 : -1;
   }
-
- private:
-  std::streambuf* const replaced_;
-  int error_ = 0;
+  int error = 0;
 };
 
 Output& TheOutput() {
-  static Output output;
+  static auto& output = *new Output;  // std::cout has it to the very end
   return output;
 }
 
 }  // namespace
 
-void WatchOutput() { TheOutput(); }
+void WatchOutput() { std::cout.rdbuf(&TheOutput()); }
 
 bool FinishOutput() {
   if (std::cout.flush()) {
     return true;
   }
-  if (TheOutput().Error() == EPIPE) {
+  if (TheOutput().error == EPIPE) {
     std::signal(SIGPIPE, SIG_DFL);
     std::raise(SIGPIPE);
   }
-  std::cerr << "kavo-device: standard output: " << std::strerror(TheOutput().Error()) << '\n';
+  PrintError(std::string("standard output: ") + std::strerror(TheOutput().error));
   return false;
 }
+
+std::string Printable(const std::string& text, std::size_t most_bytes) {
+  std::string kept = text.substr(text.size() - std::min(text.size(), most_bytes));
+  while (kept.size() < text.size() && !kept.empty() && (kept[0] & 0xC0) == 0x80) {
+    kept.erase(0, 1);  // of a character that was cut
+  }
+  const auto is_control = [](unsigned char each) { return each < ' ' || each == 0x7F; };
+  std::replace_if(kept.begin(), kept.end(), is_control, '?');
+  return kept;
+}
+
+std::string Shown(const std::string& name) {
+  return isatty(STDOUT_FILENO) != 0 ? Printable(name, name.size()) : name;
+}
+
+void PrintError(const std::string& reason) {
+  std::cerr << "kavo-device: " << Printable(reason, reason.size()) << '\n';
+}
+
+void PrintJson(const Json::Value& value) { std::cout << ToUtf8Text(value) << '\n'; }
 
 }  // namespace Device

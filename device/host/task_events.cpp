@@ -10,7 +10,6 @@
 #include "device/base/json_text.h"
 #include "device/host/sessions.h"
 #include "device/tasks/job_queue.h"
-#include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
 #include "device/tasks/workers.h"
 
@@ -90,11 +89,7 @@ class Watcher {
 
   void SendNotifications() {
     for (const NotificationRow& row : StoreOf(user_).NotificationsAfter(last_)) {
-      Send("notification", JsonObject({{"time", Json::Int64{row.time}},
-                                       {"taskid", row.task},
-                                       {"title", row.title},
-                                       {"message", row.message},
-                                       {"arguments", JsonArray(row.arguments)}}));
+      Send("notification", NotificationView(row));
       last_ = row.number;
     }
   }
@@ -111,6 +106,14 @@ class Watcher {
 };
 
 }  // namespace
+
+Json::Value NotificationView(const NotificationRow& row) {
+  return JsonObject({{"time", Json::Int64{row.time}},
+                     {"taskid", row.task},
+                     {"title", row.title},
+                     {"message", row.message},
+                     {"arguments", JsonArray(row.arguments)}});
+}
 
 void SendTaskEvents(int stream, const std::string& user, const std::string& session_id) {
   Watcher watcher(stream, user);

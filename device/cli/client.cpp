@@ -1,0 +1,124 @@
+#include "device/cli/client.h"
+
+#include <iostream>
+#include <optional>
+#include <stdexcept>
+
+#include "device/base/child_process.h"
+#include "device/base/file_io.h"
+#include "device/base/json_text.h"
+#include "device/base/open_below.h"
+#include "device/cli/output.h"
+#include "device/host/sessions.h"
+#include "device/model/device.h"
+#include "device/platform/lumo/errors.h"
+#include "device/platform/lumo/paths.h"
+#include "device/tasks/job_queue.h"
+#include "device/tasks/user_tasks.h"
+#include "platform/lumo/file_manager.h"
+
+namespace Device {
+
+namespace {
+
+// What the API may tell as a full path, as the user sees it.
+std::string UserPath(const std::string& user, const std::string& path) {
+  const OpenDevice& device = TheDevice();
+  const Share* const share = ShareOfRealPath(device, path);
+  const std::string folder = share != nullptr ? device.VolumePath(share->volume) + "/" + share->name
+                                              : device.HomePath(*device.config.FindUser(user));
+  return IsWithin(path, folder)
+             ? "/" + (share != nullptr ? share->name : kHomeShare) + path.substr(folder.size())
+             : path;
+}
+
+}  // namespace
+
+void OpenFor(const Target& target) {
+  Open(target.folder);
+  if (!TheDevice().switches_identity && !target.is_quiet) {
+    std::cerr << "kavo-device: not root: every user of the device is you\n";
+  }
+  if (!target.user.empty() && TheDevice().config.FindUser(target.user) == nullptr) {
+    throw std::runtime_error("no user '" + target.user + "'");
+  }
+}
+
+Json::Value AskAs(const std::string& user, const std::function<Json::Value()>& body) {
+  Pipe pipe;
+  ChildProcess process = ChildProcess::Run([&] {
+    Json::Value answer;
+    try {
+      if (LumoLibUGIDSet(nullptr, user.c_str()) < 0) {
+        throw std::runtime_error("cannot take on the identity of '" + user + "'");
+      }
+      answer["result"] = body();
+    } catch (const std::exception& error) {
+      answer["failure"] = error.what();
+    }
+    CloseStores();
+    return WriteFrame(pipe.writer.Get(), ToText(answer)) ? 0 : 1;
+  });
+  pipe.writer.Close();
+  const std::optional<std::string> text = ReadFrame(pipe.reader.Get());
+  process.Wait();
+  const Json::Value answer = ParseJson(text.value_or(R"({"failure": "a process has died"})"));
+  if (answer.isMember("failure")) {
+    throw Failure(answer["failure"].asString());
+  }
+  return answer["result"];
+}
+
+void CompleteTask(const std::string& user, Json::Value& task) {
+  if (!task.isMember(kDataErrors)) {
+    return;
+  }
+  for (Json::Value& item : task[kDataErrors]) {
+    const std::string path = item["path"].asString();
+    item["path"] = path.empty() ? task["dest_file_path"] : Json::Value(UserPath(user, path));
+    item["error"] = ErrorText(item["code"].asInt());
+  }
+}
+
+std::vector<std::string> ErrorLines(const Json::Value& task) {
+  std::vector<std::string> lines;
+  for (const Json::Value& item : task[kDataErrors]) {
+    lines.push_back(item["path"].asString() + ": " + item["error"].asString() + " (" +
+                    item["code"].asString() + ")");
+  }
+  if (lines.empty() && task["state"] == "failed") {
+    lines.push_back(task["dest_file_path"].asString() + ": failed without a reason");
+  }
+  if (task.isMember("reason") && !lines.empty()) {
+    lines.back() += ": " + task["reason"].asString();
+  }
+  return lines;
+}
+
+Client::Client(const Target& target, bool is_follower)
+    : user_(target.user), is_follower_(is_follower) {
+  OpenFor(target);
+  session_id_ = SignIn(user_);
+  launcher_ = std::make_unique<Launcher>(is_follower ? WorkerLog::kHere : WorkerLog::kSyslogOnly);
+}
+
+Outcome Client::Ask(const std::string& method, const Json::Value& params) {
+  constexpr int kApiVersion = 3;
+  return launcher_->Call(
+      {"KAVO.Zantro.Compress", method, kApiVersion, params, user_, session_id_, is_follower_});
+}
+
+Outcome Client::AskAbout(const std::string& method, const std::string& task_id) {
+  return Ask(method, JsonObject({{"taskid", task_id}}));
+}
+
+Json::Value Client::Task(const std::string& id) const {
+  Json::Value task = AskAs(user_, [&] {
+    const std::optional<TaskRow> row = ReadTask(user_, id);
+    return row ? TaskView(*row, WaitingWorkers()) : Json::Value();
+  });
+  CompleteTask(user_, task);
+  return task;
+}
+
+}  // namespace Device

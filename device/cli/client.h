@@ -1,0 +1,43 @@
+// What the commands ask of a device in a user's name.
+#pragma once
+
+#include <functional>
+#include <string>
+#include <vector>
+
+#include "device/cli/commands.h"
+#include "device/host/launcher.h"
+
+namespace Device {
+
+// Opens the device. A user whom it does not have is refused. Throws std::runtime_error.
+void OpenFor(const Target& target);
+
+// What the body returns in a process that has the user's identity. Throws Failure with its reason.
+Json::Value AskAs(const std::string& user, const std::function<Json::Value()>& body);
+
+// Makes TaskView fit for output: a code's words beside it, paths as users see them.
+void CompleteTask(const std::string& user, Json::Value& task);
+// Why a task failed: "PATH: WORDS (CODE)" for each error, the last with the archiver's own reason.
+std::vector<std::string> ErrorLines(const Json::Value& task);
+
+// The requests that a client of the API makes.
+class Client {
+ public:
+  // Opens the device and signs the user in. One that follows its task has its worker's log lines,
+  // and the desktop is not told of the task's end.
+  Client(const Target& target, bool is_follower);
+
+  Outcome Ask(const std::string& method, const Json::Value& params);
+  Outcome AskAbout(const std::string& method, const std::string& task_id);
+  // Null when there is no such task.
+  Json::Value Task(const std::string& id) const;
+
+ private:
+  const std::string user_;
+  const bool is_follower_;
+  std::string session_id_;
+  std::unique_ptr<Launcher> launcher_;
+};
+
+}  // namespace Device
