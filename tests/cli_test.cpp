@@ -1,5 +1,8 @@
 // The commands of kavo-device, as programs.
+#include <arpa/inet.h>
 #include <gmock/gmock.h>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -153,6 +156,38 @@ TEST_F(ShellTest, AnyStandardStreamMayBeClosed) {
   EXPECT_TRUE(serve.ReadUntil("' on http://127.0.0.1:"));
   kill(serve.Pid(), SIGTERM);
   EXPECT_EQ(serve.Wait(), 0);
+}
+
+TEST_F(ShellTest, ServesWhereSystemdListensAndTellsThatItIsReady) {
+  const int listening = socket(AF_INET, SOCK_STREAM, 0);
+  listen(listening, 1);  // at any free port
+  sockaddr_in address{};
+  socklen_t size = sizeof address;
+  getsockname(listening, reinterpret_cast<sockaddr*>(&address), &size);
+  const std::string path = temp_.Path() + "/ready";
+  sockaddr_un ready_address{AF_UNIX, {}};
+  path.copy(ready_address.sun_path, path.size());
+  const int ready = socket(AF_UNIX, SOCK_DGRAM, 0);
+  bind(ready, reinterpret_cast<sockaddr*>(&ready_address), sizeof ready_address);
+
+  Program serve({"/bin/bash", "-c",
+                 "exec 3<&" + std::to_string(listening) + "; NOTIFY_SOCKET=" + path +
+                     " LISTEN_PID=$$ LISTEN_FDS=1 exec " + Built("kavo-device") + " serve " +
+                     device_ + " --json"},
+                "/", temp_.Path() + "/err");
+  char message[100] = "";
+  recv(ready, message, sizeof message - 1, 0);
+  EXPECT_STREQ(message, "READY=1");
+  EXPECT_TRUE(
+      serve.ReadUntil("http://0.0.0.0:" + std::to_string(ntohs(address.sin_port)) + "/\"}\n"));
+  const int client = socket(AF_INET, SOCK_STREAM, 0);
+  ASSERT_EQ(connect(client, reinterpret_cast<sockaddr*>(&address), size), 0);
+  dprintf(client, "GET /codes HTTP/1.1\r\nHost: localhost\r\n\r\n");
+  recv(client, message, strlen("HTTP/1.1 200"), MSG_WAITALL);
+  EXPECT_THAT(message, testing::StartsWith("HTTP/1.1 200"));
+  for (const int fd : {listening, ready, client}) {
+    close(fd);
+  }
 }
 
 TEST_F(ShellTest, OutputThatCannotBeWrittenIsNoSuccess) {

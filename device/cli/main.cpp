@@ -12,6 +12,7 @@
 #include <utility>
 
 #include "device/base/file_io.h"
+#include "device/base/json_text.h"
 #include "device/cli/client.h"
 #include "device/cli/commands.h"
 #include "device/cli/output.h"
@@ -124,6 +125,20 @@ void AddCall(CLI::App& app, CommandLine& line) {
   AddTraceOptions(*command, line);
 }
 
+int Serve(const CommandLine& line) {
+  Device::FrontEndFiles files;
+  Device::OpenFor(line.target);
+  const std::string& root = Device::TheDevice().root;
+  const auto announce = [&](const std::string& address) {
+    const std::string url = "http://" + address + "/";
+    return line.target.is_json
+               ? Device::ToUtf8Text(Device::JsonObject({{"device", root}, {"url", url}}))
+               : "serving '" + root + "' on " + url;
+  };
+  return Device::WebHost(std::move(files), line.listen, announce).Run() ? Device::kExitDone
+                                                                        : Device::kExitUsage;
+}
+
 void AddCommands(CLI::App& app, CommandLine& line) {
   AddCommand(app, line, "init", "Make a device", false, [&line] {
     return Device::InitCommand(line.target, line.config_file);
@@ -137,12 +152,8 @@ void AddCommands(CLI::App& app, CommandLine& line) {
   AddCommand(app, line, "notifications", "List a user's desktop notifications", true,
              [&line] { return Device::NotificationsCommand(line.target); });
   AddCall(app, line);
-  CLI::App* const serve =
-      AddCommand(app, line, "serve", "Serve the device over HTTP", false, [&line]() -> int {
-        const Device::FrontEndFiles files;
-        Device::OpenFor(line.target);
-        return Device::WebHost(files, line.listen).Run() ? Device::kExitDone : Device::kExitUsage;
-      });
+  CLI::App* const serve = AddCommand(app, line, "serve", "Serve the device over HTTP", false,
+                                     [&line] { return Serve(line); });
   serve->add_option("--listen", line.listen, "ADDRESS:PORT, unless systemd hands over a socket")
       ->capture_default_str();
   AddTraceOptions(*serve, line);

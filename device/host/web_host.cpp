@@ -6,6 +6,7 @@
 #include <sys/socket.h>
 #include <sys/wait.h>
 #include <syslog.h>
+#include <systemd/sd-daemon.h>
 
 #include <cerrno>
 #include <chrono>
@@ -60,10 +61,14 @@ std::string AddressOf(const Json::Value& asked) { return "address " + asked["cli
 
 FrontEndFiles::FrontEndFiles()
     : program(OpenBesideProgram(kFrontEndProgram, O_RDONLY)),
-      page(OpenBesideProgram(kPageFolder, O_RDONLY)) {}
+      page(OpenBesideProgram(kPageFolder, O_RDONLY)),
+      socket(sd_listen_fds(1) > 0 ? SD_LISTEN_FDS_START : -1) {}
 
-WebHost::WebHost(const FrontEndFiles& files, std::string listen)
-    : files_(files), listen_(std::move(listen)), lock_(LockDevice()) {
+WebHost::WebHost(FrontEndFiles files, std::string listen, Announcement announcement)
+    : files_(std::move(files)),
+      listen_(std::move(listen)),
+      announcement_(std::move(announcement)),
+      lock_(LockDevice()) {
   if (!Fence::IsSupported()) {
     std::cerr << "kavo-device: the archiver will not be fenced: the kernel has no Landlock\n";
   }
@@ -108,9 +113,10 @@ void WebHost::StartFrontEnd() {
   const FileDescriptor front_end_side(ends[1]);
   ProgramStart start;
   start.program = "/proc/self/fd/" + std::to_string(files_.program.Get());
-  start.arguments = {kFrontEndProgram, listen_, std::to_string(files_.page.Get())};
+  start.arguments = {kFrontEndProgram, listen_, std::to_string(files_.page.Get()),
+                     std::to_string(files_.socket.Get())};
   start.input = front_end_side.Get();
-  start.kept = {files_.page.Get()};
+  start.kept = {files_.page.Get(), files_.socket.Get()};
   try {
     front_end_ = ChildProcess::Start(start).Release();
   } catch (const std::system_error& error) {
@@ -141,6 +147,7 @@ pid_t WebHost::Fork(const std::function<int()>& body) {
              // What belongs to the launcher alone.
              control_.Close();
              signals_.Close();
+             files_.socket.Close();
              lock_.Close();
              queue_.Clear();
              checks_.clear();
@@ -175,9 +182,9 @@ void WebHost::Serve(ControlMessage& message) {
     case ControlKind::kListening:
       if (listen_ != message.text || !has_listened_) {
         listen_ = message.text;  // where any free port was asked for, this one from now on
-        std::cout << "serving '" << TheDevice().root << "' on http://" << listen_ << '/'
-                  << std::endl;
+        std::cout << announcement_(listen_) << std::endl;
         has_listened_ = std::cout.good();
+        sd_notify(0, "READY=1");
       }
       break;
     case ControlKind::kRequest:

@@ -21,17 +21,21 @@ namespace Device {
 // them.
 struct FrontEndFiles {
   FileDescriptor program;
-  FileDescriptor page;  // the folder with the page's files
+  FileDescriptor page;    // the folder with the page's files
+  FileDescriptor socket;  // that listens, when systemd has handed one over
 
-  // Opens them beside the executable. Throws std::runtime_error.
+  // Opens the files beside the executable. Throws std::runtime_error.
   FrontEndFiles();
 };
 
 class WebHost {
  public:
-  // `listen` is ADDRESS:PORT. Takes the open device for this process alone; throws
-  // std::runtime_error when another serves it.
-  WebHost(const FrontEndFiles& files, std::string listen);
+  // The line to print about an ADDRESS:PORT that is served from now on.
+  using Announcement = std::function<std::string(const std::string& address)>;
+
+  // `listen` is ADDRESS:PORT. Takes the
+  // open device for this process alone; throws std::runtime_error when another serves it.
+  WebHost(FrontEndFiles files, std::string listen, Announcement announcement);
   ~WebHost();
   WebHost(const WebHost&) = delete;
   WebHost& operator=(const WebHost&) = delete;
@@ -66,8 +70,9 @@ class WebHost {
   bool TakeSignal();
   void TakeEndedChildren();
 
-  const FrontEndFiles& files_;
+  FrontEndFiles files_;
   std::string listen_;
+  const Announcement announcement_;
   FileDescriptor lock_;
   FileDescriptor signals_;
   sigset_t saved_mask_{};

@@ -17,6 +17,8 @@ struct HostServices {
   std::function<void()> leave_request = [] {};
   // The worker that this request has forked; 0: none.
   pid_t worker = 0;
+  // The task that the process is about; empty: none.
+  std::string task;
   // Whether the desktop is to be told of the end of the tasks that the process makes.
   bool notifies_desktop = true;
 };

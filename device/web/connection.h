@@ -72,6 +72,10 @@ class ConnectionThreads : public httplib::TaskQueue {
 
 // A server whose connections are the above.
 class Server : public httplib::Server {
+ public:
+  // Listens there.
+  void Take(int socket) { svr_sock_ = socket; }
+
  private:
   bool process_and_close_socket(socket_t socket) override;
 };

@@ -17,6 +17,8 @@ class FrontEnd {
 
   // Binds the port, any free one for 0, and returns it; -1 with errno when that fails.
   int Bind(const std::string& address, int port);
+  // Takes a port that is bound.
+  void Take(int socket) { server_.Take(socket); }
   // Serves until Stop.
   void Listen() { server_.listen_after_bind(); }
   // Lets the requests that are being served end, for a while.

@@ -1,6 +1,8 @@
-// kavo-web LISTEN FD: the device's HTTP front end. Its standard input is the launcher's socket, FD
-// the folder of the page. Gives up root's rights before it serves anybody.
+// kavo-web LISTEN FD SOCKET: the device's HTTP front end. Its standard input is the launcher's
+// socket, FD the folder of the page, SOCKET where to listen instead, or -1. Gives up root's rights
+// before it serves anybody.
 #include <grp.h>
+#include <netdb.h>
 #include <poll.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
@@ -72,12 +74,21 @@ void WaitForTheEnd(const sigset_t& ending, Web::FrontEnd& front_end) {
   _exit(0);
 }
 
-void Serve(const std::string& listen, int page) {
+// Of a socket that is bound, as ADDRESS:PORT.
+std::string AddressOf(int socket) {
+  sockaddr_storage address{};
+  socklen_t size = sizeof address;
+  char host[NI_MAXHOST] = "";
+  char port[NI_MAXSERV] = "";
+  getsockname(socket, reinterpret_cast<sockaddr*>(&address), &size);
+  getnameinfo(reinterpret_cast<sockaddr*>(&address), size, host, sizeof host, port, sizeof port,
+              NI_NUMERICHOST | NI_NUMERICSERV);
+  return (address.ss_family == AF_INET6 ? "[" + std::string(host) + "]" : host) + ":" + port;
+}
+
+// Binds the port that was asked for, and returns the address.
+std::string Bind(const std::string& listen, Web::FrontEnd& front_end) {
   const Address address = ParseAddress(listen);
-  const Web::PageFiles files = Web::ReadPageFiles(page);
-  close(page);
-  AllowManyDescriptors();
-  Web::FrontEnd front_end(files);
   const int port = front_end.Bind(address.host, address.port);
   if (port < 0 && errno == 0) {
     throw std::runtime_error("cannot listen on " + listen + ": no such address");
@@ -85,6 +96,16 @@ void Serve(const std::string& listen, int page) {
   if (port < 0) {
     Device::ThrowErrno("cannot listen on " + listen);
   }
+  return listen.substr(0, listen.rfind(':') + 1) + std::to_string(port);
+}
+
+void Serve(const std::string& listen, int page, int socket) {
+  const Web::PageFiles files = Web::ReadPageFiles(page);
+  close(page);
+  AllowManyDescriptors();
+  Web::FrontEnd front_end(files);
+  front_end.Take(socket);
+  const std::string bound = socket < 0 ? Bind(listen, front_end) : AddressOf(socket);
   GiveUpRights();
   sigset_t ending;
   sigemptyset(&ending);
@@ -93,7 +114,6 @@ void Serve(const std::string& listen, int page) {
   }
   sigprocmask(SIG_BLOCK, &ending, nullptr);
   std::thread([&] { WaitForTheEnd(ending, front_end); }).detach();
-  const std::string bound = listen.substr(0, listen.rfind(':') + 1) + std::to_string(port);
   Device::SendControl(STDIN_FILENO, Device::ControlKind::kListening, bound, -1);
   front_end.Listen();
 }
@@ -104,10 +124,10 @@ int main(int argc, char** argv) {
   Device::OccupyStandardStreams();
   std::signal(SIGPIPE, SIG_IGN);
   try {
-    if (argc != 3) {
-      throw std::runtime_error("usage: kavo-web LISTEN FD, started by kavo-device");
+    if (argc != 4) {
+      throw std::runtime_error("usage: kavo-web LISTEN FD SOCKET, started by kavo-device");
     }
-    Serve(argv[1], std::atoi(argv[2]));
+    Serve(argv[1], std::atoi(argv[2]), std::atoi(argv[3]));
     return 0;
   } catch (const std::exception& error) {
     std::cerr << "kavo-device: " << error.what() << '\n';

@@ -140,7 +140,7 @@ Task::Task(const char* user, const char* task_id) : state(nullptr) {
   Operation("Vesk::Task::Task", user, task_id).Run([&] {
     auto task_state = std::make_unique<State>();
     task_state->user = user;
-    task_state->row.id = task_id;
+    task_state->row.id = Device::TheHost().task = task_id;
     // When nobody watches the task, the desktop is to be told of its end.
     task_state->row.properties[kPropNotify] = Json::Value(Device::TheHost().notifies_desktop);
     LogAndThrow("make task", [&] { Device::StoreOf(user).AddTask(task_state->row); });
@@ -250,6 +250,7 @@ Task* TaskMgr::getTaskWithThrow(const char* task_id) {
     if (!row) {
       throw std::runtime_error("no task '" + std::string(task_id) + "'");
     }
+    Device::TheHost().task = row->id;
     return new Task(new Task::State{state_->user, std::move(*row), false, {}});
   });
 }

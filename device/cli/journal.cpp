@@ -1,0 +1,43 @@
+// Log lines of the whole program, the module's among them: where standard error is the system's
+// journal, they go there with the task that they are about in the field TASK.
+#define SD_JOURNAL_SUPPRESS_LOCATION
+#include <sys/stat.h>
+#include <syslog.h>
+#include <systemd/sd-journal.h>
+#include <unistd.h>
+
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+
+#include "device/platform/host_services.h"
+
+namespace {
+
+bool IsJournal() {
+  const char* const journal = std::getenv("JOURNAL_STREAM");
+  struct stat status {};
+  return journal != nullptr && fstat(STDERR_FILENO, &status) == 0 &&
+         journal == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
+}
+
+}  // namespace
+
+// Called in place of libc's.
+extern "C" void syslog(int priority, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  static const bool is_journal = IsJournal();
+  char* text = nullptr;
+  if (!is_journal) {
+    vsyslog(priority, format, arguments);
+  } else if (vasprintf(&text, format, arguments) >= 0) {
+    const std::string& task = Device::TheHost().task;
+    sd_journal_send("MESSAGE=%s", text, "PRIORITY=%d", LOG_PRI(priority),
+                    "SYSLOG_IDENTIFIER=kavo-device", task.empty() ? nullptr : "TASK=%s",
+                    task.c_str(), nullptr);
+    std::free(text);
+  }
+  va_end(arguments);
+}
