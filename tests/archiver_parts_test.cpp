@@ -111,7 +111,7 @@ TEST(Run7z, TellsCauseAndObjectInOneLine) {
     const char *script, *line;
   } rows[] = {
       {"/nonexistent/7z", "cannot start '/nonexistent/7z': No such file or directory"},
-      {"kill -9 $$", "7z was killed by signal 9"},
+      {"kill -9 $$", "7z was killed by signal 9, maybe for want of memory"},
       {"exit 2", "7z failed with status 2"},
       {"echo 'ERROR: oops' >&2", "7z failed with status 0: oops"},
       {R"(printf '\n\nSystem ERROR:\nerrno=28 : No space left\n' >&2; exit 2)",

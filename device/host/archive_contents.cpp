@@ -113,9 +113,8 @@ bool ReadLines(const FileDescriptor& output, const Patience& patience, Contents&
     ThrowMemoryShortage();
   }
   const bool is_encrypted = text.find("encrypted archive") != std::string::npos;
-  throw Refused(Refusal(kHttpNoArchive, is_encrypted
-                                            ? "the archive's list is protected by a password"
-                                            : "the archive is damaged"));
+  throw Refused(kHttpNoArchive, is_encrypted ? "the archive's list is protected by a password"
+                                             : "the archive is damaged");
 }
 
 }  // namespace
@@ -126,7 +125,7 @@ std::string ListArchive(const std::string& user, const std::string& path,
   const FileDescriptor file = OpenFileOf(user, ResolveForUser(user, path), status);
   const std::string format = FormatOf(file);
   if (format.empty()) {
-    throw Refused(Refusal(kHttpNoArchive, "this is not a zip or 7z archive"));
+    throw Refused(kHttpNoArchive, "this is not a zip or 7z archive");
   }
   Fence fence;
   fence.AllowReading(file.Get());

@@ -15,10 +15,13 @@
 
 namespace Device {
 
+Refused::Refused(int http_status, int code)
+    : std::runtime_error(ErrorText(code)),
+      answer(http_status, JsonObject({{"code", code}, {"error", ErrorText(code)}})) {}
+
 void RefuseFor(int code) {
   const bool is_forbidden = code == KAVO::kErrNoPrivilege || code == KAVO::kErrOutsideShare;
-  throw Refused(Answer(is_forbidden ? kHttpForbidden : kHttpNotFound,
-                       JsonObject({{"code", code}, {"error", ErrorText(code)}})));
+  throw Refused(is_forbidden ? kHttpForbidden : kHttpNotFound, code);
 }
 
 void RefuseForErrno(int error_number) {
@@ -51,7 +54,7 @@ FileDescriptor OpenForUser(const std::string& user, const ResolvedPath& path, in
 FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, struct stat& status) {
   const FileDescriptor found = OpenForUser(user, path, O_PATH);
   if (fstat(found.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
-    throw Refused(Refusal(kHttpNotFound, "not a file"));
+    throw Refused(kHttpNotFound, "not a file");
   }
   FileDescriptor file(open(PathOf(found.Get()).c_str(), O_RDONLY | O_CLOEXEC));
   if (!file) {

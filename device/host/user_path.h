@@ -4,9 +4,8 @@
 #include <sys/stat.h>
 
 #include <chrono>
-#include <exception>
+#include <stdexcept>
 #include <string>
-#include <utility>
 
 #include "device/base/file_descriptor.h"
 #include "device/host/wire.h"
@@ -15,8 +14,11 @@
 namespace Device {
 
 // Thrown where a request has no other answer.
-struct Refused : std::exception {
-  explicit Refused(Answer refusal) : answer(std::move(refusal)) {}
+struct Refused : std::runtime_error {
+  explicit Refused(int http_status, const std::string& reason)
+      : std::runtime_error(reason), answer(Refusal(http_status, reason)) {}
+  // With a KAVO::ErrorCode and its words.
+  Refused(int http_status, int code);
 
   Answer answer;
 };

@@ -126,7 +126,7 @@ Json::Value PathsOf(const Json::Value& asked, std::string body) {
     }
     throw std::runtime_error("'paths' is missing or no list of texts");
   } catch (const std::runtime_error& error) {
-    throw Refused(Refusal(kHttpBadRequest, error.what()));
+    throw Refused(kHttpBadRequest, error.what());
   }
 }
 
