@@ -8,8 +8,8 @@
 #include "device/cli/client.h"
 #include "device/cli/commands.h"
 #include "device/cli/output.h"
-#include "device/host/file_listing.h"
 #include "device/host/task_events.h"
+#include "device/host/user_files.h"
 #include "device/platform/lumo/errors.h"
 #include "device/tasks/job_queue.h"
 #include "device/tasks/user_tasks.h"
@@ -76,11 +76,11 @@ int TasksCommand(const Target& target) {
 
 int LsCommand(const Target& target, const std::string& folder) {
   return PrintList(target, "entries", PrintEntry, [&] {
-    const Listing listing = ListFolder(target.user, folder);
-    if (listing.error != 0) {
-      throw Failure(folder + ": " + ErrorText(listing.error));
+    try {
+      return ParseJson(DecodeByteEscapes(ListFolder(target.user, folder)));
+    } catch (const Refused& refused) {
+      throw Failure(folder + ": " + ParseJson(refused.answer.body)["error"].asString());
     }
-    return ParseJson(DecodeByteEscapes(listing.body));
   });
 }
 

@@ -118,8 +118,8 @@ void SendFile(const Request& request, Response& response, const Device::Answer& 
       "application/octet-stream", [file, place, at = part->begin, end = part->end](
                                       std::size_t /*at*/, httplib::DataSink& sink) mutable {
         std::array<char, 65536> block;
-        const auto size = std::min<std::int64_t>(end - at, block.size());
-        const ssize_t got = pread(file->Get(), block.data(), static_cast<std::size_t>(size), at);
+        const auto most = std::min<std::int64_t>(end - at, block.size());
+        const ssize_t got = pread(file->Get(), block.data(), static_cast<std::size_t>(most), at);
         at += got;
         Connection::OfThisThread().AllowForWriting(kAnswerTime);
         if (got < 0 || (got == 0 && at < end) || !sink.write(block.data(), got)) {
