@@ -37,7 +37,8 @@ constexpr char kPolicy[] =
 constexpr char kCodePages[] =
     R"(["","CP437","CP850","CP852","CP866","CP874","CP932","CP936","CP949","CP950","CP1250","CP1251",)"
     R"("CP1252","CP1253","CP1254","CP1255","CP1256","CP1257","CP1258","EUC-JP","EUC-KR","GB18030",)"
-    R"("KOI8-R","KOI8-U","ISO-8859-1","ISO-8859-2","ISO-8859-15"])";
+    R"("KOI8-R","KOI8-U","ISO-8859-1","ISO-8859-2","ISO-8859-15"])"
+    "\n";
 
 }  // namespace
 
