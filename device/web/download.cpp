@@ -25,27 +25,23 @@ using httplib::Response;
 namespace {
 
 constexpr std::size_t kMostOfOne = 16;
-constexpr std::size_t kMostOfAll = 256;
 constexpr char kRetrySeconds[] = "10";
 
 struct Places {
   std::mutex mutex;
   std::map<std::string, std::size_t> taken;  // by user
-  std::size_t all = 0;
 };
 
 // One of the user's, until the last copy goes; null when none is free.
 std::shared_ptr<void> TakePlace(const std::string& user) {
   static auto& places = *new Places;  // threads that use it end with the process
   const std::lock_guard<std::mutex> lock(places.mutex);
-  if (places.all >= kMostOfAll || places.taken[user] >= kMostOfOne) {
+  if (places.taken[user] >= kMostOfOne) {
     return nullptr;
   }
-  ++places.all;
   ++places.taken[user];
   return {&places, [user](void*) {
             const std::lock_guard<std::mutex> ended(places.mutex);
-            --places.all;
             --places.taken[user];
           }};
 }

@@ -45,25 +45,21 @@ void PassOn(const Request& request, Response& response, const Device::Answer& an
   if (exchange->BodyLeft() == 0) {
     return;
   }
-  const auto pass = [exchange](httplib::DataSink& sink) {
+  const auto pass = [exchange](std::size_t /*at*/, httplib::DataSink& sink) {
     std::array<char, 65536> part;
     const std::size_t size = std::min(exchange->BodyLeft(), part.size());
     Connection::OfThisThread().AllowForWriting(kAnswerTime);
-    if (!exchange->ReadBody(part.data(), size) || !sink.write(part.data(), size)) {
-      return false;
-    }
-    if (exchange->BodyLeft() == 0 && sink.done) {
+    const bool is_passed = exchange->ReadBody(part.data(), size) && sink.write(part.data(), size);
+    if (is_passed && exchange->BodyLeft() == 0) {
       sink.done();
     }
-    return true;
+    return is_passed;
   };
-  if (request.has_header("Accept-Encoding")) {  // the library compresses what has no length
-    response.set_chunked_content_provider(
-        kJson, [pass](std::size_t /*at*/, httplib::DataSink& sink) { return pass(sink); });
+  if (request.has_header("Accept-Encoding")) {
+    response.set_chunked_content_provider(kJson, pass);  // which the library compresses
   } else {
-    response.set_content_provider(exchange->BodyLeft(), kJson,
-                                  [pass](std::size_t /*at*/, std::size_t /*left*/,
-                                         httplib::DataSink& sink) { return pass(sink); });
+    response.set_header("Content-Length", std::to_string(exchange->BodyLeft()));
+    response.set_content_provider(kJson, pass);
   }
 }
 
