@@ -79,7 +79,7 @@ int LsCommand(const Target& target, const std::string& folder) {
     try {
       return ParseJson(DecodeByteEscapes(ListFolder(target.user, folder)));
     } catch (const Refused& refused) {
-      throw Failure(folder + ": " + ParseJson(refused.answer.body)["error"].asString());
+      throw Failure(folder + ": " + refused.what());
     }
   });
 }
