@@ -117,9 +117,6 @@ class Job {
       // The worker's end, a signal, ends it early.
       poll(nullptr, 0, static_cast<int>(pause.count()));
       Launcher::Reap();
-      if (interrupted_by != 0) {
-        return Stop(interrupted_by);
-      }
       const Json::Value task = client_.Task(task_id_);
       if (task.isNull()) {
         return EndWith(KAVO::kErrNoTask);  // another client has stopped or dismissed it
@@ -128,6 +125,9 @@ class Job {
       if (task["state"] == "finished" || task["state"] == "failed") {
         client_.AskAbout("status", task_id_);  // which takes it off the list
         return End(task);
+      }
+      if (interrupted_by != 0) {
+        return Stop(interrupted_by);
       }
     }
   }
