@@ -83,7 +83,7 @@ TEST_F(CliTest, CompressShowsEachErrorInWordsAndTheLogWhenItIsWatched) {
                                      "kavo-device: /photo/no.txt: no such file or folder (408)\n"));
   EXPECT_THAT(watched.err, HasSubstr(" Can't access source files\n"));
   const Ran json = As("alice", "compress", job + Strings{"--json"});
-  EXPECT_EQ(Device::ParseJson(json.out)["errors"][0]["error"], "no such file or folder");
+  EXPECT_EQ(Device::ParseJson(json.out)["errors"][0]["path"], "/photo/no.txt");
   EXPECT_THAT(json.err,
               testing::EndsWith("kavo-device: /photo/no.txt: no such file or folder (408)\n"));
   EXPECT_THAT(json.err, Not(HasSubstr("Can't access")));
@@ -96,8 +96,12 @@ TEST_F(CliTest, NamesFoldersAsUsersDo) {
   EXPECT_THAT(missing.err, HasSubstr("device: /photo/none: no such file or folder (408)\n"));
   const Ran homeless = As("alice", "compress", {"a.txt", "none/z.zip"});
   EXPECT_THAT(homeless.err, HasSubstr("device: /home/none: no such file or folder (408)\n"));
+  fs::create_directory(At("vol1/homes/alice/z.7z"));
+  const Ran no_file = As("alice", "compress", {"a.txt", "z.7z"});
+  EXPECT_THAT(no_file.err, HasSubstr("z.7z: the archive could not be made (1300): "));
+  EXPECT_THAT(no_file.err, Not(HasSubstr(device_)));
   EXPECT_EQ(As("alice", "compress", {"a.txt", "z.ZIP"}).out, "/home/z.ZIP\n");
-  EXPECT_EQ(As("alice", "ls", {"."}).out, "a.txt\nz.ZIP\n");
+  EXPECT_EQ(As("alice", "ls", {"."}).out, "a.txt\nz.7z/\nz.ZIP\n");
   EXPECT_THAT(As("carol", "ls").out, Not(HasSubstr("vault")));
 }
 

@@ -7,32 +7,15 @@
 #include "device/base/child_process.h"
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
-#include "device/base/open_below.h"
 #include "device/cli/output.h"
 #include "device/host/sessions.h"
 #include "device/model/device.h"
 #include "device/platform/lumo/errors.h"
-#include "device/platform/lumo/paths.h"
 #include "device/tasks/job_queue.h"
 #include "device/tasks/user_tasks.h"
 #include "platform/lumo/file_manager.h"
 
 namespace Device {
-
-namespace {
-
-// What the API may tell as a full path, as the user sees it.
-std::string UserPath(const std::string& user, const std::string& path) {
-  const OpenDevice& device = TheDevice();
-  const Share* const share = ShareOfRealPath(device, path);
-  const std::string folder = share != nullptr ? device.VolumePath(share->volume) + "/" + share->name
-                                              : device.HomePath(*device.config.FindUser(user));
-  return IsWithin(path, folder)
-             ? "/" + (share != nullptr ? share->name : kHomeShare) + path.substr(folder.size())
-             : path;
-}
-
-}  // namespace
 
 void OpenFor(const Target& target) {
   Open(target.folder);
@@ -69,22 +52,12 @@ Json::Value AskAs(const std::string& user, const std::function<Json::Value()>& b
   return answer["result"];
 }
 
-void CompleteTask(const std::string& user, Json::Value& task) {
-  if (!task.isMember(kDataErrors)) {
-    return;
-  }
-  for (Json::Value& item : task[kDataErrors]) {
-    const std::string path = item["path"].asString();
-    item["path"] = path.empty() ? task["dest_file_path"] : Json::Value(UserPath(user, path));
-    item["error"] = ErrorText(item["code"].asInt());
-  }
-}
-
 std::vector<std::string> ErrorLines(const Json::Value& task) {
   std::vector<std::string> lines;
   for (const Json::Value& item : task[kDataErrors]) {
-    lines.push_back(item["path"].asString() + ": " + item["error"].asString() + " (" +
-                    item["code"].asString() + ")");
+    const std::string path = item["path"].asString();
+    lines.push_back((path.empty() ? task["dest_file_path"].asString() : path) + ": " +
+                    ErrorText(item["code"].asInt()) + " (" + item["code"].asString() + ")");
   }
   if (lines.empty() && task["state"] == "failed") {
     lines.push_back(task["dest_file_path"].asString() + ": failed without a reason");
@@ -113,12 +86,10 @@ Outcome Client::AskAbout(const std::string& method, const std::string& task_id) 
 }
 
 Json::Value Client::Task(const std::string& id) const {
-  Json::Value task = AskAs(user_, [&] {
+  return AskAs(user_, [&] {
     const std::optional<TaskRow> row = ReadTask(user_, id);
     return row ? TaskView(*row, WaitingWorkers()) : Json::Value();
   });
-  CompleteTask(user_, task);
-  return task;
 }
 
 }  // namespace Device

@@ -16,8 +16,6 @@ void OpenFor(const Target& target);
 // What the body returns in a process that has the user's identity. Throws Failure with its reason.
 Json::Value AskAs(const std::string& user, const std::function<Json::Value()>& body);
 
-// Makes TaskView fit for output: a code's words beside it, paths as users see them.
-void CompleteTask(const std::string& user, Json::Value& task);
 // Why a task failed: "PATH: WORDS (CODE)" for each error, the last with the archiver's own reason.
 std::vector<std::string> ErrorLines(const Json::Value& task);
 

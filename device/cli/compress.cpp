@@ -159,7 +159,6 @@ class Job {
   int EndWith(int code) const {
     Json::Value task = JsonObject({{"dest_file_path", dest_}, {"state", "failed"}});
     task["errors"].append(JsonObject({{"path", dest_}, {"code", code}}));
-    CompleteTask(target_.user, task);
     return End(task);
   }
 

@@ -68,7 +68,7 @@ int TasksCommand(const Target& target) {
     Json::Value list = JsonObject({{"tasks", Json::arrayValue}});
     const auto waiting = WaitingWorkers();
     for (const TaskRow& row : AllTasks(target.user)) {
-      CompleteTask(target.user, list["tasks"].append(TaskView(row, waiting)));
+      list["tasks"].append(TaskView(row, waiting));
     }
     return list;
   });

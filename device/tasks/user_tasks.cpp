@@ -8,6 +8,7 @@
 #include <utility>
 
 #include "device/base/json_text.h"
+#include "device/model/device.h"
 #include "device/tasks/workers.h"
 #include "platform/kavo/error_codes.h"
 
@@ -57,6 +58,27 @@ Json::Value GeneralError(const TaskRow& row) {
   Json::Value errors(Json::arrayValue);
   errors.append(JsonObject({{"path", Destination(row)}, {"code", KAVO::kErrGeneral}}));
   return errors;
+}
+
+// Full paths in a text of the module's or the archiver's, as users write them.
+std::string WithUserPaths(std::string text) {
+  std::map<std::string, std::string> user_paths;
+  for (const Share& share : TheDevice().config.shares) {
+    user_paths[TheDevice().VolumePath(share.volume) + "/" + share.name] = "/" + share.name;
+  }
+  for (const User& user : TheDevice().config.users) {
+    user_paths[TheDevice().HomePath(user)] = std::string("/") + kHomeShare;
+  }
+  for (const auto& [folder, path] : user_paths) {
+    for (std::size_t at = text.find(folder); at != std::string::npos;
+         at = text.find(folder, at + 1)) {
+      const char next = text.c_str()[at + folder.size()];
+      if (next == '/' || next == '\'' || next == 0) {
+        text.replace(at, folder.size(), path);
+      }
+    }
+  }
+  return text;
 }
 
 void StoreFailure(const std::string& user, TaskRow& row) {
@@ -144,7 +166,12 @@ Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& wai
     view["state"] = "failed";
     const bool is_listed = data.members.at(kDataErrors).size() <= kMostListedErrors;
     view[kDataErrors] = is_listed ? data.Member(kDataErrors) : GeneralError(row);
-    add_if_known(kArchiverReason);
+    for (Json::Value& item : view[kDataErrors]) {
+      item["path"] = WithUserPaths(item["path"].asString());
+    }
+    if (archiver.HasMember(kArchiverReason)) {
+      view[kArchiverReason] = WithUserPaths(archiver.Member(kArchiverReason).asString());
+    }
   } else if (row.finished) {
     view["state"] = "finished";
     add_if_known(kArchiverSize);
