@@ -20,33 +20,34 @@ export function onSessionEnd(handler) {
   tellSessionEnd = handler;
 }
 
-async function send(method, url, body) {
+async function send(method, url, { body, signal } = {}) {
   const headers = body ? { 'Content-Type': 'application/json' } : {};
   try {
-    return await fetch(url, { method, headers, body: body && JSON.stringify(body), cache: 'no-store' });
+    return await fetch(url, { method, headers, body: body && JSON.stringify(body), cache: 'no-store', signal });
   } catch {
     throw new Refusal('the device does not answer');
   }
 }
 
 async function answerOf(response) {
-  const answer = await response.json().catch(() => ({}));
-  if (response.ok) return answer;
-  throw new Refusal(answer.error ?? `the device answered ${response.status}`, {
+  const answer = await response.json().catch(() => null);
+  if (response.ok && answer) return answer;
+  const words = response.ok ? 'the answer broke off' : `the device answered ${response.status}`;
+  throw new Refusal(answer?.error ?? words, {
     status: response.status,
-    code: answer.code,
+    code: answer?.code,
     retryAfter: Number(response.headers.get('Retry-After')),
   });
 }
 
-async function request(method, url, body) {
-  const response = await send(method, url, body);
+async function request(method, url, options) {
+  const response = await send(method, url, options);
   if (response.status === UNAUTHORIZED) tellSessionEnd();
   return answerOf(response);
 }
 
 export async function signIn(user, password) {
-  return answerOf(await send('POST', '/session', { user, password }));
+  return answerOf(await send('POST', '/session', { body: { user, password } }));
 }
 
 // Null when nobody is signed in.
@@ -60,13 +61,14 @@ export async function signOut() {
   if (response.status !== UNAUTHORIZED && !response.ok) await answerOf(response);
 }
 
-export function listFolder(path) {
-  return request('GET', '/files?path=' + encodePath(path));
-}
+export const listFolder = (path, signal) => request('GET', `/files?path=${encodePath(path)}`, { signal });
+export const listArchive = (path, signal) => request('GET', `/archive?path=${encodePath(path)}`, { signal });
+export const checkDestination = (path, format, signal) => request('GET', `/destination?path=${encodePath(path)}&format=${format}`, { signal });
+export const countTree = (paths, signal) => request('POST', '/size', { body: { paths }, signal });
+export const listCodepages = () => request('GET', '/codepages');
+export const listTasks = async () => (await request('GET', '/tasks')).tasks;
 
-export async function listTasks() {
-  return (await request('GET', '/tasks')).tasks;
-}
+export const downloadUrl = (path) => `/download?path=${encodePath(path)}`;
 
 export async function wordsOf(code) {
   codeWords ??= await request('GET', '/codes');
@@ -74,7 +76,8 @@ export async function wordsOf(code) {
 }
 
 async function call(method, params) {
-  const { code, data } = await request('POST', '/webapi', { api: API, version: API_VERSION, method, params });
+  const body = { api: API, version: API_VERSION, method, params };
+  const { code, data } = await request('POST', '/webapi', { body });
   if (code !== 0) throw new Refusal(await wordsOf(code), { code });
   return data;
 }
@@ -84,10 +87,5 @@ export async function startTask(sources, destination, options) {
   return data.taskid;
 }
 
-export function stopTask(taskid) {
-  return call('stop', { taskid });
-}
-
-export function taskStatus(taskid) {
-  return call('status', { taskid });
-}
+export const stopTask = (taskid) => call('stop', { taskid });
+export const taskStatus = (taskid) => call('status', { taskid });

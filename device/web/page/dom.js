@@ -9,8 +9,12 @@ const ICONS = {
   link:
     'M10 14a4 4 0 0 0 5.7 0l3.1-3.1a4 4 0 0 0-5.7-5.7L12 6.3M14 10a4 4 0 0 0-5.7 0l-3.1 3.1a4 4 0 0 0 5.7 5.7L12 17.7',
   other: 'M12 3l8 4.5v9L12 21l-8-4.5v-9zM12 12l8-4.5M12 12v9M12 12L4 7.5',
+  refresh: 'M20 5v5h-5M4 19v-5h5M19.5 10A8 8 0 0 0 5.6 7.6M4.5 14a8 8 0 0 0 13.9 2.4',
   close: 'M6 6l12 12M18 6L6 18',
 };
+const END_SIGNS = 10;
+
+const segmenter = new Intl.Segmenter();
 
 export const byId = (id) => document.getElementById(id);
 
@@ -35,14 +39,35 @@ export function icon(name) {
   return svg;
 }
 
-// A name or path from the device, apart from the direction of the text around it.
+// A name or path from the device, apart from the direction of the text around it. It can break after
+// what parts its words.
 export function nameElement(name) {
-  return element('bdi', { class: 'name' }, shown(name));
+  const made = element('bdi', { class: 'name' });
+  for (const part of shown(name).split(/(?<=[/._\-])/u)) made.append(part, element('wbr'));
+  return made;
+}
+
+// A name on one line, which is cut in the middle when there is no room: its ending tells what it is.
+export function cutNameElement(name) {
+  const text = shown(name);
+  const signs = [...segmenter.segment(text)];
+  const at = signs.length > 2 * END_SIGNS ? signs.at(-END_SIGNS).index : text.length;
+  return element('bdi', { class: 'name cut' }, element('span', {}, text.slice(0, at)), element('span', {}, text.slice(at)));
 }
 
 export function button(label, attributes, onClick) {
   const made = element('button', { type: 'button', ...attributes }, label);
   made.addEventListener('click', onClick);
+  return made;
+}
+
+// A link to a place in the page, which a function goes to.
+export function link(label, onClick) {
+  const made = element('a', { href: location.hash || '#' }, label);
+  made.addEventListener('click', (event) => {
+    event.preventDefault();
+    onClick();
+  });
   return made;
 }
 

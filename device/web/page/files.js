@@ -1,14 +1,18 @@
 // The folder on show: what the location names, its breadcrumb, its entries or why there are none.
 import { Refusal, listFolder } from './api.js';
-import { byId, element, nameElement, setText } from './dom.js';
+import { byId, element, icon, nameElement, setText } from './dom.js';
 import { FileGrid } from './grid.js';
 import { ROOT, decodePath, encodePath, join, lastName, parentOf, shown } from './names.js';
+import { notify } from './notices.js';
 
 const ROOT_TITLE = 'Shared folders';
-const PAGE_TITLE = 'Files';
 const FORBIDDEN = 403;
+const PATIENCE_MS = 150;
 
 const HASH = '#';
+const titleOf = (path) => (path === ROOT ? ROOT_TITLE : shown(lastName(path)));
+
+export const locationOf = (path) => HASH + encodePath(path);
 
 export class Files {
   #main = byId('files');
@@ -18,11 +22,23 @@ export class Files {
   #path = '';
   #wanted = ROOT;
   #writable = false;
-  #request = 0;
+  #refusal = null;
+  #count = 0;
+  #asked = new AbortController();
+  #revealed = '';  // to be selected when the folder is there
+  #onShow;
 
-  constructor({ onSelect }) {
-    this.#grid = new FileGrid({ onOpen: (name) => this.#go(join(this.#path, name)), onSelect });
+  constructor({ onOpen, onMenu, onSelect, onShow }) {
+    this.#onShow = onShow;
+    this.#grid = new FileGrid({
+      open: (entry) => (entry.kind === 'folder' ? this.#go(join(this.#path, entry.name)) : onOpen(entry)),
+      menu: onMenu,
+      select: onSelect,
+      view: () => this.#drawState(),
+    });
     this.#up.addEventListener('click', () => this.#goUp());
+    byId('refresh').append(icon('refresh'));
+    byId('refresh').addEventListener('click', () => this.reload());
     this.#main.addEventListener('keydown', (event) => {
       if (event.key === 'Backspace' && !event.target.matches('input:not([type=checkbox])')) {
         event.preventDefault();
@@ -35,21 +51,44 @@ export class Files {
     return this.#path;
   }
 
+  get title() {
+    return titleOf(this.#path);
+  }
+
   get isWritable() {
     return this.#writable;
   }
 
+  get isRefused() {
+    return this.#refusal !== null;
+  }
+
+  get selectedEntries() {
+    return this.#grid.selectedEntries;
+  }
+
+  get selectedCount() {
+    return this.#grid.selectedCount;
+  }
+
+  // A whole folder is named as one; the shared folders have no path of their own.
   get selectedPaths() {
-    return this.#grid.selectedEntries.map((entry) => join(this.#path, entry.name));
+    if (this.#grid.isAllSelected && this.#path !== ROOT) return [this.#path];
+    return this.selectedEntries.map((entry) => join(this.#path, entry.name));
   }
 
   clearSelection() {
     this.#grid.clearSelection();
   }
 
+  // What was selected before in the folder that is going to be shown.
+  selectNames(names) {
+    this.#grid.selectNames(names);
+  }
+
   // Leaves nothing on show, for the next user.
   clear() {
-    this.#request += 1;
+    this.#asked.abort();
     this.#path = '';
     this.#grid.show('', [], '');
     this.#state.hidden = true;
@@ -72,66 +111,96 @@ export class Files {
     await this.#list();
   }
 
+  // Shows a file in its folder, selected and with the focus.
+  async reveal(path) {
+    this.#revealed = path;
+    if (parentOf(path) === this.#path) await this.reload();
+    else this.#go(parentOf(path));
+  }
+
   // False when a later request has overtaken this one.
   async #list() {
-    const request = ++this.#request;
-    this.#main.setAttribute('aria-busy', 'true');
+    this.#asked.abort();
+    const asked = this.#asked = new AbortController();
+    const late = setTimeout(() => this.#drawLoading(), PATIENCE_MS);
     const listing = await listFolder(this.#wanted).catch((refusal) => {
       if (refusal instanceof Refusal) return { entries: [], refusal };
       throw refusal;
     });
-    if (request !== this.#request) return false;
+    clearTimeout(late);
+    if (asked.signal.aborted) return false;
     this.#main.removeAttribute('aria-busy');
     this.#show(listing);
     return true;
   }
 
-  #show({ entries, writable = false, refusal }) {
+  #show({ entries, writable = false, refusal = null }) {
     const left = this.#path;
     this.#path = this.#wanted;
     this.#writable = writable;
+    this.#refusal = refusal;
+    this.#count = entries.length;
     this.#drawPath();
-    const label = `Contents of ${this.#title()}`;
+    const label = `Contents of ${this.title}`;
     if (left === this.#path) this.#grid.update(label, entries);
     else this.#grid.show(label, entries, parentOf(left) === this.#path ? lastName(left) : '');
-    this.#drawState(entries.length, refusal);
+    this.#drawState();
+    this.#onShow();
+    this.#showRevealed();
+  }
+
+  #showRevealed() {
+    const path = this.#revealed;
+    this.#revealed = '';
+    if (!path || parentOf(path) !== this.#path || this.#grid.reveal(lastName(path))) return;
+    notify(path, `${shown(path)} is not there any more.`, { isFailure: true });
   }
 
   #go(path) {
-    location.hash = HASH + encodePath(path);
+    location.hash = locationOf(path);
   }
 
   #goUp() {
     if (this.#path.length > ROOT.length) this.#go(parentOf(this.#path));
   }
 
-  #title() {
-    return this.#path === ROOT ? ROOT_TITLE : shown(lastName(this.#path));
-  }
-
   #drawPath() {
-    const title = this.#title();
-    document.title = `${title} – ${PAGE_TITLE}`;
-    byId('folder-title').replaceChildren(element('bdi', {}, title));
+    byId('folder-title').replaceChildren(element('bdi', {}, this.title));
     this.#up.disabled = this.#path === ROOT;
     const steps = [ROOT];
     for (const part of this.#path.split('/').filter(Boolean)) steps.push(join(steps.at(-1), part));
     byId('breadcrumb').replaceChildren(...steps.map((step) => element('li', {}, element('a', {
-      href: HASH + encodePath(step),
+      href: locationOf(step),
       'aria-current': step === this.#path && 'page',
     }, step === ROOT ? ROOT_TITLE : nameElement(lastName(step))))));
   }
 
-  #drawState(count, refusal) {
-    this.#state.hidden = count > 0;
-    if (count > 0) return;
-    const heading = refusal ? 'This folder cannot be shown' : 'This folder is empty';
+  // What is on show of another folder goes when the one that is wanted takes its time.
+  #drawLoading() {
+    this.#main.setAttribute('aria-busy', 'true');
+    if (this.#wanted === this.#path) return;
+    byId('grid').hidden = true;
+    this.#tell('Opening', `${titleOf(this.#wanted)}…`);
+  }
+
+  #drawState() {
+    const isEmpty = this.#grid.count === 0;
+    this.#state.hidden = !isEmpty;
+    if (!isEmpty) return;
+    if (this.#refusal) this.#tell('This folder cannot be shown', this.#reason());
+    else if (this.#count > 0) this.#tell('Nothing to show', 'What is in this folder is hidden or does not match the filter.');
+    else this.#tell('This folder is empty', '');
+  }
+
+  #tell(heading, text) {
     const words = element('p', {});
-    setText(words, refusal ? this.#reason(refusal) : '');
+    setText(words, text);
+    this.#state.hidden = false;
     this.#state.replaceChildren(element('h2', {}, heading), words);
   }
 
-  #reason(refusal) {
-    return refusal.status === FORBIDDEN ? `You may not list it: ${refusal.message}.` : `${refusal.message}.`;
+  #reason() {
+    const { status, message } = this.#refusal;
+    return status === FORBIDDEN ? `You may not list it: ${message}.` : `${message}.`;
   }
 }

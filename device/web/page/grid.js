@@ -1,13 +1,15 @@
 // The list of a folder's entries: a grid of rows, one of which takes the keyboard's focus.
-import { byId, element, icon, nameElement } from './dom.js';
+import { byId, cutNameElement, element, icon } from './dom.js';
 import { dateText, sizeText } from './format.js';
 import { shown } from './names.js';
+import { isHidden, isMetadata, matching, nextBeginning, sorted } from './order.js';
+import { Rows } from './rows.js';
 import { Selection } from './selection.js';
 
-const ROWS_PER_BLOCK = 250;
-const AHEAD = '1500px';
 const ROWS_PER_PAGE = 10;
 const HEADER_ROWS = 1;
+const TYPING_MS = 1000;
+const LARGEST_FIRST = ['size', 'modified'];
 
 const KIND_WORDS = { folder: 'folder', file: 'file', link: 'link', other: 'special file' };
 
@@ -15,111 +17,137 @@ export class FileGrid {
   #root = byId('grid');
   #body = byId('grid-body');
   #selectAll = byId('select-all');
-  #selection = new Selection((turned) => this.#paint(turned));
-  #entries = [];
-  #rows = [];
-  #blocks = [];
-  #active = 0;
+  #filter = byId('filter');
+  #withHidden = byId('show-hidden');
+  #selection = new Selection(() => this.#paint());
+  #rows = new Rows(this.#body, (index) => this.#makeRow(index));
+  #all = [];      // in the order of bytes, as they came
+  #sorted = [];
+  #entries = [];  // those on show
+  #order = { by: 'name', isDescending: false };
+  #typed = '';
+  #typedAt = 0;
   #touched = false;
-  #observer = new IntersectionObserver((seen) => this.#fillSeen(seen), { root: this.#root, rootMargin: AHEAD });
-  #onOpen;
-  #onSelect;
+  #on;
 
-  constructor({ onOpen, onSelect }) {
-    this.#onOpen = onOpen;
-    this.#onSelect = onSelect;
+  // Handlers: open gets an entry; menu the place of a click, if it was one; select and view nothing.
+  constructor(handlers) {
+    this.#on = handlers;
     this.#body.addEventListener('pointerdown', (event) => { this.#touched = event.pointerType === 'touch'; });
     this.#body.addEventListener('click', (event) => this.#click(event));
-    this.#body.addEventListener('dblclick', (event) => this.#doubleClick(event));
+    this.#body.addEventListener('dblclick', (event) => {
+      if (!event.target.matches('input')) this.#on.open(this.#entries[indexOf(event)]);
+    });
     this.#body.addEventListener('keydown', (event) => this.#keyDown(event));
+    this.#body.addEventListener('contextmenu', (event) => this.#contextMenu(event));
     this.#selectAll.addEventListener('change', () => this.#toggleAll());
+    this.#filter.addEventListener('input', () => this.#rearrange());
+    this.#withHidden.addEventListener('change', () => this.#rearrange());
+    for (const head of this.#root.querySelectorAll('[data-by]')) {
+      head.querySelector('button').addEventListener('click', () => this.#sortBy(head.dataset.by));
+    }
   }
 
   get selectedEntries() {
-    return [...this.#selection.chosen].sort((one, other) => one - other).map((index) => this.#entries[index]);
+    return this.#sorted.filter((entry) => this.#selection.chosen.has(entry));
+  }
+
+  get selectedCount() {
+    return this.#selection.chosen.size;
+  }
+
+  // Nothing that would be packed is left out, not even what is hidden.
+  get isAllSelected() {
+    const { chosen } = this.#selection;
+    return chosen.size > 1 && this.#all.every((entry) => chosen.has(entry) || isMetadata(entry));
+  }
+
+  get count() {
+    return this.#entries.length;
   }
 
   // Fills the grid for another folder; the row of the name active takes the focus.
   show(label, entries, active) {
+    this.#filter.value = '';
     this.#fill(label, entries, new Set(), active);
-    this.#root.scrollTop = 0;
-    this.#rowAt(this.#active)?.scrollIntoView({ block: 'nearest' });
+    const row = this.#rows.at(this.#rows.kept);
+    if (this.#rows.kept > 0) row.scrollIntoView({ block: 'center' });
+    else window.scrollTo(0, 0);
   }
 
   // Fills the grid with what the same folder holds now: selection, focus and place stay.
   update(label, entries) {
     const selected = new Set(this.selectedEntries.map((entry) => entry.name));
     const hadFocus = this.#body.contains(document.activeElement);
-    const scrolled = this.#root.scrollTop;
-    const filled = this.#blocks.filter((block) => block.hasChildNodes()).map((block) => block.dataset.first);
-    this.#fill(label, entries, selected, this.#entries[this.#active]?.name);
-    for (const first of filled) this.#rowAt(Number(first));
-    this.#root.scrollTop = scrolled;
-    if (hadFocus) this.#rowAt(this.#active)?.focus({ preventScroll: true });
-  }
-
-  #fill(label, entries, selected, active) {
-    this.#entries = entries;
-    this.#rows = [];
-    this.#blocks = [];
-    this.#active = Math.max(0, entries.findIndex((entry) => entry.name === active));
-    this.#selection.reset([...entries.keys()].filter((index) => selected.has(entries[index].name)), this.#active);
-    this.#root.setAttribute('aria-label', label);
-    this.#root.setAttribute('aria-rowcount', entries.length + HEADER_ROWS);
-    this.#root.hidden = entries.length === 0;
-    this.#observer.disconnect();
-    for (let first = 0; first < entries.length; first += ROWS_PER_BLOCK) {
-      const block = element('div', { role: 'rowgroup', class: 'block', 'data-first': first });
-      block.style.setProperty('--rows', Math.min(ROWS_PER_BLOCK, entries.length - first));
-      this.#blocks.push(block);
-      this.#observer.observe(block);
-    }
-    this.#body.replaceChildren(...this.#blocks);
-    this.#rowAt(this.#active);
-    this.#afterChange();
+    this.#fill(label, entries, selected, this.#entries[this.#rows.kept]?.name);
+    if (hadFocus) this.#rows.at(this.#rows.kept)?.focus({ preventScroll: true });
   }
 
   focus() {
-    this.#rowAt(this.#active)?.focus();
+    this.#rows.at(this.#rows.kept)?.focus();
   }
 
   clearSelection() {
-    this.#selection.clear();
+    this.#selection.set([]);
   }
 
-  // A block of rows is filled when it comes near the view, or one of its rows is wanted.
-  #fillSeen(seen) {
-    for (const { isIntersecting, target } of seen) {
-      if (isIntersecting) this.#rowAt(Number(target.dataset.first));
+  selectNames(names) {
+    const wanted = new Set(names);
+    this.#selection.set(this.#all.filter((entry) => wanted.has(entry.name)));
+  }
+
+  // Selects and focuses one entry, whatever hides it. False when there is none of that name.
+  reveal(name) {
+    const entry = this.#all.find((each) => each.name === name);
+    if (!entry) return false;
+    this.#filter.value = '';
+    this.#withHidden.checked ||= isHidden(entry);
+    this.#arrange(name);
+    this.#selection.only(entry);
+    this.focus();
+    return true;
+  }
+
+  #fill(label, entries, selected, active) {
+    this.#all = entries;
+    this.#sorted = sorted(entries, this.#order);
+    this.#root.setAttribute('aria-label', label);
+    this.#arrange(active);
+    this.#selection.set(entries.filter((entry) => selected.has(entry.name)), this.#entries[this.#rows.kept]);
+  }
+
+  #arrange(active) {
+    this.#entries = matching(this.#sorted, this.#filter.value, this.#withHidden.checked);
+    this.#root.setAttribute('aria-rowcount', this.#entries.length + HEADER_ROWS);
+    this.#root.hidden = this.#entries.length === 0;
+    this.#rows.fill(this.#entries.length, Math.max(0, this.#entries.findIndex((entry) => entry.name === active)));
+  }
+
+  #rearrange() {
+    this.#arrange(this.#entries[this.#rows.kept]?.name);
+    this.#paint();
+    this.#on.view();
+  }
+
+  #sortBy(by) {
+    const isDescending = by === this.#order.by ? !this.#order.isDescending : LARGEST_FIRST.includes(by);
+    this.#order = { by, isDescending };
+    this.#sorted = sorted(this.#all, this.#order);
+    for (const head of this.#root.querySelectorAll('[data-by]')) {
+      if (head.dataset.by === by) head.setAttribute('aria-sort', isDescending ? 'descending' : 'ascending');
+      else head.removeAttribute('aria-sort');
     }
+    this.#rearrange();
   }
 
-  #rowAt(index) {
-    if (index < this.#entries.length && !this.#rows[index]) {
-      const block = this.#blocks[Math.floor(index / ROWS_PER_BLOCK)];
-      const first = Number(block.dataset.first);
-      const rows = this.#entries.slice(first, first + ROWS_PER_BLOCK)
-        .map((entry, offset) => this.#makeRow(entry, first + offset));
-      rows.forEach((row, offset) => { this.#rows[first + offset] = row; });
-      block.append(...rows);
-      this.#observer.unobserve(block);
-    }
-    return this.#rows[index];
-  }
-
-  #makeRow(entry, index) {
+  #makeRow(index) {
+    const entry = this.#entries[index];
     const name = shown(entry.name);
     const size = entry.kind === 'file' ? sizeText(entry.size) : '';
     const date = entry.modified ? dateText(entry.modified) : '';
-    const isSelected = this.#selection.chosen.has(index);
+    const isSelected = this.#selection.chosen.has(entry);
     const check = element('input', { type: 'checkbox', tabindex: '-1', 'aria-label': `Select ${name}` });
     check.checked = isSelected;
-    const cells = [
-      element('div', { role: 'gridcell', class: 'cell-check' }, check),
-      element('div', { role: 'gridcell', class: 'cell-name', title: name }, icon(entry.kind), nameElement(entry.name)),
-      element('div', { role: 'gridcell', class: 'cell-size' }, size),
-      element('div', { role: 'gridcell', class: 'cell-date' }, date),
-    ];
     return element('div', {
       role: 'row',
       class: 'row',
@@ -127,99 +155,121 @@ export class FileGrid {
       'aria-description': [KIND_WORDS[entry.kind], size, date].filter(Boolean).join(', '),
       'aria-rowindex': index + 1 + HEADER_ROWS,
       'aria-selected': String(isSelected),
-      'data-index': index,
-      tabindex: index === this.#active ? '0' : '-1',
-    }, ...cells);
+      tabindex: index === this.#rows.kept ? '0' : '-1',
+    },
+    element('div', { role: 'gridcell', class: 'cell-check' }, check),
+    element('div', { role: 'gridcell', class: 'cell-name', title: name }, icon(entry.kind), cutNameElement(entry.name)),
+    element('div', { role: 'gridcell', class: 'cell-size' }, size),
+    element('div', { role: 'gridcell', class: 'cell-date' }, date));
   }
 
-  #paint(indexes) {
-    for (const index of indexes.filter((each) => this.#rows[each])) {
-      const isSelected = this.#selection.chosen.has(index);
-      this.#rows[index].setAttribute('aria-selected', String(isSelected));
-      this.#rows[index].querySelector('input').checked = isSelected;
+  #paint() {
+    for (const [index, row] of this.#rows.made) {
+      const isSelected = this.#selection.chosen.has(this.#entries[index]);
+      row.setAttribute('aria-selected', String(isSelected));
+      row.querySelector('input').checked = isSelected;
     }
-    this.#afterChange();
-  }
-
-  #afterChange() {
-    const count = this.#selection.chosen.size;
-    this.#selectAll.checked = count > 0 && count === this.#entries.length;
-    this.#selectAll.indeterminate = count > 0 && count < this.#entries.length;
-    this.#onSelect();
+    const { chosen } = this.#selection;
+    const isAll = chosen.size >= this.#entries.length && this.#entries.every((entry) => chosen.has(entry));
+    this.#selectAll.checked = chosen.size > 0 && isAll;
+    this.#selectAll.indeterminate = chosen.size > 0 && !isAll;
+    this.#on.select();
   }
 
   #toggleAll() {
-    if (this.#selectAll.checked) this.#selection.all(this.#entries.length);
-    else this.#selection.clear();
+    this.#selection.set(this.#selectAll.checked ? this.#entries : []);
   }
 
   #moveTo(index) {
     const target = Math.min(Math.max(index, 0), this.#entries.length - 1);
-    this.#rowAt(this.#active).tabIndex = -1;
-    this.#active = target;
-    const row = this.#rowAt(target);
+    this.#rows.at(this.#rows.kept).tabIndex = -1;
+    this.#rows.kept = target;
+    const row = this.#rows.at(target);
     row.tabIndex = 0;
-    row.focus();
-  }
-
-  #open(index) {
-    if (this.#entries[index].kind === 'folder') this.#onOpen(this.#entries[index].name);
-  }
-
-  #indexOf(event) {
-    return Number(event.target.closest('.row').dataset.index);
+    row.focus({ preventScroll: true });
+    row.scrollIntoView({ block: 'nearest' });
   }
 
   #click(event) {
-    const index = this.#indexOf(event);
+    const index = indexOf(event);
+    const entry = this.#entries[index];
     const isCheck = event.target.matches('input');
     // A finger has no double click: a tap opens, and the checkbox selects.
-    if (this.#touched && !isCheck && this.#entries[index].kind === 'folder') {
-      this.#open(index);
+    if (this.#touched && !isCheck && entry.kind === 'folder') {
+      this.#on.open(entry);
       return;
     }
-    if (event.shiftKey) this.#selection.rangeTo(index);
-    else if (isCheck || this.#touched || event.ctrlKey || event.metaKey) this.#selection.toggle(index);
-    else this.#selection.only(index);
+    if (event.shiftKey) this.#selection.rangeTo(this.#entries, index);
+    else if (isCheck || this.#touched || event.ctrlKey || event.metaKey) this.#selection.toggle(entry);
+    else this.#selection.only(entry);
     // The click has turned the checkbox by itself, even where the selection stays as it was.
-    if (isCheck) event.target.checked = this.#selection.chosen.has(index);
+    if (isCheck) event.target.checked = this.#selection.chosen.has(entry);
     this.#moveTo(index);
   }
 
-  #doubleClick(event) {
-    if (!event.target.matches('input')) this.#open(this.#indexOf(event));
+  // For all that is selected, or else for the row alone. The menu key has no place of its own.
+  #contextMenu(event) {
+    event.preventDefault();
+    const index = indexOf(event);
+    if (!this.#selection.chosen.has(this.#entries[index])) this.#selection.only(this.#entries[index]);
+    this.#moveTo(index);
+    this.#on.menu(event.clientX || event.clientY ? event : this.#rows.at(index).getBoundingClientRect());
   }
 
   #keyDown(event) {
+    const active = this.#rows.kept;
+    const entry = this.#entries[active];
+    const isCommand = event.ctrlKey || event.metaKey;
     const target = this.#keyTarget(event.key);
     if (target !== undefined) {
       this.#moveTo(target);
-      if (event.shiftKey) this.#selection.rangeTo(this.#active);
-      else this.#selection.anchorAt(this.#active);
-    } else if (event.key === ' ') {
-      if (event.shiftKey) this.#selection.rangeTo(this.#active);
-      else this.#selection.toggle(this.#active);
+      if (event.shiftKey) this.#selection.rangeTo(this.#entries, this.#rows.kept);
+      else this.#selection.anchorAt(this.#entries[this.#rows.kept]);
+    } else if (event.key === ' ' && !this.#isTyping) {
+      if (event.shiftKey) this.#selection.rangeTo(this.#entries, active);
+      else this.#selection.toggle(entry);
     } else if (event.key === 'Enter') {
-      this.#open(this.#active);
+      this.#on.open(entry);
     } else if (event.key === 'Escape') {
-      this.#selection.clear();
-    } else if (event.key.toLowerCase() === 'a' && (event.ctrlKey || event.metaKey)) {
-      this.#selection.all(this.#entries.length);
+      this.#selection.set([]);
+    } else if (event.key.toLowerCase() === 'a' && isCommand) {
+      this.#selection.set(this.#entries);
+    } else if ([...event.key].length === 1 && !isCommand && !event.altKey) {
+      this.#typeAhead(event.key);
     } else {
       return;
     }
     event.preventDefault();
   }
 
-  #keyTarget(key) {
-    switch (key) {
-      case 'ArrowDown': return this.#active + 1;
-      case 'ArrowUp': return this.#active - 1;
-      case 'PageDown': return this.#active + ROWS_PER_PAGE;
-      case 'PageUp': return this.#active - ROWS_PER_PAGE;
-      case 'Home': return 0;
-      case 'End': return this.#entries.length - 1;
-      default: return undefined;
-    }
+  get #isTyping() {
+    return this.#typed !== '' && performance.now() - this.#typedAt < TYPING_MS;
   }
+
+  // One letter again and again goes through what begins with it.
+  #typeAhead(key) {
+    const typed = (this.#isTyping ? this.#typed : '') + key;
+    const isRepeated = [...typed].every((each) => each === key);
+    const from = this.#rows.kept + (isRepeated ? 1 : 0);
+    const found = nextBeginning(this.#entries, isRepeated ? key : typed, from);
+    this.#typed = typed;
+    this.#typedAt = performance.now();
+    if (found >= 0) this.#moveTo(found);
+  }
+
+  #keyTarget(key) {
+    const { kept } = this.#rows;
+    return {
+      ArrowDown: kept + 1,
+      ArrowUp: kept - 1,
+      PageDown: kept + ROWS_PER_PAGE,
+      PageUp: kept - ROWS_PER_PAGE,
+      Home: 0,
+      End: this.#entries.length - 1,
+    }[key];
+  }
+}
+
+function indexOf(event) {
+  return Number(event.target.closest('.row').dataset.index);
 }

@@ -11,6 +11,9 @@ const CONTROL_PICTURES = 0x2400;
 const DELETE_PICTURE = '\u2421';
 
 const UNSHOWN = /[\u0000-\u001f\u007f-\u009f\u061c\u200e\u200f\u2028-\u202e\u2066-\u2069\ud800-\udfff]/gu;
+// What may be one character in UTF-8, or else a byte, percent-encoded.
+const SEQUENCE =
+  /%[cd][0-9a-f]%[89ab][0-9a-f]|%e[0-9a-f](?:%[89ab][0-9a-f]){2}|%f[0-7](?:%[89ab][0-9a-f]){3}|%[0-9a-f]{2}/gi;
 const UNPROPOSED = new RegExp(UNSHOWN.source + '|/', 'gu');
 
 export function join(folder, name) {
@@ -23,6 +26,11 @@ export function parentOf(path) {
 
 export function lastName(path) {
   return path.slice(path.lastIndexOf('/') + 1);
+}
+
+// The archive's format by its ending, '' for any other file.
+export function formatOf(name) {
+  return /\.(zip|7z)$/i.exec(name)?.[1].toLowerCase() ?? '';
 }
 
 // What a reader sees: nothing in a name may break the line, turn its direction or stay invisible.
@@ -57,35 +65,13 @@ export function encodePath(path) {
 }
 
 export function decodePath(encoded) {
-  const bytes = [];
-  for (let at = 0; at < encoded.length; ++at) {
-    const hex = encoded[at] === '%' && /^[0-9a-f]{2}$/i.test(encoded.slice(at + 1, at + 3));
-    bytes.push(hex ? parseInt(encoded.slice(at + 1, at + 3), 16) : encoded.charCodeAt(at));
-    at += hex ? 2 : 0;
-  }
-  return decodeBytes(bytes);
-}
-
-function decodeBytes(bytes) {
-  const decoder = new TextDecoder('utf-8', { fatal: true, ignoreBOM: true });
-  let text = '';
-  for (let at = 0; at < bytes.length;) {
-    const length = sequenceLength(bytes[at]);
+  return encoded.replace(SEQUENCE, (sequence) => {
     try {
-      text += decoder.decode(Uint8Array.from(bytes.slice(at, at + length)));
-      at += length;
+      return decodeURIComponent(sequence);
     } catch {
-      text += String.fromCharCode(ESCAPE_BASE + bytes[at]);
-      at += 1;
+      return sequence.replace(/%(..)/g, (byte, hex) => String.fromCharCode(ESCAPE_BASE + parseInt(hex, 16)));
     }
-  }
-  return text;
-}
-
-function sequenceLength(lead) {
-  if (lead < 0x80) return 1;
-  if (lead < 0xe0) return 2;
-  return lead < 0xf0 ? 3 : 4;
+  });
 }
 
 // A JSON array as the text of a parameter. Not JSON.stringify: a lone surrogate is left for the

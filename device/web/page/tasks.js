@@ -1,31 +1,46 @@
-// The task panel: every task of the user, as the stream of events tells it.
+// The task panel: every task of the user, the newest first, as the stream of events tells it.
 import { listTasks } from './api.js';
-import { byId, removeItem, setText } from './dom.js';
-import { shown } from './names.js';
-import { notify } from './notices.js';
+import { byId, removeItem } from './dom.js';
+import { percentText } from './format.js';
+import { dropJobs } from './keep.js';
+import { lastName, shown } from './names.js';
+import { announce, notify } from './notices.js';
 import { TaskItem } from './task.js';
 
 const COMPLETED = 'filebrowser:filebrowser_compress_completed';
 const FAILED = 'filebrowser:filebrowser_compress_failed';
-const CONNECTION_LOST = 'The connection is lost. Trying again…';
 
 const ENTITIES = { '&amp;': '&', '&lt;': '<', '&gt;': '>', '&quot;': '"', '&#39;': "'" };
 
 export class Tasks {
   #list = byId('tasks');
+  #clear = byId('clear-finished');
   #items = new Map();
   #expected = new Set();
-  #onEnd;
-  #onChange;
+  #told = new Set();  // tasks that an event told of since all were asked for
+  #on;
 
-  // onEnd gets the destination of a task that has ended just now.
-  constructor({ onEnd, onChange }) {
-    this.#onEnd = onEnd;
-    this.#onChange = onChange;
+  // Handlers: change; end gets the destination of a task that has ended just now; show and look an
+  // archive's path; seen a task's element that is to come into view; retry what a job was started with.
+  constructor(handlers) {
+    this.#on = handlers;
+    this.#clear.addEventListener('click', async () => {
+      byId('tasks-title').focus();
+      for (const item of this.#in('finished')) await item.dismiss();
+    });
   }
 
   get count() {
     return this.#items.size;
+  }
+
+  // What is being packed, in words, and how far it has got; null when nothing is.
+  get work() {
+    const items = [...this.#in('running'), ...this.#in('waiting')];
+    if (items.length === 0) return null;
+    const progress = items.reduce((sum, item) => sum + item.task.progress, 0) / items.length;
+    const name = items.length === 1 ? shown(lastName(items[0].task.dest_file_path)) : `${items.length} archives`;
+    return { progress, name, percent: percentText(progress) };
   }
 
   clear() {
@@ -36,70 +51,96 @@ export class Tasks {
   }
 
   // A task that was started here: its end is told even if no event shows it running.
-  expect(taskid) {
+  expect(taskid, destination) {
+    announce(`Packing of ${shown(destination)} has started.`);
     this.#expected.add(taskid);
     const item = this.#items.get(taskid);
-    if (item && !item.isRunning) this.#tellEnd(item);
+    if (item && !item.isAtWork) this.#tellEnd(item);
   }
 
-  update(task) {
-    let item = this.#items.get(task.taskid);
-    const wasRunning = item?.isRunning ?? false;
-    if (!item) {
-      item = new TaskItem(task, () => this.remove(task.taskid));
-      this.#items.set(task.taskid, item);
-      this.#list.prepend(item.element);
-    }
-    item.update(task);
-    if (!item.isRunning && (wasRunning || this.#expected.has(task.taskid))) this.#tellEnd(item);
-    this.#changed();
+  tell(task) {
+    this.#told.add(task.taskid);
+    this.#update(task);
   }
 
-  remove(taskid) {
-    const item = this.#items.get(taskid);
-    if (!item) return;
-    this.#items.delete(taskid);
-    removeItem(item.element, byId('tasks-title'));
-    this.#changed();
+  tellGone({ taskid, stopped = false }) {
+    this.#told.add(taskid);
+    this.#remove(taskid, stopped);
   }
 
-  // The stream begins with the tasks there are; those that went while it was down are dropped.
-  async connected(isConnected) {
-    setText(byId('connection'), isConnected ? '' : CONNECTION_LOST);
-    const known = [...this.#items.keys()];
-    if (!isConnected || known.length === 0) return;
+  // What there is now, but for what events have told meanwhile: that is newer.
+  async refresh() {
+    this.#told.clear();
     const tasks = await listTasks().catch(() => null);
     if (!tasks) return;
-    const present = new Set(tasks.map((task) => task.taskid));
-    for (const taskid of known.filter((each) => !present.has(each))) this.remove(taskid);
+    for (const task of tasks) if (!this.#told.has(task.taskid)) this.#update(task);
+    const present = new Set([...this.#told, ...tasks.map((task) => task.taskid)]);
+    for (const taskid of this.#items.keys()) if (!present.has(taskid)) this.#remove(taskid, false);
+    dropJobs((taskid) => !present.has(taskid) && !this.#expected.has(taskid));
   }
 
   tellNotification({ taskid, message, arguments: encoded }) {
     const [path, reason] = encoded.map(decodeEntities);
-    if (message === COMPLETED) notify(taskid, completedText(path));
-    else if (message === FAILED) notify(taskid, failedText(path, reason), true);
+    if (message === COMPLETED) this.#tellCompleted(taskid, path);
+    else if (message === FAILED) this.#tellFailed(taskid, path, reason);
     else notify(taskid, shown([message, ...encoded.map(decodeEntities)].join(' ')));
   }
 
-  #tellEnd(item) {
-    this.#expected.delete(item.taskid);
-    if (item.isFailed) notify(item.taskid, failedText(item.destination), true);
-    else notify(item.taskid, completedText(item.destination));
-    this.#onEnd(item.destination);
+  #in(state) {
+    return [...this.#items.values()].filter((item) => item.task.state === state);
+  }
+
+  #update(task) {
+    const known = this.#items.get(task.taskid);
+    const wasAtWork = known?.isAtWork ?? false;
+    const item = known ?? this.#add(task);
+    if (known) item.update(task);
+    if (!item.isAtWork && (wasAtWork || this.#expected.has(task.taskid))) this.#tellEnd(item);
+    this.#changed();
+  }
+
+  #add(task) {
+    const item = new TaskItem(task, {
+      ...this.#on,
+      gone: (isStopped) => this.#remove(task.taskid, isStopped),
+    });
+    const older = [...this.#items.values()].filter((each) => each.task.started <= task.started).map((each) => each.element);
+    this.#list.insertBefore(item.element, [...this.#list.children].find((each) => older.includes(each)) ?? null);
+    this.#items.set(task.taskid, item);
+    return item;
+  }
+
+  #remove(taskid, isStopped) {
+    const item = this.#items.get(taskid);
+    if (!item) return;
+    if (isStopped) notify(taskid, `${shown(item.task.dest_file_path)} was stopped.`);
+    this.#items.delete(taskid);
+    this.#expected.delete(taskid);
+    removeItem(item.element, byId('tasks-title'));
+    this.#changed();
+  }
+
+  #tellEnd({ task: { taskid, state, dest_file_path: path } }) {
+    this.#expected.delete(taskid);
+    if (state === 'failed') this.#tellFailed(taskid, path);
+    else this.#tellCompleted(taskid, path);
+    this.#on.end(path);
+  }
+
+  #tellCompleted(taskid, path) {
+    notify(taskid, `${shown(path)} is ready.`, { go: () => this.#on.show(path) });
+  }
+
+  #tellFailed(taskid, path, reason) {
+    const go = () => this.#on.seen(this.#items.get(taskid)?.element ?? byId('tasks-title'));
+    notify(taskid, `${shown(path)} could not be made${reason ? `: ${shown(reason)}` : ''}.`, { isFailure: true, go });
   }
 
   #changed() {
     byId('tasks-empty').hidden = this.#items.size > 0;
-    this.#onChange();
+    this.#clear.hidden = this.#in('finished').length === 0;
+    this.#on.change();
   }
-}
-
-function completedText(path) {
-  return `${shown(path)} is ready.`;
-}
-
-function failedText(path, reason) {
-  return `${shown(path)} could not be made${reason ? `: ${shown(reason)}` : ''}.`;
 }
 
 function decodeEntities(text) {

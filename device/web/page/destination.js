@@ -1,0 +1,65 @@
+// Whether an archive can be made at a place, and what is there already.
+import { Refusal, checkDestination, listArchive } from './api.js';
+import { archiveText } from './archive-view.js';
+import { byId, setText } from './dom.js';
+import { dateText, sizeText } from './format.js';
+import { shown } from './names.js';
+
+const existing = byId('existing');
+const facts = byId('existing-facts');
+
+export class Destination {
+  #asked = new AbortController();
+  #later = 0;
+  #onAnswer;
+
+  // onAnswer gets what the device says of the place that was asked for last.
+  constructor(onAnswer) {
+    this.#onAnswer = onAnswer;
+  }
+
+  get isChoiceShown() {
+    return !existing.hidden;
+  }
+
+  askLater(path, format, milliseconds) {
+    this.stop();
+    this.#later = setTimeout(() => this.ask(path, format), milliseconds);
+  }
+
+  // Null when the device does not say, or a later question has overtaken this one.
+  async ask(path, format) {
+    this.stop();
+    const { signal } = this.#asked = new AbortController();
+    try {
+      const answer = await checkDestination(path, format, signal);
+      if (signal.aborted) return null;
+      this.#show(answer, path, signal);
+      this.#onAnswer(answer);
+      return answer;
+    } catch (refusal) {
+      if (!(refusal instanceof Refusal)) throw refusal;
+      return null;
+    }
+  }
+
+  stop() {
+    clearTimeout(this.#later);
+    this.#asked.abort();
+  }
+
+  hide() {
+    this.stop();
+    existing.hidden = true;
+  }
+
+  async #show({ exists, error, size, modified, free_name: freeName }, path, signal) {
+    existing.hidden = !exists || Boolean(error);
+    if (existing.hidden) return;
+    byId('free-name').textContent = shown(freeName);
+    const known = `${sizeText(size)}, changed ${dateText(modified)}`;
+    setText(facts, known);
+    const inside = await listArchive(path, signal).then(archiveText, ({ message }) => `cannot be read: ${message}`);
+    if (!signal.aborted) setText(facts, `${known}; ${inside}`);
+  }
+}
