@@ -50,8 +50,8 @@ async function signIn(user, password = user) {
 async function visit(user, folder = '') {
   await page.context().clearCookies();
   await page.request.post(`${device.url}/session`, { data: { user, password: user } });
-  await page.evaluate(() => localStorage.clear()).catch(() => {});  // there is none before the first page
-  await page.goto('about:blank');
+  await page.goto(`${device.url}/codes`);  // of the same site, so that nothing is kept
+  await page.evaluate(() => { localStorage.clear(); sessionStorage.clear(); });
   await page.goto(`${device.url}/#${folder}`);
   await (user ? shows(path.basename(folder)) : button('Sign in').waitFor());
 }
