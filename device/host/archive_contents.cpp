@@ -5,14 +5,18 @@
 #include <cstdint>
 #include <cstdlib>
 #include <ctime>
+#include <memory>
 #include <optional>
 
 #include "device/base/child_process.h"
+#include "device/base/code_page.h"
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/base/open_below.h"
 #include "device/base/shortage.h"
+#include "device/base/utf8.h"
 #include "device/host/user_files.h"
+#include "device/model/device.h"
 
 namespace Device {
 
@@ -31,6 +35,10 @@ std::string FormatOf(const FileDescriptor& file) {
 // What 7z tells of one entry after the other, in lines "KEY = VALUE".
 class Contents {
  public:
+  // Names that are no UTF-8, as in zips made elsewhere, are read in the user's code page.
+  explicit Contents(const std::string& user)
+      : code_page_(CodePage::Open(TheDevice().config.FindUser(user)->codepage)) {}
+
   void TakeLine(const std::string& line) {
     const std::size_t equals = std::min(line.find(" = "), line.size());
     const std::string key = line.substr(0, equals);
@@ -69,7 +77,9 @@ class Contents {
     if (name_) {
       size_ += entry_.st_size;
       if (++count_ <= kMostEntries) {
-        AddEntry(entries_, *name_, entry_);
+        const bool is_foreign = code_page_ && !IsUtf8(*name_);
+        AddEntry(entries_, is_foreign ? code_page_->Decode(*name_).value_or(*name_) : *name_,
+                 entry_);
       }
     }
     name_.reset();
@@ -77,6 +87,7 @@ class Contents {
     entry_.st_mode = S_IFREG;
   }
 
+  const std::unique_ptr<CodePage> code_page_;
   std::optional<std::string> name_;
   struct stat entry_ {};
   std::string entries_;
@@ -147,7 +158,7 @@ std::string ListArchive(const std::string& user, const std::string& path,
   ChildProcess program = ChildProcess::Start(start);
   output.writer.Close();
   errors.writer.Close();
-  Contents contents;
+  Contents contents(user);
   const bool is_read = ReadLines(output.reader, patience, contents);
   const bool is_whole = is_read && program.Wait() == 0;
   if (contents.End() == 0 && is_read && !is_whole) {

@@ -136,6 +136,8 @@ test('an archive is listed, whoever made it', async () => {
     assert.equal(answer.status, status, name);
     assert.match(answer.body.error, reason);
   }
+  await bob.taskIn('finished', await bob.start(['/photo/trip'], '/photo/sjis.zip'));  // in CP932, bob's own
+  assert.ok((await list('sjis.zip', bob)).body.entries.some(({ name }) => name === 'trip/日の出.jpg'));
   inPhoto('chmod 0600 both.7z');
   if (isRoot) assert.equal((await list('both.7z', bob)).status, 403);
 });
