@@ -19,11 +19,8 @@ namespace Device {
 namespace {
 
 void PrintTask(const Json::Value& task) {
-  std::cout << task["taskid"].asString() << '\t' << task["state"].asString();
-  if (task.isMember("before")) {
-    std::cout << ", " << task["before"] << " jobs before it";
-  }
-  std::cout << '\t' << std::floor(task["progress"].asDouble() * 100) << " %\t"
+  std::cout << task["taskid"].asString() << '\t' << StateText(task) << '\t'
+            << std::floor(task["progress"].asDouble() * 100) << " %\t"
             << Shown(task["dest_file_path"].asString());
   const char* separator = "\t";
   for (const std::string& line : ErrorLines(task)) {

@@ -61,6 +61,12 @@ std::string Shown(const std::string& name) {
   return isatty(STDOUT_FILENO) != 0 ? Printable(name, name.size()) : name;
 }
 
+std::string StateText(const Json::Value& task) {
+  const std::string before = task["before"].asString();
+  return task["state"].asString() +
+         (before.empty() ? "" : ", " + before + (before == "1" ? " job" : " jobs") + " before it");
+}
+
 void PrintError(const std::string& reason) {
   std::cerr << "kavo-device: " << Printable(reason, reason.size()) << '\n';
 }

@@ -28,6 +28,9 @@ std::string Printable(const std::string& text, std::size_t most_bytes);
 // A name as it goes to standard output: printable on a terminal.
 std::string Shown(const std::string& name);
 
+// A task's state in words: "waiting, 3 jobs before it".
+std::string StateText(const Json::Value& task);
+
 // "kavo-device: REASON" on standard error.
 void PrintError(const std::string& reason);
 // A line in UTF-8 on standard output.

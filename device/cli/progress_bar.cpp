@@ -66,8 +66,7 @@ void ProgressBar::Show(const Json::Value& task) {
     line += !part.empty() && line.size() + 2 + part.size() <= columns ? "  " + part : "";
   };
   if (task["state"] == "waiting") {
-    line = "waiting";
-    add(task["before"].asString() + " jobs before it");
+    line = StateText(task);
   } else {
     const double share = task["state"] == "finished" ? 1 : task["progress"].asDouble();
     const double total = task["total_size"].asDouble();
