@@ -128,6 +128,7 @@ export class Files {
       throw refusal;
     });
     clearTimeout(late);
+    await new Promise((resolve) => { setTimeout(resolve); });  // reading and showing are long enough by themselves
     if (asked.signal.aborted) return false;
     this.#main.removeAttribute('aria-busy');
     this.#show(listing);

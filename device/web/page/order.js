@@ -3,10 +3,16 @@
 const MARKS = /\p{M}+/gu;
 const METADATA = '@eaDir';
 
-const collator = new Intl.Collator(undefined, { numeric: true, sensitivity: 'base' });
+const DIGITS = /\d+/g;
+const MOST_DIGITS = 20;
+
+// Numbers are made one length beforehand: comparing them as the collator does ("numeric") takes many
+// times as long.
+const collator = new Intl.Collator(undefined, { sensitivity: 'base' });
+const sortKey = (entry) => (entry.key ??= entry.name.replace(DIGITS, (digits) => digits.padStart(MOST_DIGITS, '0')));
 
 // As people count: file2 before file10, without regard to case and accents.
-export const byName = (one, other) => collator.compare(one.name, other.name);
+export const byName = (one, other) => collator.compare(sortKey(one), sortKey(other));
 
 // A name as people look for it, without case and accents.
 export const fold = (name) => name.normalize('NFD').replace(MARKS, '').toLowerCase();
