@@ -29,20 +29,25 @@ check('an archive that is there is told of before, and never added to unasked', 
 });
 
 check('the dialog says what would fail, and the format and the ending follow each other', async () => {
-  await visit('bob', '/photo');
-  await row('cat.jpg').click();
+  await visit('bob', '/attic');
+  await row('old.txt').click();
   await button('Compress…').click();
   const name = dialog().getByLabel('Archive name');
   const folder = dialog().getByLabel('Folder', { exact: true });
+  const password = dialog().getByLabel('Password (optional)');
+  assert.equal(await folder.inputValue(), '/home');  // bob may not write in the attic
   const cases = [['/none', 'x.zip', folder], ['/attic', 'x.zip', folder], ['/photo/cat.jpg', 'x.zip', folder],
-    ['/photo', '.zip', name], ['/photo', '  ', name], ['/photo', 'x.rar', name], ['/photo', 'trip', null]];
-  for (const [path, text, field] of cases) {
+    ['/photo', '.zip', name], ['/photo', '  ', name], ['/photo', 'a/b', name], ['/photo', 'ü'.repeat(130), name],
+    ['/photo', 'x.rar', name], ['/photo', 'x.zip', password, 'pä'], ['/photo', 'trip', null]];
+  for (const [path, text, field, secret = ''] of cases) {
     await folder.fill(path);
     await name.fill(text);
+    await password.fill(secret);
     await name.press('Tab');
     if (field) await dialog().getByRole('button', { name: 'Compress' }).click();
     await until(async () => (await field?.getAttribute('aria-invalid') ?? null) === (field && 'true'));
   }
+  await noFaults('dialog');
   assert.equal(await name.inputValue(), 'trip.zip');
   await dialog().getByLabel('Format').selectOption('7z');
   assert.equal(await name.inputValue(), 'trip.7z');

@@ -51,20 +51,6 @@ check('a folder that comes when another is wanted meanwhile is not shown', async
   assert.equal(await row('day1').count(), 0);
 });
 
-check('the dialog proposes where the user may write, and says at the field what is wrong', async () => {
-  await visit('alice', '/attic');
-  await row('old.txt').click();
-  await compress({});
-  await task('/home/old.zip').getByText('Done').waitFor();
-  for (const [label, value] of [['Archive name', ''], ['Archive name', 'a/b'],
-    ['Archive name', 'ü'.repeat(130)], ['Password (optional)', 'pä']]) {
-    await compress({ 'Archive name': 'x.zip', [label]: value });
-    const field = page.getByRole('dialog').getByLabel(label, { exact: true });
-    assert.equal(await field.getAttribute('aria-invalid'), 'true', `${label} ${value}`);
-    await (value === 'pä' ? noFaults('dialog') : page.keyboard.press('Escape'));
-  }
-});
-
 check('a running job is there after a reload and in a second window that stops it', async () => {
   await visit('alice', '/photo');
   await row('endless').click();

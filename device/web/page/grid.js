@@ -68,7 +68,7 @@ export class FileGrid {
 
   // Fills the grid for another folder; the row of the name active takes the focus.
   show(label, entries, active) {
-    this.#filter.value = '';
+    this.#filter.value = this.#typed = '';
     this.#fill(label, entries, new Set(), active);
     const row = this.#rows.at(this.#rows.kept);
     if (this.#rows.kept > 0) row.scrollIntoView({ block: 'center' });

@@ -120,9 +120,9 @@ export class Tasks {
     this.#changed();
   }
 
-  #tellEnd({ task: { taskid, state, dest_file_path: path } }) {
+  #tellEnd({ task: { taskid, state, dest_file_path: path, reason } }) {
     this.#expected.delete(taskid);
-    if (state === 'failed') this.#tellFailed(taskid, path);
+    if (state === 'failed') this.#tellFailed(taskid, path, reason);
     else this.#tellCompleted(taskid, path);
     this.#on.end(path);
   }
