@@ -42,6 +42,9 @@ export class FileGrid {
     this.#body.addEventListener('contextmenu', (event) => this.#contextMenu(event));
     this.#selectAll.addEventListener('change', () => this.#toggleAll());
     this.#filter.addEventListener('input', () => this.#rearrange());
+    this.#filter.addEventListener('keydown', (event) => {
+      if (['ArrowDown', 'Enter'].includes(event.key)) this.focus();
+    });
     this.#withHidden.addEventListener('change', () => this.#rearrange());
     for (const head of this.#root.querySelectorAll('[data-by]')) {
       head.querySelector('button').addEventListener('click', () => this.#sortBy(head.dataset.by));
@@ -123,9 +126,10 @@ export class FileGrid {
     this.#rows.fill(this.#entries.length, Math.max(0, this.#entries.findIndex((entry) => entry.name === active)));
   }
 
+  // What is not on show any more is not selected either: nobody would see what is packed.
   #rearrange() {
     this.#arrange(this.#entries[this.#rows.kept]?.name);
-    this.#paint();
+    this.#selection.set(this.#entries.filter((entry) => this.#selection.chosen.has(entry)));
     this.#on.view();
   }
 

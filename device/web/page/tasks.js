@@ -104,7 +104,7 @@ export class Tasks {
       ...this.#on,
       gone: (isStopped) => this.#remove(task.taskid, isStopped),
     });
-    const older = [...this.#items.values()].filter((each) => each.task.started <= task.started).map((each) => each.element);
+    const older = [...this.#items.values()].filter((each) => isOlder(each.task, task)).map((each) => each.element);
     this.#list.insertBefore(item.element, [...this.#list.children].find((each) => older.includes(each)) ?? null);
     this.#items.set(task.taskid, item);
     return item;
@@ -141,6 +141,11 @@ export class Tasks {
     this.#clear.hidden = this.#in('finished').length === 0;
     this.#on.change();
   }
+}
+
+// Of the same second, the later in the queue is the newer.
+function isOlder({ started, before = -1 }, than) {
+  return started < than.started || (started === than.started && before <= (than.before ?? -1));
 }
 
 function decodeEntities(text) {
