@@ -91,34 +91,6 @@ std::vector<QueuedJob> JobsOfOthers() {
   return jobs;
 }
 
-struct RankedJob {
-  std::size_t rank;  // how many of its user's jobs go before it, or are at work
-  QueuedJob job;
-};
-
-std::vector<RankedJob> RankWaiting(std::vector<QueuedJob> jobs) {
-  std::sort(jobs.begin(), jobs.end(), [](const QueuedJob& one, const QueuedJob& other) {
-    return std::tuple(!one.is_running, one.ticket) < std::tuple(!other.is_running, other.ticket);
-  });
-  std::map<uid_t, std::size_t> counts;
-  std::vector<RankedJob> waiting;
-  for (const QueuedJob& job : jobs) {
-    const std::size_t rank = counts[job.user]++;
-    if (!job.is_running) {
-      waiting.push_back({rank, job});
-    }
-  }
-  std::stable_sort(
-      waiting.begin(), waiting.end(),
-      [](const RankedJob& one, const RankedJob& other) { return one.rank < other.rank; });
-  return waiting;
-}
-
-std::size_t CountRunning(const std::vector<QueuedJob>& jobs) {
-  return std::count_if(jobs.begin(), jobs.end(),
-                       [](const QueuedJob& job) { return job.is_running; });
-}
-
 bool IsIn(const QueuedJob& job, const std::vector<QueuedJob>& jobs) {
   return std::any_of(jobs.begin(), jobs.end(), [&](const QueuedJob& each) {
     return each.worker == job.worker && PlaceOf(each) == PlaceOf(job);
@@ -145,24 +117,21 @@ void WaitForEndOfAny(const std::vector<QueuedJob>& jobs) {
   }
 }
 
-QueuedJob& OwnJob() {
-  static QueuedJob job;
-  return job;
-}
+QueuedJob own_job;
 
 // The jobs at the time, and whether the own one has come to run.
 bool TakeTurn(std::vector<QueuedJob>& jobs) {
   const Change change;
   jobs = JobsOfOthers();
-  jobs.push_back(OwnJob());
-  if (!IsIn(OwnJob(), NextToRun(jobs, TheDevice().config.jobs_at_once, MostJobs()))) {
+  jobs.push_back(own_job);
+  if (!IsIn(own_job, NextToRun(jobs, TheDevice().config.jobs_at_once, MostJobs()))) {
     return false;
   }
-  QueuedJob running = OwnJob();
+  QueuedJob running = own_job;
   running.is_running = true;
   SetLock(F_SETLK64, F_WRLCK, PlaceOf(running));
-  SetLock(F_SETLK64, F_UNLCK, PlaceOf(OwnJob()));
-  OwnJob() = running;
+  SetLock(F_SETLK64, F_UNLCK, PlaceOf(own_job));
+  own_job = running;
   return true;
 }
 
@@ -174,7 +143,7 @@ void WaitForChange(const std::vector<QueuedJob>& jobs) {
   for (const QueuedJob& job : jobs) {
     if (job.is_running) {
       ahead.push_back(job);
-    } else if (job.user == OwnJob().user && job.ticket < OwnJob().ticket &&
+    } else if (job.user == own_job.user && job.ticket < own_job.ticket &&
                (before == nullptr || job.ticket > before->ticket)) {
       before = &job;
     }
@@ -189,21 +158,29 @@ void WaitForChange(const std::vector<QueuedJob>& jobs) {
 
 }  // namespace
 
-std::vector<QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs) {
-  std::vector<QueuedJob> waiting;
-  for (const RankedJob& each : RankWaiting(std::move(jobs))) {
-    waiting.push_back(each.job);
+std::multimap<std::size_t, QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs) {
+  std::sort(jobs.begin(), jobs.end(), [](const QueuedJob& one, const QueuedJob& other) {
+    return std::tuple(!one.is_running, one.ticket) < std::tuple(!other.is_running, other.ticket);
+  });
+  std::map<uid_t, std::size_t> counts;
+  std::multimap<std::size_t, QueuedJob> waiting;
+  for (const QueuedJob& job : jobs) {
+    const std::size_t rank = counts[job.user]++;
+    if (!job.is_running) {
+      waiting.emplace(rank, job);
+    }
   }
   return waiting;
 }
 
 std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t of_user,
                                  std::size_t of_device) {
+  const auto waiting = WaitingInOrder(jobs);
+  std::size_t at_work = jobs.size() - waiting.size();
   std::vector<QueuedJob> next;
-  std::size_t at_work = CountRunning(jobs);
-  for (const RankedJob& each : RankWaiting(jobs)) {
-    if (each.rank < of_user && at_work < of_device) {
-      next.push_back(each.job);
+  for (const auto& [rank, job] : waiting) {
+    if (rank < of_user && at_work < of_device) {
+      next.push_back(job);
       ++at_work;
     }
   }
@@ -227,8 +204,8 @@ void EnterQueue(uid_t user) {
   for (const QueuedJob& job : JobsOfOthers()) {
     ticket = std::max(ticket, job.ticket);
   }
-  OwnJob() = {getpid(), user, ticket + 1, false};
-  SetLock(F_SETLK64, F_WRLCK, PlaceOf(OwnJob()));
+  own_job = {getpid(), user, ticket + 1, false};
+  SetLock(F_SETLK64, F_WRLCK, PlaceOf(own_job));
 }
 
 void WaitForTurn() {
@@ -240,7 +217,7 @@ void WaitForTurn() {
 
 std::map<pid_t, std::size_t> WaitingWorkers() {
   std::map<pid_t, std::size_t> before;
-  for (const QueuedJob& job : WaitingInOrder(JobsOfOthers())) {
+  for (const auto& [rank, job] : WaitingInOrder(JobsOfOthers())) {
     before.emplace(job.worker, before.size());
   }
   return before;

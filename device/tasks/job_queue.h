@@ -26,8 +26,8 @@ struct QueuedJob {
 };
 
 // The jobs that wait, in the order in which they are to run when each running one takes as long as
-// the others.
-std::vector<QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs);
+// the others: by how many of their user's jobs go before them, or are at work.
+std::multimap<std::size_t, QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs);
 
 // The jobs that wait and for which there is room, in order.
 std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t of_user,
