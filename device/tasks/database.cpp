@@ -126,10 +126,10 @@ void Database::SetAside(const std::string& reason) {
 }
 
 void Database::InTransaction(bool for_writing, const std::function<void()>& body) {
-  Statement(*this, for_writing ? "BEGIN IMMEDIATE" : "BEGIN").Step();
+  Run(for_writing ? "BEGIN IMMEDIATE" : "BEGIN");
   try {
     body();
-    Statement(*this, "COMMIT").Step();
+    Run("COMMIT");
   } catch (...) {
     is_marked_ = false;
     sqlite3_exec(database_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
@@ -177,31 +177,26 @@ void Database::EraseMarked() {
   }
 }
 
-Database::Statement::Statement(Database& database, const char* sql)
-    : database_(database), statement_(nullptr, sqlite3_finalize) {
+sqlite3_stmt* Database::Prepare(const char* sql) {
   sqlite3_stmt* statement = nullptr;
-  const int result = sqlite3_prepare_v2(database_.database_.get(), sql, -1, &statement, nullptr);
+  const int result = sqlite3_prepare_v2(database_.get(), sql, -1, &statement, nullptr);
   if (result == SQLITE_ERROR) {  // the statements are right: the schema's own text is damaged
-    database_.SetAside(sqlite3_errmsg(database_.database_.get()));
+    SetAside(sqlite3_errmsg(database_.get()));
   }
-  database_.Check(result);
-  statement_.reset(statement);
+  Check(result);
+  return statement;
 }
 
-Database::Statement& Database::Statement::Bind(const std::string& text) {
-  database_.Check(sqlite3_bind_text(statement_.get(), ++bound_, text.data(),
-                                    static_cast<int>(text.size()), SQLITE_STATIC));
-  return *this;
+void Database::Statement::Bind(const std::string* text) {
+  ++bound_;
+  database_.Check(text == nullptr
+                      ? sqlite3_bind_null(statement_.get(), bound_)
+                      : sqlite3_bind_text(statement_.get(), bound_, text->data(),
+                                          static_cast<int>(text->size()), SQLITE_STATIC));
 }
 
-Database::Statement& Database::Statement::Bind(std::int64_t number) {
+void Database::Statement::Bind(std::int64_t number) {
   database_.Check(sqlite3_bind_int64(statement_.get(), ++bound_, number));
-  return *this;
-}
-
-Database::Statement& Database::Statement::BindNull() {
-  database_.Check(sqlite3_bind_null(statement_.get(), ++bound_));
-  return *this;
 }
 
 bool Database::Statement::Step() {

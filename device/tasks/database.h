@@ -29,6 +29,11 @@ class Database {
 
   // One prepared statement, run to its end or reset when it goes out of scope.
   class Statement;
+  // Runs a statement that returns nothing.
+  template <typename... Values>
+  void Run(const char* sql, const Values&... values);
+  // The first column of a statement's first row; 0 when there is none.
+  std::int64_t Number(const char* sql);
 
   // Runs the body between BEGIN, or BEGIN IMMEDIATE when it is going to write, and COMMIT. What it
   // throws undoes its changes and passes on.
@@ -44,7 +49,7 @@ class Database {
  private:
   void Open();
   void Execute(const std::string& sql);
-  std::int64_t Number(const char* sql);
+  sqlite3_stmt* Prepare(const char* sql);
   // False while another process uses the log.
   bool EmptyLog();
   void MakeSchema(const char* schema, int version);
@@ -59,12 +64,14 @@ class Database {
 
 class Database::Statement {
  public:
-  Statement(Database& database, const char* sql);
+  // With the values in the place of its question marks: numbers, texts, and texts by pointer, which
+  // may be null. A text, which can be large, stays the caller's until the last step.
+  template <typename... Values>
+  Statement(Database& database, const char* sql, const Values&... values)
+      : database_(database), statement_(database.Prepare(sql), sqlite3_finalize) {
+    (Bind(values), ...);
+  }
 
-  // The text, which can be large, stays the caller's until the last step.
-  Statement& Bind(const std::string& text);
-  Statement& Bind(std::int64_t number);
-  Statement& BindNull();
   // True when there is a row.
   bool Step();
   std::string Text(int column) const;
@@ -74,9 +81,19 @@ class Database::Statement {
   }
 
  private:
+  void Bind(const std::string& text) { Bind(&text); }
+  void Bind(const std::string* text);
+  void Bind(const char* text) = delete;  // a copy of it would be gone before the step
+  void Bind(std::int64_t number);
+
   Database& database_;
   std::unique_ptr<sqlite3_stmt, int (*)(sqlite3_stmt*)> statement_;
   int bound_ = 0;
 };
+
+template <typename... Values>
+void Database::Run(const char* sql, const Values&... values) {
+  Statement(*this, sql, values...).Step();
+}
 
 }  // namespace Device

@@ -37,9 +37,9 @@ CREATE TABLE file_index (path TEXT PRIMARY KEY, time INTEGER NOT NULL) WITHOUT R
 
 constexpr bool kForReading = false;
 constexpr bool kForWriting = true;
-constexpr char kWhole[] = "";                // in place of a member's name
-constexpr char kMemberMark = '.';            // before it
-constexpr char kSecret[] = "\"password\":";  // in a text that is erased when it goes
+constexpr char kWhole[] = "";                 // in place of a member's name
+constexpr char kMemberMark = '.';             // before it
+const std::string kSecret = "\"password\":";  // in a text that is erased when it goes
 
 }  // namespace
 
@@ -53,11 +53,7 @@ void TaskStore::AddTask(TaskRow& row) {
   database_.InTransaction(kForWriting, [&] {
     row.updated = std::time(nullptr);
     row.version = 1;
-    Statement(database_, "INSERT INTO tasks VALUES (?, 0, ?, ?)")
-        .Bind(row.id)
-        .Bind(row.updated)
-        .Bind(row.version)
-        .Step();
+    database_.Run("INSERT INTO tasks VALUES (?, 0, ?, ?)", row.id, row.updated, row.version);
     for (const auto& [name, value] : properties) {
       WriteProperty(row, name, value);
     }
@@ -66,14 +62,8 @@ void TaskStore::AddTask(TaskRow& row) {
 
 void TaskStore::WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
                             const std::string* text) {
-  Statement insert(database_, "INSERT OR REPLACE INTO members VALUES (?, ?, ?, ?, ?)");
-  insert.Bind(row.id).Bind(name).Bind(member);
-  if (text == nullptr) {
-    insert.BindNull();
-  } else {
-    insert.Bind(*text);
-  }
-  insert.Bind(row.version).Step();
+  database_.Run("INSERT OR REPLACE INTO members VALUES (?, ?, ?, ?, ?)", row.id, name, member, text,
+                row.version);
 }
 
 void TaskStore::MarkIfSecret(const std::string& lost) {
@@ -106,18 +96,15 @@ void TaskStore::WriteProperty(TaskRow& row, const std::string& name, StoredValue
 }
 
 bool TaskStore::ReadChanges(TaskRow& row, bool with_params) {
-  Statement task(database_, "SELECT finished, updated, version FROM tasks WHERE id = ?");
-  if (!task.Bind(row.id).Step()) {
+  Statement task(database_, "SELECT finished, updated, version FROM tasks WHERE id = ?", row.id);
+  if (!task.Step()) {
     return false;
   }
+  const std::string left_out = kMemberMark + std::string(kDataParams);
   Statement changes(database_,
                     "SELECT name, member, value FROM members WHERE task = ? AND version > ? "
-                    "AND member IS NOT ? ORDER BY name, member");
-  const std::string left_out = kMemberMark + std::string(kDataParams);
-  changes.Bind(row.id).Bind(row.version);
-  if (!with_params) {
-    changes.Bind(left_out);
-  }
+                    "AND member IS NOT ? ORDER BY name, member",
+                    row.id, row.version, with_params ? nullptr : &left_out);
   while (changes.Step()) {
     StoredValue& property = row.properties[changes.Text(0)];
     const std::string member = changes.Text(1);
@@ -173,12 +160,8 @@ bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> prop
     ++row.version;
     row.finished = row.finished || finished;
     row.updated = std::time(nullptr);
-    Statement(database_, "UPDATE tasks SET finished = ?, updated = ?, version = ? WHERE id = ?")
-        .Bind(row.finished ? 1 : 0)
-        .Bind(row.updated)
-        .Bind(row.version)
-        .Bind(row.id)
-        .Step();
+    database_.Run("UPDATE tasks SET finished = ?, updated = ?, version = ? WHERE id = ?",
+                  row.finished, row.updated, row.version, row.id);
     for (auto& [name, value] : properties) {
       WriteProperty(row, name, std::move(value));
     }
@@ -188,28 +171,21 @@ bool TaskStore::UpdateTask(TaskRow& row, std::map<std::string, StoredValue> prop
 
 void TaskStore::RemoveTask(const std::string& id, pid_t worker) {
   database_.InTransaction(kForWriting, [&] {
-    Statement(database_, "DELETE FROM workers WHERE pid = ? AND stopped = 0")
-        .Bind(std::int64_t{worker})
-        .Step();
-    Statement secret(database_, "SELECT 1 FROM members WHERE task = ? AND instr(value, ?) LIMIT 1");
-    if (secret.Bind(id).Bind(kSecret).Step()) {
+    database_.Run("DELETE FROM workers WHERE pid = ? AND stopped = 0", worker);
+    if (Statement(database_, "SELECT 1 FROM members WHERE task = ? AND instr(value, ?) LIMIT 1", id,
+                  kSecret)
+            .Step()) {
       database_.MarkErasure();
     }
-    Statement(database_, "DELETE FROM members WHERE task = ?").Bind(id).Step();
-    Statement(database_, "DELETE FROM tasks WHERE id = ?").Bind(id).Step();
+    database_.Run("DELETE FROM members WHERE task = ?", id);
+    database_.Run("DELETE FROM tasks WHERE id = ?", id);
   });
 }
 
-std::int64_t TaskStore::Version() {
-  Statement select(database_, "PRAGMA data_version");
-  return select.Step() ? select.Number(0) : 0;
-}
+std::int64_t TaskStore::Version() { return database_.Number("PRAGMA data_version"); }
 
 void TaskStore::AddToIndex(const std::string& path) {
-  Statement(database_, "INSERT OR REPLACE INTO file_index VALUES (?, ?)")
-      .Bind(path)
-      .Bind(std::time(nullptr))
-      .Step();
+  database_.Run("INSERT OR REPLACE INTO file_index VALUES (?, ?)", path, std::time(nullptr));
 }
 
 namespace {

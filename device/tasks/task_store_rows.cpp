@@ -9,15 +9,12 @@ namespace Device {
 using Statement = Database::Statement;
 
 void TaskStore::AddWorker(pid_t pid, std::uint64_t start_time) {
-  Statement(database_, "INSERT OR REPLACE INTO workers VALUES (?, ?, 0, 0)")
-      .Bind(std::int64_t{pid})
-      .Bind(static_cast<std::int64_t>(start_time))
-      .Step();
+  database_.Run("INSERT OR REPLACE INTO workers VALUES (?, ?, 0, 0)", pid, start_time);
 }
 
 std::optional<WorkerRow> TaskStore::FindWorker(pid_t pid) {
-  Statement select(database_, "SELECT start_time, stopped, ended FROM workers WHERE pid = ?");
-  if (!select.Bind(std::int64_t{pid}).Step()) {
+  Statement select(database_, "SELECT start_time, stopped, ended FROM workers WHERE pid = ?", pid);
+  if (!select.Step()) {
     return std::nullopt;
   }
   return WorkerRow{static_cast<std::uint64_t>(select.Number(0)), select.Number(1),
@@ -25,14 +22,11 @@ std::optional<WorkerRow> TaskStore::FindWorker(pid_t pid) {
 }
 
 void TaskStore::NoteStop(pid_t pid) {
-  Statement(database_, "UPDATE workers SET stopped = ? WHERE pid = ?")
-      .Bind(std::time(nullptr))
-      .Bind(std::int64_t{pid})
-      .Step();
+  database_.Run("UPDATE workers SET stopped = ? WHERE pid = ?", std::time(nullptr), pid);
 }
 
 void TaskStore::NoteEnd(pid_t pid) {
-  Statement(database_, "UPDATE workers SET ended = 1 WHERE pid = ?").Bind(std::int64_t{pid}).Step();
+  database_.Run("UPDATE workers SET ended = 1 WHERE pid = ?", pid);
   database_.EraseMarked();  // this process may have been the one that read
 }
 
@@ -45,17 +39,11 @@ std::vector<pid_t> TaskStore::AllWorkers() {
   return workers;
 }
 
-void TaskStore::RemoveWorker(pid_t pid) {
-  Statement(database_, "DELETE FROM workers WHERE pid = ?").Bind(std::int64_t{pid}).Step();
-}
+void TaskStore::RemoveWorker(pid_t pid) { database_.Run("DELETE FROM workers WHERE pid = ?", pid); }
 
 void TaskStore::AddLeftovers(pid_t worker, const Leftovers& leftovers) {
-  Statement(database_, "INSERT INTO leftovers VALUES (NULL, ?, ?, ?, ?)")
-      .Bind(std::int64_t{worker})
-      .Bind(leftovers.list)
-      .Bind(leftovers.folder)
-      .Bind(leftovers.work_folder)
-      .Step();
+  database_.Run("INSERT INTO leftovers VALUES (NULL, ?, ?, ?, ?)", worker, leftovers.list,
+                leftovers.folder, leftovers.work_folder);
 }
 
 std::vector<LeftoversRow> TaskStore::AllLeftovers() {
@@ -70,26 +58,20 @@ std::vector<LeftoversRow> TaskStore::AllLeftovers() {
 }
 
 void TaskStore::RemoveLeftovers(std::int64_t number) {
-  Statement(database_, "DELETE FROM leftovers WHERE number = ?").Bind(number).Step();
+  database_.Run("DELETE FROM leftovers WHERE number = ?", number);
 }
 
 void TaskStore::AddNotification(const NotificationRow& row) {
-  Statement(database_, "INSERT INTO notifications VALUES (?, ?, ?, ?, ?, ?)")
-      .Bind(row.time)
-      .Bind(row.app)
-      .Bind(row.task)
-      .Bind(row.title)
-      .Bind(row.message)
-      .Bind(ToText(JsonArray(row.arguments)))
-      .Step();
+  database_.Run("INSERT INTO notifications VALUES (?, ?, ?, ?, ?, ?)", row.time, row.app, row.task,
+                row.title, row.message, ToText(JsonArray(row.arguments)));
 }
 
 std::vector<NotificationRow> TaskStore::NotificationsAfter(std::int64_t number) {
   std::vector<NotificationRow> rows;
   Statement select(database_,
                    "SELECT rowid, time, app, task, title, message, arguments FROM notifications "
-                   "WHERE rowid > ? ORDER BY rowid");
-  select.Bind(number);
+                   "WHERE rowid > ? ORDER BY rowid",
+                   number);
   while (select.Step()) {
     NotificationRow row;
     row.number = select.Number(0);
@@ -107,8 +89,7 @@ std::vector<NotificationRow> TaskStore::NotificationsAfter(std::int64_t number) 
 }
 
 std::int64_t TaskStore::LastNotification() {
-  Statement select(database_, "SELECT ifnull(max(rowid), 0) FROM notifications");
-  return select.Step() ? select.Number(0) : 0;
+  return database_.Number("SELECT max(rowid) FROM notifications");
 }
 
 }  // namespace Device
