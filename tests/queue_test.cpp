@@ -1,6 +1,7 @@
 // The queue of jobs: who is next, and that nothing but its process keeps a job's place.
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <csignal>
@@ -9,6 +10,7 @@
 #include "device/host/sessions.h"
 #include "device/tasks/job_queue.h"
 #include "device/tasks/user_tasks.h"
+#include "device/tasks/workers.h"
 #include "tests/device_fixture.h"
 
 namespace {
@@ -146,6 +148,36 @@ TEST_F(QueueTest, JobsRunInTheOrderOfTheirStartAndAKilledOneLeavesNoPlaceTaken) 
   EXPECT_TRUE(IsGone(last) && IsGone(next));
   EXPECT_EQ(States(), "failed failed finished finished ");
   EXPECT_EQ(Calls("KLIBCPopenv").size(), 4U);
+}
+
+TEST_F(QueueTest, WhoStopsAWorkerKeepsNobodysJobWaiting) {
+  Device::TheDevice().config.jobs_at_once = Device::MostJobs();
+  std::vector<Job> stopped;
+  while (stopped.size() <= Device::MostJobs()) {  // the last one of them waits
+    stopped.push_back(Start("bob"));
+  }
+  for (const Job& job : stopped) {
+    kill(job.worker, SIGSTOP);
+  }
+  // As one has that is stopped in the midst of a change.
+  const pid_t holder = fork();
+  if (holder == 0) {
+    struct flock byte {};
+    byte.l_type = F_WRLCK;
+    byte.l_len = 1;
+    fcntl(Device::TheDevice().queue.Get(), F_SETLKW, &byte);
+    raise(SIGSTOP);
+  }
+  EXPECT_TRUE(WaitUntil([&] { return Device::IsStopped(holder); }));
+  const Job job = Start();
+  EXPECT_TRUE(IsAtWork(job));
+  for (const Job& each : stopped) {
+    kill(each.worker, SIGKILL);
+  }
+  kill(holder, SIGKILL);
+  waitpid(holder, nullptr, 0);
+  FinishRunning();
+  EXPECT_TRUE(IsGone(job));
 }
 
 TEST_F(QueueTest, KillingAllLeavesAnEmptyQueue) {

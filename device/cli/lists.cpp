@@ -20,7 +20,7 @@ namespace {
 
 void PrintTask(const Json::Value& task) {
   std::cout << task["taskid"].asString() << '\t' << StateText(task) << '\t'
-            << std::floor(task["progress"].asDouble() * 100) << " %\t"
+            << std::lround(task["progress"].asDouble() * 100) << " %\t"
             << Shown(task["dest_file_path"].asString());
   const char* separator = "\t";
   for (const std::string& line : ErrorLines(task)) {

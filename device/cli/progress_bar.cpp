@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -77,7 +78,7 @@ void ProgressBar::Show(const Json::Value& task) {
     const double seconds = std::chrono::duration<double>(Clock::now() - since_).count();
     const double gained = share - first_share_;
     const auto filled = static_cast<std::size_t>(share * kBarColumns);
-    line = Format("%3d %%", static_cast<int>(share * 100));
+    line = Format("%3d %%", static_cast<int>(std::lround(share * 100)));
     add("[" + std::string(filled, '#') + std::string(kBarColumns - filled, ' ') + "]");
     if (total > 0) {
       add(SizeText(share * total) + " of " + SizeText(total));

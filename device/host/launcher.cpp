@@ -181,7 +181,7 @@ void RemoveLeftoversOfAll() {
         RemoveLeftovers(user.name);
       }
       return 0;
-    }).Wait();
+    }).Release();  // a user can hold a process of the user's up
   }
 }
 

@@ -15,6 +15,7 @@
 #include "device/base/file_descriptor.h"
 #include "device/model/device.h"
 #include "device/model/memory.h"
+#include "device/tasks/workers.h"
 
 namespace Device {
 
@@ -48,6 +49,16 @@ struct flock64 Range(short type, off64_t first, off64_t length) {
   return range;
 }
 
+// False when another process has the byte.
+bool TrySetLock(short type, off64_t place) {
+  struct flock64 range = Range(type, place, 1);
+  const bool is_set = fcntl(TheDevice().queue.Get(), F_SETLK64, &range) == 0;
+  if (!is_set && errno != EACCES && errno != EAGAIN) {
+    ThrowErrno("queue of jobs");
+  }
+  return is_set;
+}
+
 // Waits for the lock when the command is F_SETLKW64.
 void SetLock(int command, short type, off64_t place) {
   struct flock64 range = Range(type, place, 1);
@@ -56,13 +67,18 @@ void SetLock(int command, short type, off64_t place) {
   }
 }
 
+// A user can stop a worker of the user's own while it holds the byte. So nobody waits for it for
+// long: without it, a job too many may come to run.
 class Change {
  public:
-  Change() { SetLock(F_SETLKW64, F_WRLCK, kChange); }
-  ~Change() {
-    struct flock64 range = Range(F_UNLCK, kChange, 1);
-    fcntl(TheDevice().queue.Get(), F_SETLK64, &range);
+  Change() {
+    constexpr int kTries = 250;
+    constexpr int kPauseMs = 2;
+    for (int tries = 0; tries < kTries && !TrySetLock(F_WRLCK, kChange); ++tries) {
+      poll(nullptr, 0, kPauseMs);
+    }
   }
+  ~Change() { TrySetLock(F_UNLCK, kChange); }
   Change(const Change&) = delete;
   Change& operator=(const Change&) = delete;
 };
@@ -99,7 +115,7 @@ bool IsIn(const QueuedJob& job, const std::vector<QueuedJob>& jobs) {
 
 void WaitForEndOfAny(const std::vector<QueuedJob>& jobs) {
   constexpr int kPauseMs = 50;  // where there are no such descriptors, under emulators
-  int timeout = -1;
+  int timeout = 3000;           // that one is stopped, nobody tells
   std::vector<FileDescriptor> processes;
   std::vector<pollfd> ends;
   for (const QueuedJob& job : jobs) {
@@ -123,6 +139,10 @@ QueuedJob own_job;
 bool TakeTurn(std::vector<QueuedJob>& jobs) {
   const Change change;
   jobs = JobsOfOthers();
+  // A user who stops a worker must not keep its place from others.
+  jobs.erase(std::remove_if(jobs.begin(), jobs.end(),
+                            [](const QueuedJob& job) { return IsStopped(job.worker); }),
+             jobs.end());
   jobs.push_back(own_job);
   if (!IsIn(own_job, NextToRun(jobs, TheDevice().config.jobs_at_once, MostJobs()))) {
     return false;
@@ -205,7 +225,9 @@ void EnterQueue(uid_t user) {
     ticket = std::max(ticket, job.ticket);
   }
   own_job = {getpid(), user, ticket + 1, false};
-  SetLock(F_SETLK64, F_WRLCK, PlaceOf(own_job));
+  while (!TrySetLock(F_WRLCK, PlaceOf(own_job))) {
+    ++own_job.ticket;
+  }
 }
 
 void WaitForTurn() {

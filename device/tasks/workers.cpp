@@ -105,6 +105,11 @@ void RegisterWorker(const std::string& user, pid_t pid) {
   StoreOf(user).AddWorker(pid, stat->start_time);
 }
 
+bool IsStopped(pid_t pid) {
+  const std::optional<ProcessStat> stat = ReadStat(pid);
+  return stat && stat->state == 'T';
+}
+
 bool IsWorkerAlive(const std::string& user, pid_t pid) {
   const std::optional<WorkerRow> worker = StoreOf(user).FindWorker(pid);
   return worker && IsAlive(pid, *worker);
