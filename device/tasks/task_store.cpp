@@ -43,6 +43,12 @@ const std::string kSecret = "\"password\":";  // in a text that is erased when i
 
 }  // namespace
 
+const StoredValue& TaskRow::Property(const std::string& name) const {
+  static const StoredValue kNone;
+  const auto found = properties.find(name);
+  return found == properties.end() ? kNone : found->second;
+}
+
 TaskStore::TaskStore(const std::string& user)
     : database_(TheDevice().StateFolder(user) + "/store.db", kSchema, kSchemaVersion) {
   database_.EraseMarked();

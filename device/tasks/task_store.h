@@ -34,6 +34,11 @@ struct TaskRow {
   std::int64_t updated = 0;  // seconds since 1970
   std::int64_t version = 0;  // grows with every change
   std::map<std::string, StoredValue> properties;
+
+  // Null when it has none of that name.
+  const StoredValue& Property(const std::string& name) const;
+  // The job has failed, and why is stored.
+  bool HasErrors() const { return Property(kPropData).HasMember(kDataErrors); }
 };
 
 // A worker process. By its start time, one that has taken over its process id is not mistaken for

@@ -18,21 +18,13 @@ namespace {
 
 constexpr std::size_t kMostListedErrors = std::size_t{64} << 10U;  // bytes of text
 
-const StoredValue& Property(const TaskRow& row, const std::string& name) {
-  static const StoredValue kNone;
-  const auto found = row.properties.find(name);
-  return found == row.properties.end() ? kNone : found->second;
-}
-
-bool HasFailed(const TaskRow& row) { return Property(row, kPropData).HasMember(kDataErrors); }
-
 bool HasLostWorker(const std::string& user, const TaskRow& row) {
-  return !row.finished && !HasFailed(row) && HasDied(user, WorkerOf(row));
+  return !row.finished && !row.HasErrors() && HasDied(user, WorkerOf(row));
 }
 
 // What the task manager noted when the task was made.
 Json::Value InfoOf(const TaskRow& row) {
-  const Json::Value info = Property(row, kPropData).Member(row.id);
+  const Json::Value info = row.Property(kPropData).Member(row.id);
   return info.isObject() ? info : Json::Value(Json::objectValue);
 }
 
@@ -42,7 +34,7 @@ Json::Value Destination(const TaskRow& row) {
   if (title.isString()) {
     return title;
   }
-  const Json::Value params = Property(row, kPropData).Member("params");
+  const Json::Value params = row.Property(kPropData).Member("params");
   const Json::Value dest = params.isObject() ? params["dest_file_path"] : Json::Value();
   return dest.isString() ? dest : Json::Value("");
 }
@@ -50,7 +42,7 @@ Json::Value Destination(const TaskRow& row) {
 // The module stores a fraction of 32 bits, such as 0.28999999; meant are hundredths.
 double Progress(const TaskRow& row) {
   constexpr double kSteps = 1000;
-  const Json::Value progress = Property(row, "progress").Value();
+  const Json::Value progress = row.Property("progress").Value();
   return progress.isNumeric() ? std::round(progress.asDouble() * kSteps) / kSteps : 0;
 }
 
@@ -82,7 +74,7 @@ std::string WithUserPaths(std::string text) {
 }
 
 void StoreFailure(const std::string& user, TaskRow& row) {
-  StoredValue data = Property(row, kPropData);
+  StoredValue data = row.Property(kPropData);
   data.members[kDataErrors] = ToText(GeneralError(row));
   const std::int64_t version = row.version;
   try {
@@ -140,15 +132,15 @@ std::vector<TaskRow> AllTasks(const std::string& user) {
 }
 
 pid_t WorkerOf(const TaskRow& row) {
-  const Json::Value pid = Property(row, kPropData).Member(kDataPid);
+  const Json::Value pid = row.Property(kPropData).Member(kDataPid);
   return pid.isInt() ? pid.asInt() : -1;
 }
 
-bool HasData(const TaskRow& row) { return Property(row, kPropData).IsObject(); }
+bool HasData(const TaskRow& row) { return row.Property(kPropData).IsObject(); }
 
 Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& waiting) {
-  const StoredValue& data = Property(row, kPropData);
-  const StoredValue& archiver = Property(row, kPropArchiver);
+  const StoredValue& data = row.Property(kPropData);
+  const StoredValue& archiver = row.Property(kPropArchiver);
   const Json::Value total_size = data.Member("total_size");
   Json::Value view = JsonObject({{"taskid", row.id},
                                  {"dest_file_path", Destination(row)},
@@ -160,9 +152,8 @@ Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& wai
       view[name] = archiver.Member(name);
     }
   };
-  const Json::Value pid = data.Member(kDataPid);
-  const auto waits = pid.isInt() ? waiting.find(pid.asInt()) : waiting.end();
-  if (HasFailed(row)) {
+  const auto waits = waiting.find(WorkerOf(row));
+  if (row.HasErrors()) {
     view["state"] = "failed";
     const bool is_listed = data.members.at(kDataErrors).size() <= kMostListedErrors;
     view[kDataErrors] = is_listed ? data.Member(kDataErrors) : GeneralError(row);

@@ -47,10 +47,6 @@ bool WaitForTask(Vesk::Task::State& task, int seconds, const std::function<bool(
   return false;
 }
 
-bool HoldsErrors(const Vesk::Task::State& task) {
-  return task.Find(kPropData).HasMember(kDataErrors);
-}
-
 // When a worker went is not known; its last word in the store counts.
 bool IsStale(const std::string& user, const TaskRow& row) {
   const std::time_t age = std::time(nullptr) - row.updated;
@@ -120,7 +116,7 @@ void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved) {
   Operation("LumoLibRemoveFinishedTask", task, pid, reserved).Run([&] {
     Vesk::Task::State* const state = task == nullptr ? nullptr : task->state;
     // As the answer has it: of a worker that has ended since, the next one reports the end.
-    if (state != nullptr && (state->row.finished || Device::HoldsErrors(*state))) {
+    if (state != nullptr && (state->row.finished || state->row.HasErrors())) {
       state->Remove();
     }
   });

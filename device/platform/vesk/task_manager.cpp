@@ -67,13 +67,8 @@ Json::Value NewsOfArchiver() {
 }  // namespace
 
 const Device::StoredValue& Task::State::Find(const std::string& name) const {
-  static const Device::StoredValue kNone;
   const auto gathered = pending.find(name);
-  if (gathered != pending.end()) {
-    return gathered->second;
-  }
-  const auto found = row.properties.find(name);
-  return found == row.properties.end() ? kNone : found->second;
+  return gathered == pending.end() ? row.Property(name) : gathered->second;
 }
 
 bool Task::State::Set(const std::string& name, Device::StoredValue value) {
@@ -129,8 +124,7 @@ bool Task::State::Reload() {
 
 void Task::State::Remove() {
   try {
-    const Json::Value worker = Find(Device::kPropData).Member(Device::kDataPid);
-    Device::StoreOf(user).RemoveTask(row.id, worker.isInt() ? worker.asInt() : -1);
+    Device::StoreOf(user).RemoveTask(row.id, Device::WorkerOf(row));
   } catch (const std::exception& error) {
     LogFailure("remove task", error);
   }
