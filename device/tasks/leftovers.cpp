@@ -26,21 +26,17 @@ void RemoveList(const std::string& path) {
 
 }  // namespace
 
-void NoteLeftovers(const std::string& user, const Leftovers& leftovers) {
-  StoreOf(user).AddLeftovers(getpid(), leftovers);
-}
-
 void RemoveLeftovers(const std::string& user) {
   TaskStore& store = StoreOf(user);
-  for (const auto& [number, worker, left] : store.AllLeftovers()) {
-    if (IsWorkerAlive(user, worker)) {
+  for (const LeftoversRow& left : store.AllLeftovers()) {
+    if (IsWorkerAlive(user, left.worker)) {
       continue;
     }
     RemoveList(left.list);
     const FileDescriptor folder =
         OpenUserPath(TheDevice().FixedFolders(user), left.folder, O_RDONLY | O_DIRECTORY);
     if (!folder || RemoveStaleWorkFolder(folder, left.work_folder)) {
-      store.RemoveLeftovers(number);
+      store.RemoveLeftovers(left.number);
     }
   }
 }

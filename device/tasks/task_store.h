@@ -11,7 +11,6 @@
 #include <vector>
 
 #include "device/tasks/database.h"
-#include "device/tasks/leftovers.h"
 #include "device/tasks/stored_value.h"
 
 namespace Device {
@@ -49,10 +48,13 @@ struct WorkerRow {
   bool has_come_to_end = false;  // it has done all that a worker does
 };
 
+// What a worker is going to leave if it is killed.
 struct LeftoversRow {
   std::int64_t number = 0;
   pid_t worker = -1;
-  Leftovers leftovers;
+  std::string list;         // path of the list file
+  std::string folder;       // path of the folder in which the archive is made
+  std::string work_folder;  // name of the hidden folder there
 };
 
 struct NotificationRow {
@@ -95,7 +97,8 @@ class TaskStore {
   std::vector<pid_t> AllWorkers();
   void RemoveWorker(pid_t pid);
 
-  void AddLeftovers(pid_t worker, const Leftovers& leftovers);
+  // Under a number of its own.
+  void AddLeftovers(const LeftoversRow& row);
   std::vector<LeftoversRow> AllLeftovers();
   void RemoveLeftovers(std::int64_t number);
 

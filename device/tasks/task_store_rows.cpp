@@ -41,18 +41,17 @@ std::vector<pid_t> TaskStore::AllWorkers() {
 
 void TaskStore::RemoveWorker(pid_t pid) { database_.Run("DELETE FROM workers WHERE pid = ?", pid); }
 
-void TaskStore::AddLeftovers(pid_t worker, const Leftovers& leftovers) {
-  database_.Run("INSERT INTO leftovers VALUES (NULL, ?, ?, ?, ?)", worker, leftovers.list,
-                leftovers.folder, leftovers.work_folder);
+void TaskStore::AddLeftovers(const LeftoversRow& row) {
+  database_.Run("INSERT INTO leftovers VALUES (NULL, ?, ?, ?, ?)", row.worker, row.list, row.folder,
+                row.work_folder);
 }
 
 std::vector<LeftoversRow> TaskStore::AllLeftovers() {
   std::vector<LeftoversRow> rows;
   Statement select(database_, "SELECT number, worker, list, folder, work_folder FROM leftovers");
   while (select.Step()) {
-    rows.push_back({select.Number(0),
-                    static_cast<pid_t>(select.Number(1)),
-                    {select.Text(2), select.Text(3), select.Text(4)}});
+    rows.push_back({select.Number(0), static_cast<pid_t>(select.Number(1)), select.Text(2),
+                    select.Text(3), select.Text(4)});
   }
   return rows;
 }

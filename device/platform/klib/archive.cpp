@@ -7,6 +7,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
 #include <stdexcept>
 #include <utility>
 
@@ -17,7 +18,7 @@
 #include "device/platform/lumo/identity.h"
 #include "device/platform/lumo/paths.h"
 #include "device/tasks/job_queue.h"
-#include "device/tasks/leftovers.h"
+#include "device/tasks/task_store.h"
 
 namespace Device {
 
@@ -37,10 +38,8 @@ FileDescriptor OpenSingleFile(const std::string& path) {
 }
 
 bool IsSameFolder(const FileDescriptor& folder) {
-  struct stat one {};
-  struct stat here {};
-  return folder && fstat(folder.Get(), &one) == 0 && stat(".", &here) == 0 &&
-         one.st_dev == here.st_dev && one.st_ino == here.st_ino;
+  std::error_code ignored;
+  return folder && std::filesystem::equivalent(PathOf(folder.Get()), ".", ignored);
 }
 
 // The module's vector, taken apart.
@@ -77,8 +76,9 @@ Arguments TakeApart(char* const* argument) {
 void NoteWhatIsLeft(const Arguments& arguments, const std::string& work_folder) {
   const std::string& archive = arguments.archive;
   try {
-    NoteLeftovers(CurrentUser(),
-                  {arguments.list, archive.substr(0, archive.rfind('/')), work_folder});
+    StoreOf(CurrentUser())
+        .AddLeftovers(
+            {0, getpid(), arguments.list, archive.substr(0, archive.rfind('/')), work_folder});
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "archiver: %s", error.what());
   }
