@@ -40,7 +40,7 @@ std::string ListShares(const std::string& user) {
     names.insert(share.name);
   }
   for (const std::string& name : names) {
-    const ResolvedPath share = Resolve(TheDevice(), user, "/" + name);
+    const ResolvedPath share = Resolve(user, "/" + name);
     struct stat status {};
     if (share.error == 0 && AccessOf(share, user) != Access::kNone &&
         stat(share.real_path.c_str(), &status) == 0) {

@@ -33,7 +33,7 @@ void RefuseForErrno(int error_number) {
 }
 
 ResolvedPath ResolveForUser(const std::string& user, const std::string& path) {
-  ResolvedPath resolved = Resolve(TheDevice(), user, path);
+  ResolvedPath resolved = Resolve(user, path);
   if (resolved.error != 0) {
     RefuseFor(resolved.error);
   }

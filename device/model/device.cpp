@@ -73,7 +73,7 @@ std::vector<std::string> OpenDevice::FixedFolders(const std::string& user) const
     folders.push_back(VolumePath(volume));
   }
   for (const Share& share : config.shares) {
-    folders.push_back(VolumePath(share.volume) + "/" + share.name);
+    folders.push_back(SharePath(share));
   }
   if (const User* const owner = config.FindUser(user)) {
     folders.push_back(HomePath(*owner));

@@ -37,6 +37,9 @@ struct OpenDevice {
   FileDescriptor queue;                   // that jobs are queued by locks on
 
   std::string VolumePath(const std::string& volume) const { return root + "/" + volume; }
+  std::string SharePath(const Share& share) const {
+    return VolumePath(share.volume) + "/" + share.name;
+  }
   std::string HomePath(const User& user) const {
     return VolumePath(user.home) + "/homes/" + user.name;
   }

@@ -56,7 +56,7 @@ Json::Value GeneralError(const TaskRow& row) {
 std::string WithUserPaths(std::string text) {
   std::map<std::string, std::string> user_paths;
   for (const Share& share : TheDevice().config.shares) {
-    user_paths[TheDevice().VolumePath(share.volume) + "/" + share.name] = "/" + share.name;
+    user_paths[TheDevice().SharePath(share)] = "/" + share.name;
   }
   for (const User& user : TheDevice().config.users) {
     user_paths[TheDevice().HomePath(user)] = std::string("/") + kHomeShare;

@@ -54,8 +54,11 @@ int FromErrno(int error_number) {
 
 }  // namespace
 
-void SetLastError(int code) { last_error = code; }
-void SetLastErrno(int error_number) { SetLastError(FromErrno(error_number)); }
+int SetLastError(int code) {
+  last_error = code;
+  return -1;
+}
+int SetLastErrno(int error_number) { return SetLastError(FromErrno(error_number)); }
 
 const char* ErrorText(int code) {
   const auto row = kTexts.find(code);

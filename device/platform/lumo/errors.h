@@ -8,10 +8,10 @@
 
 namespace Device {
 
-// Leaves the code for LumoLibGetErr.
-void SetLastError(int code);
-// Leaves the code for a system error number.
-void SetLastErrno(int error_number);
+// Leaves the code for LumoLibGetErr, and returns -1.
+int SetLastError(int code);
+// Leaves the code for a system error number, and returns -1.
+int SetLastErrno(int error_number);
 
 // What a web API error code means, in English. Never null.
 const char* ErrorText(int code);

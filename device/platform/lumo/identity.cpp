@@ -46,8 +46,7 @@ int SwitchTo(const char* session_id, const char* name) {
     return -1;
   }
   if (!BecomeUser(*user)) {
-    SetLastErrno(errno);
-    return -1;
+    return SetLastErrno(errno);
   }
   current_user = user->name;
   return 0;

@@ -44,7 +44,8 @@ bool SplitUserPath(std::string_view path, std::vector<std::string_view>& parts) 
 }
 
 // Fills in the shared folder's fields. False when there is none of that name, or no such user.
-bool FindShareFolder(const OpenDevice& device, const std::string& user, ResolvedPath& resolved) {
+bool FindShareFolder(const std::string& user, ResolvedPath& resolved) {
+  const OpenDevice& device = TheDevice();
   if (resolved.share_name == kHomeShare) {
     const User* const owner = device.config.FindUser(user);
     if (owner == nullptr) {
@@ -59,7 +60,7 @@ bool FindShareFolder(const OpenDevice& device, const std::string& user, Resolved
     return false;
   }
   resolved.volume_path = device.VolumePath(resolved.share->volume);
-  resolved.share_real_path = resolved.volume_path + "/" + resolved.share->name;
+  resolved.share_real_path = device.SharePath(*resolved.share);
   return true;
 }
 
@@ -86,26 +87,24 @@ int CheckPath(const std::string& path) {
   const FileDescriptor entry = OpenUserPath(fixed, path, O_PATH);
   const int error = entry ? 0 : errno;
   if (error == ELOOP || !IsInsideOne(path, fixed) || (entry && LeadsAway(entry, path))) {
-    SetLastError(KAVO::kErrOutsideShare);
-    return -1;
+    return SetLastError(KAVO::kErrOutsideShare);
   }
   if (error != 0 && error != ENOENT) {
-    SetLastErrno(error);
-    return -1;
+    return SetLastErrno(error);
   }
   return 0;
 }
 
 int CheckFileName(const std::string& directory, const std::string& name) {
   if (name.empty() || name == "." || name == ".." || name.find('/') != std::string::npos) {
-    SetLastError(KAVO::kErrBadName);
-    return -1;
+    return SetLastError(KAVO::kErrBadName);
   }
-  const Share* const share = ShareOfRealPath(TheDevice(), directory);
-  const bool is_encrypted = share != nullptr && share->encrypted;
+  const std::vector<Share>& shares = TheDevice().config.shares;
+  const bool is_encrypted = std::any_of(shares.begin(), shares.end(), [&](const Share& share) {
+    return share.encrypted && IsWithin(directory, TheDevice().SharePath(share));
+  });
   if (name.size() > (is_encrypted ? kEncryptedNameMax : kNameMax)) {
-    SetLastError(is_encrypted ? KAVO::kErrNameTooLongEncrypted : KAVO::kErrNameTooLong);
-    return -1;
+    return SetLastError(is_encrypted ? KAVO::kErrNameTooLongEncrypted : KAVO::kErrNameTooLong);
   }
   return 0;
 }
@@ -127,7 +126,7 @@ std::string sources_folder;
 
 const std::string& SourcesFolder() { return sources_folder; }
 
-ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const std::string& path) {
+ResolvedPath Resolve(const std::string& user, const std::string& path) {
   ResolvedPath resolved;
   std::vector<std::string_view> parts;
   if (path.empty() || path[0] != '/' || path.find('\0') != std::string::npos) {
@@ -140,7 +139,7 @@ ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const st
     resolved.error = KAVO::kErrNotFound;
   } else {
     resolved.share_name = parts.front();
-    resolved.error = FindShareFolder(device, user, resolved) ? 0 : KAVO::kErrNotFound;
+    resolved.error = FindShareFolder(user, resolved) ? 0 : KAVO::kErrNotFound;
     resolved.user_path = "/" + resolved.share_name;
     resolved.real_path = resolved.share_real_path;
     resolved.user_path.reserve(path.size());
@@ -164,15 +163,6 @@ Access AccessOf(const ResolvedPath& path, const std::string& user) {
   return found == path.share->access.end() ? Access::kNone : found->second;
 }
 
-const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_path) {
-  for (const Share& share : device.config.shares) {
-    if (IsWithin(real_path, device.VolumePath(share.volume) + "/" + share.name)) {
-      return &share;
-    }
-  }
-  return nullptr;
-}
-
 }  // namespace Device
 
 using Device::Operation;
@@ -185,7 +175,7 @@ int PathInfoFactory::create(const char* user, const std::string& path, PathInfo&
       .Output("volume_path", out.volume_path)
       .Output("share_real_path", out.share_real_path);
   return operation.Run([&] {
-    Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), user, path);
+    Device::ResolvedPath resolved = Device::Resolve(user, path);
     if (resolved.error == 0 && Device::AccessOf(resolved, user) == Device::Access::kNone) {
       resolved.error = KAVO::kErrNoPrivilege;  // the user does not even see the shared folder
     }
@@ -211,7 +201,7 @@ int LumoFullPathGet(const char* path, std::string* full_path, std::string* home_
       .Output("full_path", *full_path)
       .Output("home_test_path", *home_test_path)
       .Run([&] {
-        const Device::ResolvedPath resolved = Device::Resolve(Device::TheDevice(), *user, path);
+        const Device::ResolvedPath resolved = Device::Resolve(*user, path);
         if (resolved.error != 0) {
           Device::SetLastError(resolved.error);
           return 0;
@@ -266,7 +256,6 @@ int VolumePathParse(const char* volume_path, VolumeInfo* out) {
       }
       ++index;
     }
-    Device::SetLastError(KAVO::kErrNotFound);
-    return -1;
+    return Device::SetLastError(KAVO::kErrNotFound);
   });
 }

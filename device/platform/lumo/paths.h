@@ -19,13 +19,10 @@ struct ResolvedPath {
 
 // Resolves the path as that user sees it. ".." may not lead out of the shared folder. Nothing need
 // exist.
-ResolvedPath Resolve(const OpenDevice& device, const std::string& user, const std::string& path);
+ResolvedPath Resolve(const std::string& user, const std::string& path);
 
 // What the user may do on the shared folder that the path was resolved to.
 Access AccessOf(const ResolvedPath& path, const std::string& user);
-
-// The shared folder that a full path lies in, null when it is in none.
-const Share* ShareOfRealPath(const OpenDevice& device, const std::string& real_path);
 
 // The folder in which this process's job has its sources, when they lie in one shared folder: what
 // FindCommonParent answered. Without a slash at the end; empty before.

@@ -34,10 +34,9 @@ int LevelOf(Access access) {
 }
 
 int GetPrivilege(const char* path, const std::string& user, int* level, int* flags) {
-  const ResolvedPath resolved = Resolve(TheDevice(), user, path);
+  const ResolvedPath resolved = Resolve(user, path);
   if (resolved.error != 0) {
-    SetLastError(resolved.error);
-    return -1;
+    return SetLastError(resolved.error);
   }
   *level = LevelOf(AccessOf(resolved, user));
   *flags = resolved.share != nullptr && resolved.share->read_only ? kFlagWriteSuspended : 0;
@@ -45,7 +44,7 @@ int GetPrivilege(const char* path, const std::string& user, int* level, int* fla
 }
 
 bool MayList(const std::string& user, const char* path) {
-  const ResolvedPath resolved = Resolve(TheDevice(), user, path);
+  const ResolvedPath resolved = Resolve(user, path);
   const Access access = resolved.error == 0 ? AccessOf(resolved, user) : Access::kNone;
   return access == Access::kReadOnly || access == Access::kReadWrite;
 }
@@ -54,30 +53,23 @@ int AskKernel(const char* path, int mode) {
   const int bits = ((mode & kAccessRead) != 0 ? R_OK : 0) |
                    ((mode & kAccessWrite) != 0 ? W_OK : 0) | ((mode & kAccessPass) != 0 ? X_OK : 0);
   // What is written to is the destination's folder, never one behind a link.
-  if ((mode & kAccessWrite) != 0 &&
-      !OpenUserPath(TheDevice().FixedFolders(CurrentUser()), path, O_PATH | O_DIRECTORY)) {
-    SetLastErrno(errno);
-    return -1;
-  }
-  if (faccessat(AT_FDCWD, path, bits, AT_EACCESS) != 0) {
-    SetLastErrno(errno);
-    return -1;
-  }
-  return 0;
+  const bool is_misled =
+      (mode & kAccessWrite) != 0 &&
+      !OpenUserPath(TheDevice().FixedFolders(CurrentUser()), path, O_PATH | O_DIRECTORY);
+  const bool is_allowed = !is_misled && faccessat(AT_FDCWD, path, bits, AT_EACCESS) == 0;
+  return is_allowed ? 0 : SetLastErrno(errno);
 }
 
 int ChownToAdmins(const char* path, const std::string& name) {
   const User* const user = TheDevice().config.FindUser(name);
   if (user == nullptr) {
-    SetLastError(KAVO::kErrNoUser);
-    return -1;
+    return SetLastError(KAVO::kErrNoUser);
   }
   const FileDescriptor archive = OpenArchive(path);
   // Without root there are no such users and groups, only the caller.
   if (TheDevice().switches_identity && archive &&
       fchownat(archive.Get(), "", user->uid, kAdminsGroup, AT_EMPTY_PATH) != 0) {
-    SetLastErrno(errno);
-    return -1;
+    return SetLastErrno(errno);
   }
   return 0;
 }
@@ -107,8 +99,7 @@ int ACLAccess(const char* path, int mode) {
 
 int LumoLibCheckEncryptShare(const std::string& path, bool* encrypted) {
   return Operation("LumoLibCheckEncryptShare", path).Run([&] {
-    const Device::OpenDevice& device = Device::TheDevice();
-    const Device::ResolvedPath resolved = Device::Resolve(device, Device::CurrentUser(), path);
+    const Device::ResolvedPath resolved = Device::Resolve(Device::CurrentUser(), path);
     if (resolved.error != 0) {
       Device::SetLastError(resolved.error);
       return 0;
