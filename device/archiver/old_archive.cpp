@@ -1,12 +1,14 @@
 #include "device/archiver/old_archive.h"
 
 #include <fcntl.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
 
 #include "device/archiver/failure.h"
+#include "device/archiver/program.h"
 #include "device/archiver/stock_7z.h"
 #include "device/archiver/zip_program.h"
 #include "device/base/file_io.h"
@@ -15,6 +17,7 @@
 namespace Archiver {
 namespace {
 
+constexpr char kCannotUpdate[] = "cannot update archive";
 constexpr mode_t kFileMode = 0666;  // the umask takes its share
 
 Device::FileDescriptor Open(const std::string& path, int flags) {
@@ -41,14 +44,22 @@ void CopyOldArchive(const Job& job) {
   }
 }
 
-// What kavo-zip says of an archive, or does with it; see there.
+// What kavo-zip says of an archive, or does with it; see there. True for kZipYes.
 bool RunZip(const Job& job, const std::string& command, const std::string& archive) {
   const Device::FileDescriptor password = UnnamedFile(job.request.password);
   Device::ProgramStart start = ProgramOf(job);
   start.program = Device::PathOf(job.zip_program);
   start.arguments = {"kavo-zip", command, archive, job.request.code_page};
   start.input = password.Get();
-  return RunZipProgram(start, job.target.Path(), job.cancel);
+  std::string reason;
+  const int status = RunProgram(
+      start, job.cancel, [](const std::string& /*none*/) {},
+      [&](const std::string& bytes) { reason += bytes; });
+  if (!WIFEXITED(status) || (WEXITSTATUS(status) != kZipYes && WEXITSTATUS(status) != kZipNo)) {
+    throw NamedFailure(kCannotUpdate, job.target.Path(),
+                       reason.empty() ? "kavo-zip failed" : reason);
+  }
+  return WEXITSTATUS(status) == kZipYes;
 }
 
 // Has 7z do that with the old archive, of type 7z, and returns what it prints.

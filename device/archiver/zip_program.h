@@ -6,11 +6,6 @@
 // reads archives that anybody may have made: it is confined like 7z.
 #pragma once
 
-#include <string>
-
-#include "device/archiver/cancel.h"
-#include "device/base/child_process.h"
-
 namespace Archiver {
 
 // Whether an archive can be updated: ends with kZipNo when names in it must go to UTF-8 before, and
@@ -20,14 +15,8 @@ inline constexpr char kZipCheck[] = "check";
 inline constexpr char kZipToUtf8[] = "to-utf8";
 inline constexpr char kZipToCodePage[] = "to-code-page";
 
-inline constexpr char kCannotUpdate[] = "cannot update archive";
-
 inline constexpr int kZipYes = 0;
 inline constexpr int kZipFailed = 1;  // the reason stands on standard error
 inline constexpr int kZipNo = 2;
-
-// Runs it to its end; true for kZipYes. Throws Failure with the reason and the archive's `name`,
-// and Cancelled when the job is to stop; the program is gone in each case.
-bool RunZipProgram(Device::ProgramStart start, const std::string& name, const Cancel& cancel);
 
 }  // namespace Archiver
