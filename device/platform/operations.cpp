@@ -4,9 +4,9 @@
 #include <unistd.h>
 
 #include <algorithm>
-#include <array>
 #include <cerrno>
 #include <csignal>
+#include <map>
 #include <stdexcept>
 
 #include "device/base/file_descriptor.h"
@@ -41,13 +41,6 @@ constexpr const char* kOperations[] = {
     "KAVOFSAclChmod"
 };
 // clang-format on
-constexpr std::size_t kOperationCount = std::size(kOperations);
-
-std::size_t IndexOf(const std::string& name) {
-  return static_cast<std::size_t>(std::find(std::begin(kOperations), std::end(kOperations), name) -
-                                  std::begin(kOperations));
-}
-
 FileDescriptor& TraceFile() {
   static FileDescriptor file;
   return file;
@@ -59,8 +52,8 @@ std::vector<Fault>& Faults() {
 }
 
 // How often each operation was called in this process and before it was forked.
-std::array<std::uint64_t, kOperationCount>& Counts() {
-  static std::array<std::uint64_t, kOperationCount> counts{};
+std::map<std::string, std::uint64_t>& Counts() {
+  static std::map<std::string, std::uint64_t> counts;
   return counts;
 }
 
@@ -124,7 +117,8 @@ void AddFault(const std::string& rule) {
     RefuseRule(rule, "N and CODE are numbers");
   }
   SplitOutputs(fault);
-  if (IndexOf(fault.call) == kOperationCount) {
+  if (std::find(std::begin(kOperations), std::end(kOperations), fault.call) ==
+      std::end(kOperations)) {
     RefuseRule(rule, "no operation '" + fault.call + "'");
   }
   Faults().push_back(fault);
@@ -137,12 +131,10 @@ std::vector<std::string> OperationNames() {
 void StopTracing() {
   TraceFile().Close();
   Faults().clear();
-  Counts().fill(0);
+  Counts().clear();
 }
 
 Json::Value ToJson(const char* text) { return text == nullptr ? Json::Value() : Json::Value(text); }
-Json::Value ToJson(const std::string& text) { return {text}; }
-Json::Value ToJson(const Json::Value& value) { return value; }
 
 Json::Value ToJson(const std::vector<std::string>& texts) { return JsonArray(texts); }
 
@@ -157,7 +149,7 @@ Json::Value ToJson(char* const* argument_vector) {
 bool Operation::IsTracedOrFaulty() { return TraceFile() || !Faults().empty(); }
 
 const Fault* Operation::CountAndMatch(const char* name) {
-  const std::uint64_t number = ++Counts().at(IndexOf(name));
+  const std::uint64_t number = ++Counts()[name];
   for (const Fault& fault : Faults()) {
     if (fault.call == name && (fault.number == 0 || fault.number == number)) {
       return &fault;

@@ -49,23 +49,13 @@ struct Fault {
 
 // What trace lines show of an argument or a result.
 Json::Value ToJson(const char* text);
-Json::Value ToJson(const std::string& text);
 Json::Value ToJson(const std::vector<std::string>& texts);
-Json::Value ToJson(const Json::Value& value);
 Json::Value ToJson(char* const* argument_vector);
-template <typename T>
-std::enable_if_t<std::is_arithmetic_v<T>, Json::Value> ToJson(T number) {
-  if constexpr (std::is_same_v<T, bool>) {
-    return Json::Value(number);
-  } else if constexpr (std::is_floating_point_v<T>) {
-    return Json::Value(static_cast<double>(number));
-  } else if constexpr (std::is_signed_v<T>) {
-    return Json::Value(static_cast<Json::Int64>(number));
-  } else {
-    return Json::Value(static_cast<Json::UInt64>(number));
-  }
-}
 inline Json::Value ToJson(std::nullptr_t) { return {}; }
+template <typename T>
+Json::Value ToJson(const T& number_or_text) {
+  return number_or_text;
+}
 // Objects are told apart from null, no more.
 template <typename T>
 Json::Value ToJson(T* object) {
@@ -106,15 +96,10 @@ class Operation {
   }
 
   // Names an output, which is filled when the fault rule has a value for it. Before Run.
-  Operation& Output(const char* name, int& output) {
-    if (HasOutput(name)) {
-      output = fault_->outputs[name].asInt();
-    }
-    return *this;
-  }
-  Operation& Output(const char* name, std::string& output) {
-    if (HasOutput(name)) {
-      output = fault_->outputs[name].asString();
+  template <typename T>
+  Operation& Output(const char* name, T& output) {
+    if (fault_ != nullptr && fault_->outputs.isMember(name)) {
+      output = fault_->outputs[name].template as<T>();
     }
     return *this;
   }
@@ -150,9 +135,6 @@ class Operation {
   }
 
  private:
-  bool HasOutput(const char* name) const {
-    return fault_ != nullptr && fault_->outputs.isMember(name);
-  }
   static bool IsTracedOrFaulty();
   static const Fault* CountAndMatch(const char* name);
   // Leaves the rule's code, and throws when the rule says so.
