@@ -24,14 +24,10 @@ Cancel::Cancel(int report_fd) : report_fd_(report_fd) {
   }
 }
 
-bool Cancel::Requested() const {
+void Cancel::Check() const {
   pollfd watched[] = {{signals_.Get(), POLLIN, 0}, {report_fd_, 0, 0}};
   poll(watched, 2, 0);
-  return (watched[0].revents & POLLIN) != 0 || (watched[1].revents & POLLERR) != 0;
-}
-
-void Cancel::Check() const {
-  if (Requested()) {
+  if ((watched[0].revents & POLLIN) != 0 || (watched[1].revents & POLLERR) != 0) {
     throw Cancelled();
   }
 }

@@ -10,8 +10,7 @@ class Cancel {
  public:
   explicit Cancel(int report_fd);
 
-  bool Requested() const;
-  // Throws Cancelled when requested.
+  // Throws Cancelled when the job is to stop.
   void Check() const;
 
   int SignalFd() const { return signals_.Get(); }

@@ -37,16 +37,13 @@ std::string Parent(const std::string& path) {
 }
 
 bool IsStagingFolder(const std::string& list_path) {
-  struct stat here {};
-  struct stat list_folder {};
-  return stat(".", &here) == 0 && stat(Parent(list_path).c_str(), &list_folder) == 0 &&
-         here.st_dev == list_folder.st_dev && here.st_ino == list_folder.st_ino;
+  std::error_code ignored;
+  return fs::equivalent(".", Parent(list_path), ignored);
 }
 
 bool LeadsToFolder(const std::string& name) {
-  struct stat info {};
-  return lstat(name.c_str(), &info) == 0 && S_ISLNK(info.st_mode) &&
-         stat(name.c_str(), &info) == 0 && S_ISDIR(info.st_mode);
+  std::error_code ignored;
+  return fs::is_symlink(name, ignored) && fs::is_directory(name, ignored);
 }
 
 // What follows `folder` and a slash in `path`; empty when `path` lies elsewhere.

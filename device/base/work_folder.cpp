@@ -1,6 +1,5 @@
 #include "device/base/work_folder.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -8,9 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstring>
 #include <filesystem>
-#include <memory>
 
 #include "device/base/file_io.h"
 #include "device/base/open_below.h"
@@ -20,6 +17,8 @@ namespace Device {
 
 namespace {
 
+namespace fs = std::filesystem;
+
 constexpr int kIdWords = 4;
 constexpr std::size_t kPrefixLength = sizeof ".kavo-7z-" - 1;
 constexpr mode_t kFolderMode = 0700;
@@ -28,34 +27,26 @@ constexpr char kMark[] = "job";
 constexpr char kMarkText[] = "kavo-7z work folder\n";
 constexpr int kOpenFolder = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
 
-struct CloseDir {
-  void operator()(DIR* dir) const { closedir(dir); }
-};
-
 // Leaves alone what no job has put there; then the folder stays as well.
 void Remove(const FileDescriptor& folder) {
-  const int copy = openat(folder.Get(), ".", kOpenFolder);
-  const std::unique_ptr<DIR, CloseDir> dir(copy < 0 ? nullptr : fdopendir(copy));
-  while (const dirent* entry = dir ? readdir(dir.get()) : nullptr) {
-    if (std::strncmp(entry->d_name, kWorkResult, sizeof kWorkResult - 1) == 0) {
-      unlinkat(folder.Get(), entry->d_name, 0);
+  std::error_code ignored;
+  for (fs::directory_iterator entry(PathOf(folder.Get()), ignored), end; entry != end;
+       entry.increment(ignored)) {
+    const std::string name = entry->path().filename();
+    if (name.rfind(kWorkResult, 0) == 0) {
+      unlinkat(folder.Get(), name.c_str(), 0);
     }
   }
-  std::error_code ignored;
-  std::filesystem::remove_all(PathOf(folder.Get()) + "/" + kWorkMirror, ignored);
+  fs::remove_all(PathOf(folder.Get()) + "/" + kWorkMirror, ignored);
   unlinkat(folder.Get(), kMark, 0);
   // Where it lies by now: others can have renamed it.
-  rmdir(std::filesystem::read_symlink(PathOf(folder.Get()), ignored).c_str());
+  rmdir(fs::read_symlink(PathOf(folder.Get()), ignored).c_str());
 }
 
 bool IsOwn(const FileDescriptor& folder) {
   struct stat status {};
   return fstat(folder.Get(), &status) == 0 && status.st_uid == geteuid() &&
          (status.st_mode & (S_IWGRP | S_IWOTH)) == 0;
-}
-
-bool IsEmpty(const FileDescriptor& folder) {
-  return std::filesystem::is_empty(PathOf(folder.Get()));
 }
 
 bool Lock(const FileDescriptor& mark) {
@@ -80,7 +71,7 @@ WorkFolder::WorkFolder(const FileDescriptor& parent, const std::string& name) {
   }
   folder_ = FileDescriptor(openat(parent.Get(), name.c_str(), kOpenFolder));
   // Who can rename it may have put another in its place already.
-  if (!folder_ || !IsOwn(folder_) || !IsEmpty(folder_)) {
+  if (!folder_ || !IsOwn(folder_) || !fs::is_empty(PathOf(folder_.Get()))) {
     errno = folder_ ? EPERM : errno;
     folder_.Close();
     ThrowErrno("cannot open the temporary folder");
