@@ -122,6 +122,7 @@ class QueueTest : public DeviceTest {
 };
 
 TEST_F(QueueTest, JobsRunInTheOrderOfTheirStartAndAKilledOneLeavesNoPlaceTaken) {
+  std::signal(SIGTERM, [](int /*number*/) {});  // as a launcher may have it
   const Job running = Start();
   const Job killed = Start();
   const Job stopped = Start();
@@ -136,6 +137,9 @@ TEST_F(QueueTest, JobsRunInTheOrderOfTheirStartAndAKilledOneLeavesNoPlaceTaken) 
 
   kill(killed.worker, SIGKILL);
   EXPECT_EQ(Ask("stop", stopped.id).code, 0);
+  int status = 0;
+  EXPECT_EQ(waitpid(stopped.worker, &status, 0), stopped.worker);
+  EXPECT_EQ(WTERMSIG(status), SIGTERM) << "it did not end when it was asked to";
   EXPECT_TRUE(IsGone(killed) && IsGone(stopped));
   EXPECT_EQ(States(), "running failed waiting0 waiting1 ");
 

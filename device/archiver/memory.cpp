@@ -21,15 +21,16 @@ struct Plan {
   // As measured with 7z 26.02, rounded up.
   std::uint64_t Memory() const {
     constexpr std::uint64_t kProgram = std::uint64_t{16} << 20U;
-    constexpr std::uint64_t kFast = 10;    // times the dictionary
-    constexpr std::uint64_t kSingle = 12;  // the same, of a thorough level
-    constexpr std::uint64_t kBeside = 20;  // with the block's input and output held beside
+    // So many bytes for each byte of the dictionary.
+    constexpr std::uint64_t kFast = 10;
+    constexpr std::uint64_t kSingle = 12;  // at a thorough level, of one block
+    constexpr std::uint64_t kBeside = 20;  // of several, whose input and output are held beside
     const std::uint64_t times = IsFast() ? kFast : blocks == 1 ? kSingle : kBeside;
     return kProgram + times * blocks * (std::uint64_t{1} << dictionary_bits);
   }
 };
 
-// 7z's own choice.
+// What 7z chooses by itself.
 Plan PlanFor(const std::string& level_switch, unsigned int processors) {
   constexpr std::size_t kMarkLength = 3;  // "-mx"
   const int level =

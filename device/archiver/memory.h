@@ -1,3 +1,4 @@
+// How much memory 7z takes, and how it is made to take less.
 #pragma once
 
 #include <cstdint>

@@ -13,7 +13,8 @@ namespace Device {
 // Opens the device. A user whom it does not have is refused. Throws std::runtime_error.
 void OpenFor(const Target& target);
 
-// What the body returns in a process that has the user's identity. Throws Failure with its reason.
+// Runs the body in a process that has the user's identity, and returns what it returns. What it
+// throws is thrown here as Failure.
 Json::Value AskAs(const std::string& user, const std::function<Json::Value()>& body);
 
 // Why a task failed: "PATH: WORDS (CODE)" for each error, the last with the archiver's own reason.
@@ -22,8 +23,8 @@ std::vector<std::string> ErrorLines(const Json::Value& task);
 // The requests that a client of the API makes.
 class Client {
  public:
-  // Opens the device and signs the user in. One that follows its task has its worker's log lines,
-  // and the desktop is not told of the task's end.
+  // Opens the device and signs the user in. A follower waits for its task's end: its worker logs to
+  // the same standard error, and the desktop is not told of the end.
   Client(const Target& target, bool is_follower);
 
   Outcome Ask(const std::string& method, const Json::Value& params);

@@ -11,7 +11,7 @@ namespace Device {
 enum ExitStatus : int {
   kExitDone = 0,
   kExitFailed = 1,   // the API or the job answered an error, or output was lost
-  kExitUsage = 2,    // wrong usage, or no such device
+  kExitUsage = 2,    // wrong usage, or the device cannot be opened or served
   kExitSignal = 128  // and the number of the signal that stopped the job
 };
 

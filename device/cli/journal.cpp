@@ -11,6 +11,7 @@
 #include <cstdlib>
 #include <string>
 
+#include "device/cli/output.h"
 #include "device/platform/host_services.h"
 
 namespace {
@@ -22,6 +23,14 @@ bool IsJournal() {
          journal == std::to_string(status.st_dev) + ":" + std::to_string(status.st_ino);
 }
 
+// The system's own.
+void Pass(int priority, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  vsyslog(priority, format, arguments);
+  va_end(arguments);
+}
+
 }  // namespace
 
 // Called in place of libc's.
@@ -30,13 +39,21 @@ extern "C" void syslog(int priority, const char* format, ...) {
   va_start(arguments, format);
   static const bool is_journal = IsJournal();
   char* text = nullptr;
-  if (!is_journal) {
-    vsyslog(priority, format, arguments);
-  } else if (vasprintf(&text, format, arguments) >= 0) {
+  if (vasprintf(&text, format, arguments) >= 0) {
+    // The name of somebody's file may hold what a terminal obeys, or what looks like another line.
+    std::string line = text;
+    if (!line.empty() && line.back() == '\n') {
+      line.pop_back();
+    }
+    line = Device::Printable(line, line.size());
     const std::string& task = Device::TheHost().task;
-    sd_journal_send("MESSAGE=%s", text, "PRIORITY=%d", LOG_PRI(priority),
-                    "SYSLOG_IDENTIFIER=kavo-device", task.empty() ? nullptr : "TASK=%s",
-                    task.c_str(), nullptr);
+    if (!is_journal) {
+      Pass(priority, "%s", line.c_str());
+    } else {
+      sd_journal_send("MESSAGE=%s", line.c_str(), "PRIORITY=%d", LOG_PRI(priority),
+                      "SYSLOG_IDENTIFIER=kavo-device", task.empty() ? nullptr : "TASK=%s",
+                      task.c_str(), nullptr);
+    }
     std::free(text);
   }
   va_end(arguments);

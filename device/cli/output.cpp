@@ -11,6 +11,7 @@
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/base/utf8.h"
 
 namespace Device {
 
@@ -25,6 +26,14 @@ struct Output : std::stringbuf {
   }
   int error = 0;
 };
+
+// What a terminal obeys, and what turns the direction of what comes after.
+bool IsControl(const std::string& character) {
+  return (character.size() == 1 && (character[0] < ' ' || character[0] == '\x7F')) ||
+         (character >= "\xC2\x80" && character < "\xC2\xA0") ||
+         (character >= "\xE2\x80\xAA" && character <= "\xE2\x80\xAE") ||
+         (character >= "\xE2\x81\xA6" && character <= "\xE2\x81\xA9");
+}
 
 Output& TheOutput() {
   static auto& output = *new Output;  // std::cout has it to the very end
@@ -52,9 +61,13 @@ std::string Printable(const std::string& text, std::size_t most_bytes) {
   while (kept.size() < text.size() && !kept.empty() && (kept[0] & 0xC0) == 0x80) {
     kept.erase(0, 1);  // of a character that was cut
   }
-  const auto is_control = [](unsigned char each) { return each < ' ' || each == 0x7F; };
-  std::replace_if(kept.begin(), kept.end(), is_control, '?');
-  return kept;
+  std::string printable;
+  for (std::size_t at = 0, length = 0; at < kept.size(); at += std::max<std::size_t>(length, 1)) {
+    length = Utf8SequenceLength(kept, at);
+    const std::string character = kept.substr(at, length);
+    printable += length == 0 || IsControl(character) ? "?" : character;
+  }
+  return printable;
 }
 
 std::string Shown(const std::string& name) {

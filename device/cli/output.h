@@ -14,16 +14,16 @@ struct Failure : std::runtime_error {
   using std::runtime_error::runtime_error;
 };
 
-// From now on std::cout writes when it is flushed, and the reason of its first failure is kept, so
-// that nobody takes for printed what was not.
+// From now on std::cout writes when it is flushed, and the reason of its first failure is kept for
+// FinishOutput.
 void WatchOutput();
 
 // To be called at the end: flushes std::cout, and is true when all that was printed is written.
 // When it is not, prints the reason; but when the reader has gone, ends the process by SIGPIPE.
 bool FinishOutput();
 
-// The text's last bytes without what moves a terminal's cursor. No character is wider than its
-// bytes are many.
+// The text's last bytes, so many at most, with "?" for control characters. On a terminal they take
+// no more columns than there are bytes.
 std::string Printable(const std::string& text, std::size_t most_bytes);
 // A name as it goes to standard output: printable on a terminal.
 std::string Shown(const std::string& name);

@@ -13,7 +13,7 @@
 
 namespace Device {
 
-// Thrown where a request has no other answer.
+// The answer to a request that is not served, thrown from wherever that is found.
 struct Refused : std::runtime_error {
   explicit Refused(int http_status, const std::string& reason)
       : std::runtime_error(reason), answer(Refusal(http_status, reason)) {}
@@ -37,13 +37,13 @@ ResolvedPath ResolveForUser(const std::string& user, const std::string& path);
 // Throws Refused.
 FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, struct stat& status);
 
-// How long a request may take: so long, and while the client waits.
+// Ends when the time is up, or the client no longer waits for the answer.
 class Patience {
  public:
   Patience(int stream, std::chrono::seconds time)
       : stream_(stream), end_(std::chrono::steady_clock::now() + time) {}
 
-  // Waits, when there is a source, until something can be read from it.
+  // With a source, waits first until that can be read or patience is over.
   bool IsOver(int source = -1) const;
 
  private:

@@ -12,8 +12,8 @@
 //
 // Of a request with a body the first answer may have the status 100: it is the request's turn. Then
 // the body goes there as it came, in frames that an empty one ends, and the answer comes. An answer
-// to kKindEvents is followed by frames of server-sent events, as the client gets them; one to
-// kKindDownload without a body by a message, the user's name with the file's descriptor.
+// to kKindEvents is followed by frames of server-sent events, as the client gets them; an answer to
+// kKindDownload that has no body, by a message: the user's name with the file's descriptor.
 #pragma once
 
 #include <json/json.h>

@@ -1,6 +1,7 @@
 #include "device/tasks/job_queue.h"
 
 #include <fcntl.h>
+#include <malloc.h>
 #include <poll.h>
 #include <sched.h>
 #include <sys/syscall.h>
@@ -67,8 +68,8 @@ void SetLock(int command, short type, off64_t place) {
   }
 }
 
-// A user can stop a worker of the user's own while it holds the byte. So nobody waits for it for
-// long: without it, a job too many may come to run.
+// A user can stop a worker of the user's own by SIGSTOP while it holds the byte. So nobody waits
+// for the byte for long: without it, a job too many may come to run.
 class Change {
  public:
   Change() {
@@ -83,13 +84,13 @@ class Change {
   Change& operator=(const Change&) = delete;
 };
 
-// The kernel tells one lock of a range, any: what lies beside it is asked for after.
+// The kernel names any one lock of a range: the parts before and behind it are then asked about.
 void AddJobsOfOthers(off64_t first, off64_t last, std::vector<QueuedJob>& jobs) {
   if (first > last) {
     return;
   }
-  // A length of 0 reaches to the end of all files. Locks for reading, of who waits for the job, are
-  // not told.
+  // A length of 0 reaches to the end of all files. Asked so, the kernel names no lock for reading:
+  // those are held by who waits for a job.
   struct flock64 found = Range(F_RDLCK, first, last == kLastByte ? 0 : last - first + 1);
   if (fcntl(TheDevice().queue.Get(), F_GETLK64, &found) != 0) {
     ThrowErrno("queue of jobs");
@@ -114,8 +115,8 @@ bool IsIn(const QueuedJob& job, const std::vector<QueuedJob>& jobs) {
 }
 
 void WaitForEndOfAny(const std::vector<QueuedJob>& jobs) {
-  constexpr int kPauseMs = 50;  // where there are no such descriptors, under emulators
-  int timeout = 3000;           // that one is stopped, nobody tells
+  constexpr int kPauseMs = 50;  // where processes have no descriptors, under emulators
+  int timeout = 3000;           // nobody tells when a signal has stopped one
   std::vector<FileDescriptor> processes;
   std::vector<pollfd> ends;
   for (const QueuedJob& job : jobs) {
@@ -135,11 +136,12 @@ void WaitForEndOfAny(const std::vector<QueuedJob>& jobs) {
 
 QueuedJob own_job;
 
-// The jobs at the time, and whether the own one has come to run.
+// True when it is the own job's turn, which counts as running from now on. `jobs` becomes those
+// there are.
 bool TakeTurn(std::vector<QueuedJob>& jobs) {
   const Change change;
   jobs = JobsOfOthers();
-  // A user who stops a worker must not keep its place from others.
+  // A user who stops a worker by SIGSTOP must not keep its place from others.
   jobs.erase(std::remove_if(jobs.begin(), jobs.end(),
                             [](const QueuedJob& job) { return IsStopped(job.worker); }),
              jobs.end());
@@ -155,8 +157,9 @@ bool TakeTurn(std::vector<QueuedJob>& jobs) {
   return true;
 }
 
-// Until something has changed that this job waits for. Of each user's jobs the first alone waits
-// for the running ones: it would cost too much to wake all at each end.
+// Until something has changed that this job waits for. Of each user's waiting jobs the first alone
+// waits for the running ones, every other for the one before it: to wake all whenever a job ends
+// would cost too much.
 void WaitForChange(const std::vector<QueuedJob>& jobs) {
   const QueuedJob* before = nullptr;  // the user's job that waits before this one
   std::vector<QueuedJob> ahead = NextToRun(jobs, TheDevice().config.jobs_at_once, MostJobs());
@@ -218,6 +221,13 @@ std::uint64_t MemoryOfJob() {
   return (granted != 0 ? granted : InstalledMemory() / 2) / MostJobs();
 }
 
+bool MayEnterQueue(uid_t user) {
+  constexpr int kMostOfUser = 256;  // each is a process
+  const std::vector<QueuedJob> jobs = JobsOfOthers();
+  return std::count_if(jobs.begin(), jobs.end(),
+                       [&](const QueuedJob& job) { return job.user == user; }) < kMostOfUser;
+}
+
 void EnterQueue(uid_t user) {
   const Change change;
   std::uint32_t ticket = 0;
@@ -233,6 +243,7 @@ void EnterQueue(uid_t user) {
 void WaitForTurn() {
   std::vector<QueuedJob> jobs;
   while (!TakeTurn(jobs)) {
+    malloc_trim(0);  // what the request has left, for as long as it may take
     WaitForChange(jobs);
   }
 }

@@ -2,7 +2,8 @@
 //
 // Of one user so many workers run as "jobs_at_once" in device.json says, of the device one more
 // than it has processors. Of those that wait, that worker is next whose user has the fewest at
-// work, and of one user's the one that was started first.
+// work, and of several such the one that was started first. One that a signal has stopped does not
+// count until it goes on.
 //
 // The queue is the set of locks that the workers hold on a file which stays empty; where a lock
 // lies says whose it is. The kernel takes a lock back when its process ends, however that is, so
@@ -29,15 +30,21 @@ struct QueuedJob {
 // the others: by how many of their user's jobs go before them, or are at work.
 std::multimap<std::size_t, QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs);
 
-// The jobs that wait and for which there is room, in order.
+// The jobs that wait and for which there is room, in order, when so many of a user and of the
+// device may run.
 std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t of_user,
                                  std::size_t of_device);
 
-// How many jobs run at most on the open device, and how many bytes of memory each may take.
+// How many jobs run at most on the open device, and how many bytes of memory the 7z of each may
+// take.
 std::size_t MostJobs();
 std::uint64_t MemoryOfJob();
 
-// The calling process's job. To be called in this order, once in a worker's process; each throws
+// False when so many of the user's jobs wait or run that no further one may come.
+bool MayEnterQueue(uid_t user);
+
+// To be called in this order, once in a worker's process: takes a place behind all others, and
+// waits until the job may run. It then counts as running until the process ends. Both throw
 // std::system_error.
 void EnterQueue(uid_t user);
 void WaitForTurn();

@@ -41,7 +41,7 @@ Json::Value Destination(const TaskRow& row) {
 
 // The module stores a fraction of 32 bits, such as 0.28999999; meant are hundredths.
 double Progress(const TaskRow& row) {
-  constexpr double kSteps = 1000;
+  constexpr double kSteps = 100;
   const Json::Value progress = row.Property("progress").Value();
   return progress.isNumeric() ? std::round(progress.asDouble() * kSteps) / kSteps : 0;
 }

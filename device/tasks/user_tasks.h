@@ -38,8 +38,8 @@ pid_t WorkerOf(const TaskRow& row);
 // to 1), "total_size" (bytes), "started" and, of one that has ended, "ended" (seconds since 1970).
 // While it waits, "before": how many jobs come before it; while it runs, "file": what the archiver
 // packs; when it has finished, "archive_size" (bytes); when it has failed, "errors" and "reason":
-// what the archiver said. The last four stand where they are known. No password. `waiting` is what
-// WaitingWorkers says.
+// what the archiver said, or that the job was killed. "file", "archive_size" and "reason" are there
+// when they are known. No password. `waiting` is what WaitingWorkers says.
 Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& waiting);
 
 }  // namespace Device

@@ -73,7 +73,7 @@ class ConnectionThreads : public httplib::TaskQueue {
 // A server whose connections are the above.
 class Server : public httplib::Server {
  public:
-  // Listens there.
+  // Serves the connections that come in on a socket which listens already.
   void Take(int socket) { svr_sock_ = socket; }
 
  private:

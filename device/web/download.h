@@ -1,4 +1,4 @@
-// Files on their way to a client, as long as that takes.
+// Sends files that request processes have opened.
 #pragma once
 
 #include <httplib.h>

@@ -1,5 +1,5 @@
-// The HTTP routes. A route turns a request into a frame for the launcher and its answer into a
-// response; it knows neither users nor files.
+// The HTTP routes. A route passes a request on to the launcher and the answer back to the client;
+// it knows neither who the user is nor what the device holds.
 #pragma once
 
 #include <httplib.h>
@@ -21,7 +21,8 @@ class FrontEnd {
   void Take(int socket) { server_.Take(socket); }
   // Serves until Stop.
   void Listen() { server_.listen_after_bind(); }
-  // Lets the requests that are being served end, for a while.
+  // Refuses new requests, and waits a while for the POST requests that are being served. What else
+  // is under way breaks off when the process ends.
   void Stop();
 
  private:
@@ -40,8 +41,8 @@ class FrontEnd {
   void StreamEvents(const httplib::Request& request, httplib::Response& response);
 
   Server server_;
-  int socket_ = -1;  // the server's
-  std::atomic<int> serving_{0};
+  int socket_ = -1;              // the server's
+  std::atomic<int> serving_{0};  // POST requests
   std::atomic<bool> is_ending_{false};
 };
 

@@ -22,12 +22,12 @@ bool IsForeignHost(const httplib::Request& request);
 // out.
 bool IsForeign(const httplib::Request& request);
 
-// Leaves of the encodings that the client takes the one that is worth its time: the library's first
-// choice takes a hundred times as long. None for a client of HTTP/1.0, to whom an answer has to
-// tell its length.
+// Leaves gzip alone of the encodings that the client takes: the library's first choice takes a
+// hundred times as long. None for a client of HTTP/1.0, to whom an answer has to tell its length.
 void ChooseEncoding(httplib::Headers& headers, const std::string& version);
 
-// False where the library would read a body, of any length, to find no route for it.
+// False for a request that can have a body and has no route: the library would read all of that
+// body, of any length, before it says so.
 bool HasBodyRoute(const httplib::Request& request);
 
 }  // namespace Web

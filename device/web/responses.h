@@ -29,8 +29,8 @@ void Refuse(httplib::Response& response, int status, const std::string& reason);
 // What is said of a status that comes without a body.
 const char* ReasonFor(int status);
 
-// Passes on an answer and what its body is still to bring, part by part: who sends that waits until
-// the client has taken it.
+// Passes on an answer and then its body, part by part: the request process waits until the client
+// has taken a part before it can send more.
 void PassOn(const httplib::Request& request, httplib::Response& response,
             const Device::Answer& answer, const Asking& exchange);
 void PassOn(const httplib::Request& request, httplib::Response& response, const Asking& exchange);

@@ -7,6 +7,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <csignal>
 #include <cstdarg>
 #include <cstring>
 #include <map>
@@ -151,15 +152,16 @@ int CloseProgram(FILE* stream) {
 }
 
 // A process group of its own, and nothing of the request's. Returns when it is the worker's turn.
-void BecomeWorker(Pipe& entered) {
+void BecomeWorker(uid_t user, Pipe& entered) {
   // No session of its own: where the kernel shares out time by sessions, the launcher would get no
   // more than each job does.
   setpgid(0, 0);
+  std::signal(SIGTERM, SIG_DFL);  // the host may have a handler, which ends nothing
   const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   dup2(null.Get(), STDIN_FILENO);
   dup2(null.Get(), STDOUT_FILENO);
   TheHost().leave_request();
-  EnterQueue(TheDevice().config.FindUser(CurrentUser())->uid);
+  EnterQueue(user);
   entered.writer.Close();
   WaitForTurn();
 }
@@ -172,11 +174,16 @@ pid_t ForkWorker() {
   }
   CloseStores();
   try {
+    const uid_t user = TheDevice().config.FindUser(CurrentUser())->uid;
+    if (!MayEnterQueue(user)) {
+      syslog(LOG_ERR, "fork worker: the user has too many jobs");
+      return KlibError(EAGAIN);
+    }
     Pipe entered;  // closes when the worker has its place in the queue, before any that comes later
     ChildProcess worker = ChildProcess::Fork();
     if (worker.Pid() == 0) {
       try {
-        BecomeWorker(entered);
+        BecomeWorker(user, entered);
       } catch (const std::exception& error) {
         syslog(LOG_ERR, "worker: %s", error.what());
         _exit(EXIT_FAILURE);
