@@ -143,19 +143,6 @@ uid_t ReadUid(const ConfigReader& reader, const Json::Value& value) {
   return value.asUInt();
 }
 
-User ReadUser(const ConfigReader& reader, const Json::Value& value) {
-  User user;
-  reader.ReadObject(
-      value, "user",
-      {{"name", [&](const Json::Value& each) { user.name = reader.Name(each); }},
-       {"uid", [&](const Json::Value& each) { user.uid = ReadUid(reader, each); }},
-       {"home", [&](const Json::Value& each) { user.home = reader.Name(each); }}},
-      {{"admin", [&](const Json::Value& each) { user.admin = reader.Bool(each); }},
-       {"codepage", [&](const Json::Value& each) { user.codepage = ReadCodePage(reader, each); }},
-       {"password", [&](const Json::Value& each) { user.password = ReadPassword(reader, each); }}});
-  return user;
-}
-
 Access ReadAccess(const ConfigReader& reader, const Json::Value& value) {
   static const std::map<std::string, Access> kWords = {
       {"rw", Access::kReadWrite}, {"ro", Access::kReadOnly}, {"list-denied", Access::kListDenied}};
@@ -164,29 +151,6 @@ Access ReadAccess(const ConfigReader& reader, const Json::Value& value) {
     reader.Fail(value, "access is one of 'rw', 'ro', 'list-denied'");
   }
   return found->second;
-}
-
-Share ReadShare(const ConfigReader& reader, const Json::Value& value, const Config& config) {
-  Share share;
-  const auto read_access = [&](const Json::Value& access) {
-    if (!access.isObject()) {
-      reader.Fail(access, "'access' is not an object");
-    }
-    for (const std::string& user : access.getMemberNames()) {
-      if (config.FindUser(user) == nullptr) {
-        reader.Fail(access[user], "no user '" + user + "'");
-      }
-      share.access[user] = ReadAccess(reader, access[user]);
-    }
-  };
-  reader.ReadObject(
-      value, "shared folder",
-      {{"name", [&](const Json::Value& each) { share.name = reader.Name(each); }},
-       {"volume", [&](const Json::Value& each) { share.volume = reader.Name(each); }},
-       {"access", read_access}},
-      {{"encrypted", [&](const Json::Value& each) { share.encrypted = reader.Bool(each); }},
-       {"read_only", [&](const Json::Value& each) { share.read_only = reader.Bool(each); }}});
-  return share;
 }
 
 void CheckVolume(const ConfigReader& reader, const Json::Value& where, const Config& config,
@@ -206,7 +170,15 @@ void AddVolume(const ConfigReader& reader, const Json::Value& value, Config& con
 }
 
 void AddUser(const ConfigReader& reader, const Json::Value& value, Config& config) {
-  User user = ReadUser(reader, value);
+  User user;
+  reader.ReadObject(
+      value, "user",
+      {{"name", [&](const Json::Value& each) { user.name = reader.Name(each); }},
+       {"uid", [&](const Json::Value& each) { user.uid = ReadUid(reader, each); }},
+       {"home", [&](const Json::Value& each) { user.home = reader.Name(each); }}},
+      {{"admin", [&](const Json::Value& each) { user.admin = reader.Bool(each); }},
+       {"codepage", [&](const Json::Value& each) { user.codepage = ReadCodePage(reader, each); }},
+       {"password", [&](const Json::Value& each) { user.password = ReadPassword(reader, each); }}});
   CheckVolume(reader, value, config, user.home);
   for (const User& other : config.users) {
     if (other.name == user.name || other.uid == user.uid) {
@@ -217,7 +189,25 @@ void AddUser(const ConfigReader& reader, const Json::Value& value, Config& confi
 }
 
 void AddShare(const ConfigReader& reader, const Json::Value& value, Config& config) {
-  Share share = ReadShare(reader, value, config);
+  Share share;
+  const auto read_access = [&](const Json::Value& access) {
+    if (!access.isObject()) {
+      reader.Fail(access, "'access' is not an object");
+    }
+    for (const std::string& user : access.getMemberNames()) {
+      if (config.FindUser(user) == nullptr) {
+        reader.Fail(access[user], "no user '" + user + "'");
+      }
+      share.access[user] = ReadAccess(reader, access[user]);
+    }
+  };
+  reader.ReadObject(
+      value, "shared folder",
+      {{"name", [&](const Json::Value& each) { share.name = reader.Name(each); }},
+       {"volume", [&](const Json::Value& each) { share.volume = reader.Name(each); }},
+       {"access", read_access}},
+      {{"encrypted", [&](const Json::Value& each) { share.encrypted = reader.Bool(each); }},
+       {"read_only", [&](const Json::Value& each) { share.read_only = reader.Bool(each); }}});
   CheckVolume(reader, value, config, share.volume);
   if (config.FindShare(share.name) != nullptr || kReservedShares.count(share.name) != 0) {
     reader.Fail(value, "the name '" + share.name + "' is taken");
