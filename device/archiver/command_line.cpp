@@ -12,9 +12,7 @@ constexpr char kProgress[] = "-progress";
 constexpr char kPassword[] = "-p";
 constexpr char kAdd[] = "a";
 
-bool StartsWith(const std::string& text, const char* prefix) {
-  return text.compare(0, std::strlen(prefix), prefix) == 0;
-}
+bool StartsWith(const std::string& text, const char* prefix) { return text.rfind(prefix, 0) == 0; }
 
 // "-progress" is the last argument; anywhere else it is the password "rogress".
 bool IsPassword(const std::string& argument, bool last) {

@@ -4,22 +4,13 @@
 #include <string_view>
 
 #include "device/archiver/failure.h"
+#include "device/base/for_each_part.h"
 #include "device/base/utf8.h"
 
 namespace Archiver {
 namespace {
 
 constexpr char kCannotPack[] = "cannot pack";
-
-// Calls `use` for each part of `text` between separators, the last one included.
-template <typename Use>
-void ForEachPart(std::string_view text, char separator, Use use) {
-  for (size_t begin = 0; begin <= text.size();) {
-    const size_t end = std::min(text.find(separator, begin), text.size());
-    use(text.substr(begin, end - begin));
-    begin = end + 1;
-  }
-}
 
 [[noreturn]] void Refuse(std::string_view line, const char* reason) {
   throw NamedFailure(kCannotPack, std::string(line), reason);
@@ -33,7 +24,7 @@ std::string Normalize(std::string_view line) {
     Refuse(line, "the name holds a zero byte");
   }
   std::string path;
-  ForEachPart(line, '/', [&](std::string_view part) {
+  Device::ForEachPart(line, "/", [&](std::string_view part) {
     if (part == "..") {
       Refuse(line, "leads out of the working directory");
     }
@@ -61,7 +52,7 @@ bool HasAncestorIn(const std::unordered_set<std::string>& names, const std::stri
 std::vector<std::string> ReadSources(const std::string& text, const std::string& list_path) {
   std::vector<std::string> listed;
   std::unordered_set<std::string> known;
-  ForEachPart(text, '\n', [&](std::string_view line) {
+  Device::ForEachPart(text, "\n", [&](std::string_view line) {
     if (!line.empty()) {
       const auto [name, is_new] = known.insert(Normalize(line));
       if (is_new) {

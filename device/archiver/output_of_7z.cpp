@@ -1,9 +1,11 @@
 #include "device/archiver/output_of_7z.h"
 
 #include <algorithm>
+#include <charconv>
 #include <cstring>
 
 #include "device/archiver/failure.h"
+#include "device/base/for_each_part.h"
 
 namespace Archiver {
 namespace {
@@ -13,16 +15,9 @@ constexpr char kTotal[] = "Add new data to archive: ";
 
 // The number that ends right before `end`; false when there is none.
 bool NumberBefore(std::string_view text, size_t end, uint64_t* number) {
-  size_t begin = std::min(end, text.size());
-  end = begin;
-  while (begin > 0 && text[begin - 1] >= '0' && text[begin - 1] <= '9') {
-    --begin;
-  }
-  if (begin == end || end - begin > 19) {
-    return false;
-  }
-  *number = std::stoull(std::string(text.substr(begin, end - begin)));
-  return true;
+  text = text.substr(0, end);
+  text.remove_prefix(text.find_last_not_of("0123456789") + 1);
+  return std::from_chars(text.data(), text.data() + text.size(), *number).ec == std::errc();
 }
 
 // A progress text is "  0M Scan " or " 84% 12 + name": it starts with blanks or digits, as no line
@@ -158,15 +153,12 @@ bool ErrorText::HasWarning() const {
 
 std::string ErrorText::Line() const {
   std::vector<std::string> said;
-  for (size_t begin = 0; begin < text_.size();) {
-    const size_t end = std::min(text_.find('\n', begin), text_.size());
-    const std::string line = WithoutHeading(text_.substr(begin, end - begin));
-    begin = end + 1;
-    const std::string explained = line.empty() ? line : Explain(line);
+  Device::ForEachPart(text_, "\n", [&](std::string_view part) {
+    const std::string explained = Explain(WithoutHeading(std::string(part)));
     if (!explained.empty() && std::find(said.begin(), said.end(), explained) == said.end()) {
       said.push_back(explained);
     }
-  }
+  });
   std::string result;
   for (const std::string& line : said) {
     result += (result.empty() ? "" : "; ") + line;

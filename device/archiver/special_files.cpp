@@ -27,10 +27,6 @@ namespace {
 constexpr char kCannotRead[] = "cannot read";
 constexpr int kOpenFolder = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
 
-struct CloseDir {
-  void operator()(DIR* dir) const { closedir(dir); }
-};
-
 struct stat Status(int folder, const char* path, int flags) {
   struct stat info {};
   if (fstatat(folder, path, &info, flags) != 0) {
@@ -77,7 +73,7 @@ class Scan {
   }
 
   void VisitFolder(int fd, const std::string& path) {
-    const std::unique_ptr<DIR, CloseDir> dir(fd < 0 ? nullptr : fdopendir(fd));
+    const std::unique_ptr<DIR, int (*)(DIR*)> dir(fd < 0 ? nullptr : fdopendir(fd), closedir);
     if (!dir) {
       throw SystemFailure(kCannotRead, path, errno);
     }

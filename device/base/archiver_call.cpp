@@ -16,18 +16,15 @@ constexpr char kMade[] = "made";
 constexpr std::size_t kBlock = 8192;
 constexpr std::size_t kMostCallBytes = 128 << 10U;  // what the socket holds before anybody reads
 
-void Add(std::string& texts, const std::string& text) { texts.append(text).push_back('\0'); }
-
 }  // namespace
 
 bool SendArchiverCall(int socket, const ArchiverCall& call) {
+  std::vector<std::string> fields = {call.password, call.work_folder,
+                                     std::to_string(call.zip_program), std::to_string(call.memory)};
+  fields.insert(fields.end(), call.fixed_folders.begin(), call.fixed_folders.end());
   std::string texts;
-  Add(texts, call.password);
-  Add(texts, call.work_folder);
-  Add(texts, std::to_string(call.zip_program));
-  Add(texts, std::to_string(call.memory));
-  for (const std::string& folder : call.fixed_folders) {
-    Add(texts, folder);
+  for (const std::string& field : fields) {
+    texts.append(field).push_back('\0');
   }
   // The length of what waits in a socket can be asked for by anybody.
   texts.resize((texts.size() / kBlock + 1) * kBlock, '\0');

@@ -13,7 +13,6 @@ namespace Device {
 
 namespace {
 
-constexpr char kHexDigits[] = "0123456789abcdef";
 constexpr int kHexBase = 16;
 
 const Json::StreamWriterBuilder& LineWriter() {
@@ -104,10 +103,9 @@ std::string ToUtf8Text(const Json::Value& value) {
       at += length;
       continue;
     }
-    const auto byte = static_cast<unsigned char>(text[at++]);
-    safe += "\\udc";
-    safe += kHexDigits[byte / kHexBase];
-    safe += kHexDigits[byte % kHexBase];
+    char escape[sizeof "\\udc80"];
+    std::snprintf(escape, sizeof escape, "\\udc%02x", static_cast<unsigned char>(text[at++]));
+    safe += escape;
   }
   return safe;
 }

@@ -11,6 +11,7 @@
 #include <system_error>
 #include <utility>
 
+#include "device/base/for_each_part.h"
 #include "device/base/open_below.h"
 #include "device/platform/lumo/errors.h"
 #include "device/platform/lumo/identity.h"
@@ -26,21 +27,16 @@ constexpr std::size_t kEncryptedNameMax = 143;
 
 // The path's parts. False when ".." leads above the first of them, the shared folder.
 bool SplitUserPath(std::string_view path, std::vector<std::string_view>& parts) {
-  std::size_t begin = 0;
-  while (begin < path.size()) {
-    const std::size_t end = std::min(path.find('/', begin), path.size());
-    const std::string_view part = path.substr(begin, end - begin);
-    begin = end + 1;
+  bool is_inside = true;
+  ForEachPart(path, "/", [&](std::string_view part) {
     if (part == "..") {
-      if (parts.size() <= 1) {
-        return false;
-      }
-      parts.pop_back();
+      is_inside = is_inside && parts.size() > 1;
+      parts.resize(parts.size() - (is_inside ? 1 : 0));
     } else if (!part.empty() && part != ".") {
       parts.push_back(part);
     }
-  }
-  return true;
+  });
+  return is_inside;
 }
 
 // Fills in the shared folder's fields. False when there is none of that name, or no such user.
@@ -111,13 +107,9 @@ int CheckFileName(const std::string& directory, const std::string& name) {
 
 // The common leading part of two folders that end in "/".
 std::string CommonFolder(const std::string& one, const std::string& other) {
-  std::size_t end = 0;
-  for (std::size_t at = 0; at < std::min(one.size(), other.size()) && one[at] == other[at]; ++at) {
-    if (one[at] == '/') {
-      end = at + 1;
-    }
-  }
-  return one.substr(0, end);
+  const auto end = std::mismatch(one.begin(), one.end(), other.begin(), other.end()).first;
+  const std::string common(one.begin(), end);
+  return common.substr(0, common.rfind('/') + 1);
 }
 
 std::string sources_folder;

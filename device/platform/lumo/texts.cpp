@@ -4,6 +4,7 @@
 #include <stdexcept>
 #include <utility>
 
+#include "device/base/for_each_part.h"
 #include "device/base/json_text.h"
 #include "device/platform/operations.h"
 #include "platform/lumo/file_manager.h"
@@ -16,19 +17,19 @@ constexpr int kFirstVersionWithArrays = 2;
 
 Json::Value SplitText(const std::string& text, const std::string& separator) {
   Json::Value pieces(Json::arrayValue);
-  std::size_t begin = 0;
-  while (begin <= text.size()) {
-    const std::size_t end = std::min(text.find(separator, begin), text.size());
-    if (end > begin) {
-      pieces.append(text.substr(begin, end - begin));
+  ForEachPart(text, separator, [&](std::string_view piece) {
+    if (!piece.empty()) {
+      pieces.append(std::string(piece));
     }
-    begin = end + separator.size();
-  }
+  });
   return pieces;
 }
 
-// The array itself when every element is a text that can be a path, else an empty one.
+// The value itself when it is an array of texts that can be paths, else an empty one.
 Json::Value OnlyTexts(Json::Value array) {
+  if (!array.isArray()) {
+    return {Json::arrayValue};
+  }
   for (const Json::Value& element : array) {
     const char* begin = nullptr;
     const char* end = nullptr;
@@ -40,17 +41,13 @@ Json::Value OnlyTexts(Json::Value array) {
 }
 
 Json::Value Explode(const Json::Value& value, const std::string& separator, int version) {
-  if (value.isArray()) {
-    return OnlyTexts(value);
-  }
   if (!value.isString()) {
-    return {Json::arrayValue};
+    return OnlyTexts(value);
   }
   std::string text = value.asString();
   if (version >= kFirstVersionWithArrays && !text.empty() && text[0] == '[') {
     try {
-      Json::Value array = ParseJson(DecodeByteEscapes(std::move(text)), kTextDepth, kMostValues);
-      return array.isArray() ? OnlyTexts(std::move(array)) : Json::Value(Json::arrayValue);
+      return OnlyTexts(ParseJson(DecodeByteEscapes(std::move(text)), kTextDepth, kMostValues));
     } catch (const std::runtime_error&) {
       return {Json::arrayValue};  // begins like an array and is none
     }
