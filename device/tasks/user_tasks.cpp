@@ -1,13 +1,12 @@
 #include "device/tasks/user_tasks.h"
 
-#include <syslog.h>
-
 #include <algorithm>
 #include <cmath>
 #include <iterator>
 #include <utility>
 
 #include "device/base/json_text.h"
+#include "device/base/try_or_log.h"
 #include "device/model/device.h"
 #include "device/tasks/workers.h"
 #include "platform/kavo/error_codes.h"
@@ -77,11 +76,11 @@ void StoreFailure(const std::string& user, TaskRow& row) {
   StoredValue data = row.Property(kPropData);
   data.members[kDataErrors] = ToText(GeneralError(row));
   const std::int64_t version = row.version;
-  try {
+  const bool is_tried = TryOrLog("end of a killed worker", [&] {
     const Json::Value news = JsonObject({{kArchiverReason, "the job was killed"}});
     StoreOf(user).UpdateTask(row, {{kPropData, data}, {kPropArchiver, news}}, true);
-  } catch (const std::exception& error) {
-    syslog(LOG_ERR, "end of a killed worker: %s", error.what());
+  });
+  if (!is_tried) {
     row.properties[kPropData] = std::move(data);
     row.finished = true;
     row.version = version;

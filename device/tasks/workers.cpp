@@ -3,7 +3,6 @@
 #include <dirent.h>
 #include <poll.h>
 #include <sys/syscall.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -20,6 +19,7 @@
 
 #include "device/base/file_descriptor.h"
 #include "device/base/file_io.h"
+#include "device/base/try_or_log.h"
 #include "device/tasks/task_store.h"
 
 namespace Device {
@@ -141,11 +141,8 @@ bool EndWorker(const std::string& user, pid_t pid) {
   if (error == ESRCH || !IsWorkerAlive(user, pid)) {
     return true;  // it has ended already, and an archiver that nobody reads from ends by itself
   }
-  try {  // a store without room keeps no job from being stopped
-    StoreOf(user).NoteStop(pid);
-  } catch (const std::exception& no_room) {
-    syslog(LOG_ERR, "stop: %s", no_room.what());
-  }
+  // A store without room keeps no job from being stopped.
+  TryOrLog("stop", [&] { StoreOf(user).NoteStop(pid); });
   const Clock::time_point deadline = Clock::now() + kGrace;
   const bool is_told = has_descriptor
                            ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0

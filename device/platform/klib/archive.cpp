@@ -13,6 +13,7 @@
 
 #include "device/base/archiver_call.h"
 #include "device/base/open_below.h"
+#include "device/base/try_or_log.h"
 #include "device/base/work_folder.h"
 #include "device/model/device.h"
 #include "device/platform/lumo/identity.h"
@@ -75,13 +76,11 @@ Arguments TakeApart(char* const* argument) {
 // So that it is removed when this worker and its archiver are killed.
 void NoteWhatIsLeft(const Arguments& arguments, const std::string& work_folder) {
   const std::string& archive = arguments.archive;
-  try {
+  TryOrLog("archiver", [&] {
     StoreOf(CurrentUser())
         .AddLeftovers(
             {0, getpid(), arguments.list, archive.substr(0, archive.rfind('/')), work_folder});
-  } catch (const std::exception& error) {
-    syslog(LOG_ERR, "archiver: %s", error.what());
-  }
+  });
 }
 
 }  // namespace

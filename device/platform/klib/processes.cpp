@@ -18,6 +18,7 @@
 
 #include "device/base/child_process.h"
 #include "device/base/file_descriptor.h"
+#include "device/base/try_or_log.h"
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
 #include "device/platform/klib/archive.h"
@@ -167,11 +168,7 @@ void BecomeWorker(uid_t user, Pipe& entered) {
 }
 
 pid_t ForkWorker() {
-  try {
-    RemoveLeftovers(CurrentUser());
-  } catch (const std::exception& error) {
-    syslog(LOG_ERR, "leftovers: %s", error.what());
-  }
+  TryOrLog("leftovers", [] { RemoveLeftovers(CurrentUser()); });
   CloseStores();
   try {
     const uid_t user = TheDevice().config.FindUser(CurrentUser())->uid;
@@ -182,10 +179,7 @@ pid_t ForkWorker() {
     Pipe entered;  // closes when the worker has its place in the queue, before any that comes later
     ChildProcess worker = ChildProcess::Fork();
     if (worker.Pid() == 0) {
-      try {
-        BecomeWorker(user, entered);
-      } catch (const std::exception& error) {
-        syslog(LOG_ERR, "worker: %s", error.what());
+      if (!TryOrLog("worker", [&] { BecomeWorker(user, entered); })) {
         _exit(EXIT_FAILURE);
       }
     } else {

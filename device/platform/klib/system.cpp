@@ -2,7 +2,6 @@
 #include "platform/klib/system.h"
 
 #include <sys/stat.h>
-#include <syslog.h>
 
 #include <algorithm>
 #include <cctype>
@@ -10,6 +9,7 @@
 #include <cstring>
 
 #include "device/base/open_below.h"
+#include "device/base/try_or_log.h"
 #include "device/model/device.h"
 #include "device/platform/klib/archive.h"
 #include "device/platform/klib/klib_error.h"
@@ -38,15 +38,12 @@ int IsAdmin(const char* name) {
 }
 
 int AddToIndex(const char* path) {
-  try {
+  const bool is_done = TryOrLog("file index", [&] {
     if (OpenArchive(path)) {
       StoreOf(CurrentUser()).AddToIndex(path);
     }
-    return 0;
-  } catch (const std::exception& error) {
-    syslog(LOG_ERR, "file index: %s", error.what());
-    return KlibError(EIO);
-  }
+  });
+  return is_done ? 0 : KlibError(EIO);
 }
 
 int SetMode(const char* path, mode_t mode) {

@@ -1,6 +1,5 @@
 // What the task manager's library offers beside its classes: waiting, saving, removing, killing.
 #include <malloc.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -13,6 +12,7 @@
 #include <thread>
 
 #include "device/base/json_text.h"
+#include "device/base/try_or_log.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
 #include "device/platform/vesk/task_state.h"
@@ -124,22 +124,18 @@ void LumoLibRemoveFinishedTask(Vesk::Task* task, int pid, bool reserved) {
 
 void CleanTimeOutTasks(const char* user) {
   Operation("CleanTimeOutTasks", user).Run([&] {
-    try {
+    Device::TryOrLog("clean tasks", [&] {
       Device::RemoveStaleTasks(user);
       Device::StoreOf(user).NoteEnd(getpid());  // a worker's last call
-    } catch (const std::exception& error) {
-      syslog(LOG_ERR, "clean tasks: %s", error.what());
-    }
+    });
   });
 }
 
 int DoKill(int pid) {
   return Operation("DoKill", pid).Run([&] {
-    try {
-      return Device::EndWorker(Device::CurrentUser(), pid) ? 1 : 0;
-    } catch (const std::exception& error) {
-      syslog(LOG_ERR, "kill worker: %s", error.what());
-      return 0;
-    }
+    bool is_gone = false;
+    Device::TryOrLog("kill worker",
+                     [&] { is_gone = Device::EndWorker(Device::CurrentUser(), pid); });
+    return is_gone ? 1 : 0;
   });
 }

@@ -9,6 +9,7 @@
 #include <utility>
 
 #include "device/base/random_id.h"
+#include "device/base/try_or_log.h"
 #include "device/platform/host_services.h"
 #include "device/platform/klib/archive.h"
 #include "device/platform/operations.h"
@@ -33,17 +34,13 @@ const std::map<std::string, std::size_t> kArgumentCounts = {
     {"filebrowser:filebrowser_compress_completed", 1},
     {"filebrowser:filebrowser_compress_failed", 2}};
 
-void LogFailure(const char* operation, const std::exception& error) {
-  syslog(LOG_ERR, "%s: %s", operation, error.what());
-}
-
 // Says why the store cannot serve; the module may keep the exception to itself.
 template <typename Body>
 auto LogAndThrow(const char* operation, Body body) {
   try {
     return body();
   } catch (const std::exception& error) {
-    LogFailure(operation, error);
+    syslog(LOG_ERR, "%s: %s", operation, error.what());
     throw;
   }
 }
@@ -91,13 +88,13 @@ bool Task::State::StoreNow(std::map<std::string, Device::StoredValue> properties
   if (const Json::Value news = NewsOfArchiver(); !news.empty()) {
     properties[Device::kPropArchiver] = news;
   }
-  try {
-    return Device::StoreOf(user).UpdateTask(row, std::move(properties), is_finished);
-  } catch (const std::exception& error) {
-    LogFailure("store task", error);
+  bool is_stored = false;
+  if (!Device::TryOrLog("store task", [&] {
+        is_stored = Device::StoreOf(user).UpdateTask(row, std::move(properties), is_finished);
+      })) {
     Forget();
-    return false;
   }
+  return is_stored;
 }
 
 void Task::State::Forget() {
@@ -111,23 +108,17 @@ void Task::State::Forget() {
 }
 
 bool Task::State::Reload() {
-  try {
-    if (!Device::StoreOf(user).RefreshTask(row)) {
-      row.properties.clear();
-      return false;
-    }
-  } catch (const std::exception& error) {
-    LogFailure("reload task", error);
+  bool is_there = true;
+  Device::TryOrLog("reload task", [&] { is_there = Device::StoreOf(user).RefreshTask(row); });
+  if (!is_there) {
+    row.properties.clear();
   }
-  return true;
+  return is_there;
 }
 
 void Task::State::Remove() {
-  try {
-    Device::StoreOf(user).RemoveTask(row.id, Device::WorkerOf(row));
-  } catch (const std::exception& error) {
-    LogFailure("remove task", error);
-  }
+  Device::TryOrLog("remove task",
+                   [&] { Device::StoreOf(user).RemoveTask(row.id, Device::WorkerOf(row)); });
 }
 
 Task::Task(const char* user, const char* task_id) : state(nullptr) {
@@ -211,11 +202,8 @@ void Task::sendNotifyMessageNoEncode(const char* app, const char* task_id, const
   va_end(arguments);
   Operation("Vesk::Task::sendNotifyMessageNoEncode", app, task_id, title, message, row.arguments)
       .Run([&] {
-        try {
-          Device::StoreOf(state->user).AddNotification(row);
-        } catch (const std::exception& error) {
-          LogFailure("send notification", error);
-        }
+        Device::TryOrLog("send notification",
+                         [&] { Device::StoreOf(state->user).AddNotification(row); });
       });
 }
 
