@@ -1,62 +1,51 @@
 #include "device/host/request_queue.h"
 
 #include <algorithm>
+#include <cstddef>
 #include <iterator>
 #include <utility>
 
 namespace Device {
 
-struct RequestQueue::Limits {
-  std::size_t of_one;
-  std::size_t of_all;
-  std::size_t reserve;  // of these, for clients that have none
-};
-
-bool RequestQueue::HasRoom(const std::string& client, std::size_t Counts::*kind,
-                           const Limits& limits) const {
-  const auto found = counts_.find(client);
-  const std::size_t has = found == counts_.end() ? 0 : found->second.*kind;
-  return has < limits.of_one &&
-         all_.*kind < (has == 0 ? limits.of_all : limits.of_all - limits.reserve);
-}
-
-bool RequestQueue::MayRun(const Asker& asker) const {
+bool RequestQueue::HasRoom(const Asker& asker, bool is_to_run) const {
+  struct Limits {
+    std::size_t of_one;
+    std::size_t of_all;
+    std::size_t reserve;  // of these, for clients that have none
+  };
   constexpr Limits kRunning = {8, 128, 16};
   constexpr Limits kStreams = {16, 256, 32};
-  return asker.is_stream ? HasRoom(asker.client, &Counts::streams, kStreams)
-                         : HasRoom(asker.client, &Counts::running, kRunning);
-}
-
-void RequestQueue::Count(const std::string& client, std::size_t Counts::*kind, int change) {
-  Counts& counts = counts_[client];
-  counts.*kind += static_cast<std::size_t>(change);
-  all_.*kind += static_cast<std::size_t>(change);
-  if (counts.running + counts.streams + counts.waiting == 0) {
-    counts_.erase(client);
+  constexpr Limits kWaiting = {128, 768, 128};
+  const Limits& limits = asker.is_stream ? kStreams : is_to_run ? kRunning : kWaiting;
+  std::size_t all = 0;
+  std::size_t of_one = 0;
+  for (const Entry& each : entries_) {
+    if ((each.pid != 0) == is_to_run && each.asker.is_stream == asker.is_stream) {
+      ++all;
+      of_one += each.asker.client == asker.client ? 1 : 0;
+    }
   }
+  return of_one < limits.of_one &&
+         all < (of_one == 0 ? limits.of_all : limits.of_all - limits.reserve);
 }
 
 bool RequestQueue::Add(const Asker& asker, Start start) {
-  constexpr Limits kWaiting = {128, 768, 128};
-  if (asker.is_stream ? !MayRun(asker) : !HasRoom(asker.client, &Counts::waiting, kWaiting)) {
+  if (!HasRoom(asker, asker.is_stream)) {
     return false;
   }
-  waiting_.push_back({asker, std::move(start)});
-  Count(asker.client, &Counts::waiting, 1);
+  entries_.push_back({asker, std::move(start)});
   StartThoseWhoMay();
   return true;
 }
 
 void RequestQueue::StartThoseWhoMay() {
-  for (auto each = waiting_.begin(); each != waiting_.end();) {
+  for (auto each = entries_.begin(); each != entries_.end();) {
     const auto next = std::next(each);
-    if (MayRun(each->asker)) {
-      const Waiting taken = std::move(*each);  // out of what its process forgets
-      waiting_.erase(each);
-      Count(taken.asker.client, &Counts::waiting, -1);
-      if (const pid_t pid = taken.start(); pid > 0) {
-        Count(taken.asker.client, taken.asker.is_stream ? &Counts::streams : &Counts::running, 1);
-        running_.emplace(pid, taken.asker);
+    if (each->pid == 0 && HasRoom(each->asker, true)) {
+      const Start start = std::move(each->start);  // out of what its process forgets
+      each->pid = start();
+      if (each->pid <= 0) {
+        entries_.erase(each);
       }
     }
     each = next;
@@ -64,23 +53,18 @@ void RequestQueue::StartThoseWhoMay() {
 }
 
 void RequestQueue::TakeEnd(pid_t pid) {
-  if (const auto found = running_.find(pid); found != running_.end()) {
-    const Asker asker = std::move(found->second);
-    running_.erase(found);
-    Count(asker.client, asker.is_stream ? &Counts::streams : &Counts::running, -1);
+  const auto has_ended = [pid](const Entry& each) { return each.pid == pid; };
+  const auto found = std::find_if(entries_.begin(), entries_.end(), has_ended);
+  if (found != entries_.end()) {
+    entries_.erase(found);
     StartThoseWhoMay();
   }
 }
 
 bool RequestQueue::HasStream(const std::string& session) const {
-  return std::any_of(running_.begin(), running_.end(), [&](const auto& each) {
-    return each.second.is_stream && each.second.session == session;
+  return std::any_of(entries_.begin(), entries_.end(), [&](const Entry& each) {
+    return each.asker.is_stream && each.asker.session == session;
   });
-}
-
-void RequestQueue::Clear() {
-  running_.clear();
-  waiting_.clear();
 }
 
 }  // namespace Device

@@ -4,10 +4,8 @@
 
 #include <sys/types.h>
 
-#include <cstddef>
 #include <functional>
 #include <list>
-#include <map>
 #include <string>
 
 namespace Device {
@@ -30,29 +28,20 @@ class RequestQueue {
   void TakeEnd(pid_t pid);
   bool HasStream(const std::string& session) const;
   // Forgets them all, in a child process.
-  void Clear();
+  void Clear() { entries_.clear(); }
 
  private:
-  struct Counts {
-    std::size_t running = 0;
-    std::size_t streams = 0;
-    std::size_t waiting = 0;
-  };
-  struct Limits;
-  struct Waiting {
+  struct Entry {
     Asker asker;
     Start start;
+    pid_t pid = 0;  // 0: waits
   };
 
-  bool HasRoom(const std::string& client, std::size_t Counts::*kind, const Limits& limits) const;
-  bool MayRun(const Asker& asker) const;
-  void Count(const std::string& client, std::size_t Counts::*kind, int change);
+  // For one more, which runs or waits.
+  bool HasRoom(const Asker& asker, bool is_to_run) const;
   void StartThoseWhoMay();
 
-  std::map<std::string, Counts> counts_;  // by client
-  Counts all_;
-  std::map<pid_t, Asker> running_;
-  std::list<Waiting> waiting_;
+  std::list<Entry> entries_;  // in the order in which they came
 };
 
 }  // namespace Device
