@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <atomic>
 #include <functional>
+#include <list>
 #include <memory>
 #include <new>
 #include <vector>
@@ -19,7 +20,7 @@ namespace Device {
 namespace {
 
 constexpr int kSessionIdWords = 4;
-constexpr std::size_t kMostSessions = 16;  // of one user
+constexpr int kMostSessions = 16;  // of one user
 constexpr int kFreeTries = 10;
 constexpr std::chrono::seconds kLongestWait(60);
 constexpr char kNobodysHash[] = "$6$nobody$";
@@ -38,57 +39,50 @@ std::shared_ptr<Flag> MakeSharedFlag() {
 }
 
 struct Session {
+  std::string id;
   std::string user;
-  std::uint64_t number = 0;  // in the order of signing in
   std::shared_ptr<Flag> has_ended = MakeSharedFlag();
 };
 
-// By id.
-std::map<std::string, Session>& Sessions() {
-  static std::map<std::string, Session> sessions;
+// In the order of signing in.
+std::list<Session>& Sessions() {
+  static std::list<Session> sessions;
   return sessions;
 }
 
-void EndOldestOf(const std::string& user) {
-  std::map<std::uint64_t, std::string> ids;  // of the user's sessions, by number
-  for (const auto& [id, session] : Sessions()) {
-    if (session.user == user) {
-      ids.emplace(session.number, id);
-    }
-  }
-  if (ids.size() >= kMostSessions) {
-    SignOut(ids.begin()->second);
-  }
+auto Find(const std::string& id) {
+  return std::find_if(Sessions().begin(), Sessions().end(),
+                      [&](const Session& each) { return each.id == id; });
 }
 
 }  // namespace
 
 std::string SignIn(const std::string& user) {
-  EndOldestOf(user);
-  static std::uint64_t number = 0;
-  std::string id = RandomId(kSessionIdWords);
-  Sessions().emplace(id, Session{user, ++number});
-  return id;
+  auto& sessions = Sessions();
+  const auto is_users = [&](const Session& each) { return each.user == user; };
+  if (std::count_if(sessions.begin(), sessions.end(), is_users) >= kMostSessions) {
+    SignOut(std::find_if(sessions.begin(), sessions.end(), is_users)->id);
+  }
+  sessions.push_back({RandomId(kSessionIdWords), user});
+  return sessions.back().id;
 }
 
 void SignOut(const std::string& session_id) {
-  auto& sessions = Sessions();
-  if (const auto found = sessions.find(session_id); found != sessions.end()) {
-    found->second.has_ended->store(true);
-    sessions.erase(found);
+  if (const auto found = Find(session_id); found != Sessions().end()) {
+    found->has_ended->store(true);
+    Sessions().erase(found);
   }
 }
 
 void KeepSessions() {
-  for (auto& [id, session] : Sessions()) {
+  for (Session& session : Sessions()) {
     session.has_ended = std::make_shared<Flag>(session.has_ended->load());
   }
 }
 
 std::string UserOfSession(const std::string& session_id) {
-  const auto& sessions = Sessions();
-  const auto found = sessions.find(session_id);
-  return found == sessions.end() || *found->second.has_ended ? "" : found->second.user;
+  const auto found = Find(session_id);
+  return found == Sessions().end() || *found->has_ended ? "" : found->user;
 }
 
 namespace {
