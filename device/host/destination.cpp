@@ -14,32 +14,19 @@ namespace Device {
 
 namespace {
 
-constexpr int kPrivilegeWrite = 2;
-constexpr int kFlagWriteSuspended = 0x2;
-constexpr int kCheckPathFlags = 32;
 constexpr int kAccessWrite = 2;
 
 // In the order of the worker's questions. 0, or a KAVO::ErrorCode.
-int CheckFolder(const std::string& user, const std::string& session_id, const std::string& path,
-                std::string& full_path) {
-  std::string in_home;
-  std::string unused[2];
-  if (LumoFullPathGet(path.c_str(), &full_path, &in_home, &unused[0], &unused[1], &user, "UTF-8") ==
-      0) {
-    return LumoLibGetErr();
+int CheckFolder(const std::string& user, const ResolvedPath& path, const std::string& folder) {
+  if (path.error != 0) {
+    return path.error;
   }
-  int level = kPrivilegeWrite;
-  int flags = 0;
-  if (IsDirUserHome(in_home, nullptr) == 0 &&
-      LumoLibGetPrivilege(path.c_str(), user.c_str(), session_id.c_str(), &level, &flags) != 0) {
-    return LumoLibGetErr();
-  }
-  if (level != kPrivilegeWrite || (flags & kFlagWriteSuspended) != 0) {
+  if (AccessOf(path, user) != Access::kReadWrite ||
+      (path.share != nullptr && path.share->read_only)) {
     return KAVO::kErrNoPrivilege;
   }
-  const std::string folder = full_path.substr(0, full_path.rfind('/'));
   const bool is_good =
-      LumoCheckPath(folder.c_str(), false, kCheckPathFlags, nullptr, true, false, nullptr) == 0 &&
+      LumoCheckPath(folder.c_str(), false, 0, nullptr, true, false, nullptr) == 0 &&
       ACLAccess(folder.c_str(), kAccessWrite) == 0;
   return is_good ? 0 : LumoLibGetErr();
 }
@@ -74,19 +61,18 @@ std::string FreeName(const FileDescriptor& folder, const std::string& name) {
 
 }  // namespace
 
-Json::Value CheckDestination(const std::string& user, const std::string& session_id,
-                             const std::string& path) {
+Json::Value CheckDestination(const std::string& user, const std::string& path) {
   Json::Value answer = JsonObject({{"exists", false}, {"error", {}}, {"field", {}}});
   const auto fail = [&](const char* field, const char* error) {
     answer["field"] = field;
     answer["error"] = error;
     return answer;
   };
-  std::string full_path;
-  const int code = CheckFolder(user, session_id, path, full_path);
-  const std::size_t slash = std::min(full_path.rfind('/'), full_path.size());
+  const ResolvedPath resolved = Resolve(user, path);
+  const std::string full_path = resolved.error == 0 ? resolved.real_path : "/";
+  const std::size_t slash = full_path.rfind('/');
   const std::string parent = full_path.substr(0, slash);
-  if (code != 0) {
+  if (const int code = CheckFolder(user, resolved, parent); code != 0) {
     return fail("folder", FolderText(code, parent));
   }
   const std::string name = full_path.substr(slash + 1);

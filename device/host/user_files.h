@@ -36,7 +36,6 @@ Json::Value SizeOf(const std::string& user, const Json::Value& paths, const Pati
 // "field"}, of an archive that stands there "size" and "modified", and where nothing is wrong
 // "free_name": the name itself or a numbered one, which nothing in the folder has, if it is short
 // enough.
-Json::Value CheckDestination(const std::string& user, const std::string& session_id,
-                             const std::string& path);
+Json::Value CheckDestination(const std::string& user, const std::string& path);
 
 }  // namespace Device

@@ -159,7 +159,7 @@ void Serve(Launcher& launcher, const Json::Value& asked) {
     } else if (kind == kKindArchive) {
       answer(ListArchive(user, *body, Patience(stream, kArchiveTime)));
     } else if (kind == kKindDestination) {
-      answer(CheckDestination(user, session_id, *body));
+      answer(CheckDestination(user, *body));
     } else if (kind == kKindSize) {
       answer(SizeOf(user, PathsOf(asked, std::move(*body)), Patience(stream, kSizeTime)));
     } else if (kind == kKindTasks) {
