@@ -1,6 +1,7 @@
 #include "device/host/body.h"
 
-#include <cctype>
+#include <algorithm>
+#include <charconv>
 #include <cstdlib>
 #include <stdexcept>
 #include <utility>
@@ -13,13 +14,6 @@ namespace {
 
 constexpr char kFormType[] = "application/x-www-form-urlencoded";
 
-int HexDigit(char digit) {
-  const std::string digits = "0123456789abcdef";
-  const std::size_t value =
-      digits.find(static_cast<char>(std::tolower(static_cast<unsigned char>(digit))));
-  return value == std::string::npos ? -1 : static_cast<int>(value);
-}
-
 // Throws std::runtime_error for a "%" without two digits.
 std::string UnquoteField(const std::string& text, std::size_t place) {
   std::string plain;
@@ -29,13 +23,14 @@ std::string UnquoteField(const std::string& text, std::size_t place) {
       plain += text[at] == '+' ? ' ' : text[at];
       continue;
     }
-    const int high = at + 2 < text.size() ? HexDigit(text[at + 1]) : -1;
-    const int low = high < 0 ? -1 : HexDigit(text[at + 2]);
-    if (low < 0) {
+    unsigned char byte = 0;
+    const char* const digits = text.data() + at + 1;
+    const char* const end = digits + std::min<std::size_t>(2, text.size() - at - 1);
+    if (end - digits < 2 || std::from_chars(digits, end, byte, 16).ptr != end) {
       throw std::runtime_error("body: byte " + std::to_string(place + at + 1) +
                                ": '%' without two digits");
     }
-    plain += static_cast<char>(high * 16 + low);
+    plain += static_cast<char>(byte);
     at += 2;
   }
   return plain;
