@@ -19,18 +19,22 @@ Refused::Refused(int http_status, int code)
     : std::runtime_error(ErrorText(code)),
       answer(http_status, JsonObject({{"code", code}, {"error", ErrorText(code)}})) {}
 
-void RefuseFor(int code) {
+namespace {
+
+[[noreturn]] void RefuseFor(int code) {
   const bool is_forbidden = code == KAVO::kErrNoPrivilege || code == KAVO::kErrOutsideShare;
   throw Refused(is_forbidden ? kHttpForbidden : kHttpNotFound, code);
 }
 
-void RefuseForErrno(int error_number) {
-  if (error_number == ELOOP) {
+[[noreturn]] void RefuseForErrno() {
+  if (errno == ELOOP) {
     RefuseFor(KAVO::kErrOutsideShare);
   }
-  SetLastErrno(error_number);
+  SetLastErrno(errno);
   RefuseFor(LumoLibGetErr());
 }
+
+}  // namespace
 
 ResolvedPath ResolveForUser(const std::string& user, const std::string& path) {
   ResolvedPath resolved = Resolve(user, path);
@@ -46,7 +50,7 @@ ResolvedPath ResolveForUser(const std::string& user, const std::string& path) {
 FileDescriptor OpenForUser(const std::string& user, const ResolvedPath& path, int flags) {
   FileDescriptor opened = OpenUserPath(TheDevice().FixedFolders(user), path.real_path, flags);
   if (!opened) {
-    RefuseForErrno(errno);
+    RefuseForErrno();
   }
   return opened;
 }
@@ -58,7 +62,7 @@ FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, str
   }
   FileDescriptor file(open(PathOf(found.Get()).c_str(), O_RDONLY | O_CLOEXEC));
   if (!file) {
-    RefuseForErrno(errno);
+    RefuseForErrno();
   }
   return file;
 }

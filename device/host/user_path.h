@@ -23,10 +23,6 @@ struct Refused : std::runtime_error {
   Answer answer;
 };
 
-// Throws Refused with a KAVO::ErrorCode and its words.
-[[noreturn]] void RefuseFor(int code);
-[[noreturn]] void RefuseForErrno(int error_number);
-
 // Opens it by the identity of the process, which must be the user's; follows no link. Throws
 // Refused.
 FileDescriptor OpenForUser(const std::string& user, const ResolvedPath& path, int flags);
