@@ -38,10 +38,9 @@ bool IsForeignHost(const Request& request) {
 
 bool IsForeign(const Request& request) {
   const std::string origin = request.get_header_value("Origin");
-  const std::string host = "://" + request.get_header_value("Host");
-  return !origin.empty() && (origin.size() < host.size() ||
-                             origin.compare(origin.size() - host.size(), host.size(), host) != 0 ||
-                             origin.find("://") != origin.size() - host.size());
+  const std::size_t host = origin.find("://");
+  return !origin.empty() &&
+         (host == std::string::npos || origin.substr(host + 3) != request.get_header_value("Host"));
 }
 
 void ChooseEncoding(httplib::Headers& headers, const std::string& version) {
