@@ -4,8 +4,6 @@
 #include <optional>
 #include <stdexcept>
 
-#include "device/base/child_process.h"
-#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/cli/output.h"
 #include "device/host/sessions.h"
@@ -28,28 +26,21 @@ void OpenFor(const Target& target) {
 }
 
 Json::Value AskAs(const std::string& user, const std::function<Json::Value()>& body) {
-  Pipe pipe;
-  ChildProcess process = ChildProcess::Run([&] {
-    Json::Value answer;
+  FileDescriptor stream;
+  const std::optional<Json::Value> answer = AskProcess(stream, [&] {
     try {
       if (LumoLibUGIDSet(nullptr, user.c_str()) < 0) {
         throw std::runtime_error("cannot take on the identity of '" + user + "'");
       }
-      answer["result"] = body();
+      return JsonObject({{"result", body()}});
     } catch (const std::exception& error) {
-      answer["failure"] = error.what();
+      return JsonObject({{"failure", error.what()}});
     }
-    CloseStores();
-    return WriteFrame(pipe.writer.Get(), ToText(answer)) ? 0 : 1;
   });
-  pipe.writer.Close();
-  const std::optional<std::string> text = ReadFrame(pipe.reader.Get());
-  process.Wait();
-  const Json::Value answer = ParseJson(text.value_or(R"({"failure": "a process has died"})"));
-  if (answer.isMember("failure")) {
-    throw Failure(answer["failure"].asString());
+  if (!answer || answer->isMember("failure")) {
+    throw Failure(answer ? (*answer)["failure"].asString() : "a process has died");
   }
-  return answer["result"];
+  return (*answer)["result"];
 }
 
 std::vector<std::string> ErrorLines(const Json::Value& task) {

@@ -7,7 +7,7 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <optional>
+#include <algorithm>
 #include <stdexcept>
 #include <system_error>
 
@@ -57,21 +57,6 @@ bool IsStandardErrorRead() {
          (S_ISFIFO(status.st_mode) || S_ISSOCK(status.st_mode));
 }
 
-// False when the other side is gone.
-bool SendOutcome(int fd, const Outcome& outcome) {
-  return WriteFrame(fd, ToText(JsonObject({{"code", outcome.code}, {"data", outcome.data}})));
-}
-
-// False when the other side is gone without one.
-bool ReceiveOutcome(int fd, Outcome& outcome) {
-  const std::optional<std::string> text = ReadFrame(fd);
-  if (text) {
-    const Json::Value frame = ParseJson(*text);
-    outcome = {frame["code"].asInt(), frame["data"]};
-  }
-  return text.has_value();
-}
-
 }  // namespace
 
 Launcher::Launcher(WorkerLog worker_log)
@@ -96,17 +81,14 @@ Launcher::~Launcher() { TheHost() = {}; }
 const KAVO::ApiRow* Launcher::FindRow(const Request& request, int& code) const {
   code = KAVO::kErrNoApi;
   for (const KAVO::ApiRow* row = table_; row->api != nullptr; ++row) {
-    if (request.api != row->api) {
-      continue;
+    if (request.api == row->api) {
+      const bool is_method = request.method == row->method;
+      if (is_method && request.version == row->version) {
+        return row;
+      }
+      // The one that comes nearest is told: the codes ascend.
+      code = std::max<int>(code, is_method ? KAVO::kErrNoVersion : KAVO::kErrNoMethod);
     }
-    if (request.method != row->method) {
-      code = code == KAVO::kErrNoApi ? KAVO::kErrNoMethod : code;
-      continue;
-    }
-    if (row->version == request.version) {
-      return row;
-    }
-    code = KAVO::kErrNoVersion;
   }
   return nullptr;
 }
@@ -151,22 +133,35 @@ Outcome Launcher::Call(const Request& request) {
   }
   outcome.code = KAVO::kErrInternal;
   try {
-    Pipe pipe;
-    ChildProcess process = ChildProcess::Run([&] {
-      answer_ = std::move(pipe.writer);
-      const Outcome reached = CallSafely(request);
-      CloseStores();
-      return SendOutcome(answer_.Get(), reached) ? 0 : 1;
+    const std::optional<Json::Value> reached = AskProcess(answer_, [&] {
+      const Outcome own = CallSafely(request);
+      return JsonObject({{"code", own.code}, {"data", own.data}});
     });
-    pipe.writer.Close();
-    if (!ReceiveOutcome(pipe.reader.Get(), outcome)) {
-      syslog(LOG_ERR, "request process %d ended without an outcome", process.Pid());
+    if (reached) {
+      outcome = {(*reached)["code"].asInt(), (*reached)["data"]};
     }
-    process.Wait();
   } catch (const std::system_error& error) {
     syslog(LOG_ERR, "cannot start request process: %s", error.what());
   }
   return outcome;
+}
+
+std::optional<Json::Value> AskProcess(FileDescriptor& stream,
+                                      const std::function<Json::Value()>& body) {
+  Pipe pipe;
+  ChildProcess process = ChildProcess::Run([&] {
+    stream = std::move(pipe.writer);
+    const Json::Value answer = body();
+    CloseStores();
+    return WriteFrame(stream.Get(), ToText(answer)) ? 0 : 1;
+  });
+  pipe.writer.Close();
+  const std::optional<std::string> text = ReadFrame(pipe.reader.Get());
+  if (!text) {
+    syslog(LOG_ERR, "request process %d ended without an outcome", process.Pid());
+  }
+  process.Wait();
+  return text ? std::optional(ParseJson(*text)) : std::nullopt;
 }
 
 void Launcher::Reap() {

@@ -2,7 +2,9 @@
 // the launcher, so that one that crashes costs that request alone.
 #pragma once
 
+#include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 
 #include "device/base/file_descriptor.h"
@@ -53,6 +55,11 @@ class Launcher {
   const KAVO::ApiRow* table_ = nullptr;
   FileDescriptor answer_;
 };
+
+// What the body returns in a process of its own, where `stream` is the way back; nothing when that
+// dies. Throws std::system_error.
+std::optional<Json::Value> AskProcess(FileDescriptor& stream,
+                                      const std::function<Json::Value()>& body);
 
 // Removes what killed jobs have left, each user's with that user's identity.
 void RemoveLeftoversOfAll();
