@@ -29,8 +29,12 @@ Answer::Answer(int http_status, std::string json_text)
   body += body.empty() ? "" : "\n";
 }
 
-Answer Refusal(int status, const std::string& reason) {
-  return Answer(status, JsonObject({{"error", reason}}));
+Answer Refusal(int status, const std::string& reason, const std::string& retry_seconds) {
+  Answer answer(status, JsonObject({{"error", reason}}));
+  if (!retry_seconds.empty()) {
+    answer.headers = {{"Retry-After", retry_seconds}};
+  }
+  return answer;
 }
 
 bool SendAnswer(int stream, const Answer& answer) {

@@ -92,8 +92,8 @@ struct Answer {
   std::string body;
 };
 
-// An answer {"error": reason}.
-Answer Refusal(int status, const std::string& reason);
+// An answer {"error": reason}; `retry_seconds`, when it may be tried again.
+Answer Refusal(int status, const std::string& reason, const std::string& retry_seconds = "");
 
 // False when the other side is gone.
 bool SendAnswer(int stream, const Answer& answer);

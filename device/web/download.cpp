@@ -84,8 +84,8 @@ void SendFile(const Request& request, Response& response, const Device::Answer& 
               Device::SocketMessage message) {
   const std::shared_ptr<void> place = TakePlace(message.bytes);
   if (!place) {
-    Refuse(response, Device::kHttpTooMany, "too many downloads at the same time");
-    response.set_header("Retry-After", kRetrySeconds);
+    Respond(response, Device::Refusal(Device::kHttpTooMany, "too many downloads at the same time",
+                                      kRetrySeconds));
     return;
   }
   const auto file = std::make_shared<Device::FileDescriptor>(std::move(message.descriptor));
