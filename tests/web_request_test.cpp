@@ -60,8 +60,9 @@ TEST_F(WebRequestTest, ALockedStoreIsSaidSoon) {
   Device::FileDescriptor other(ends[1]);
   Device::ChildProcess process = Device::ChildProcess::Run([&] {
     stream.Close();
-    Device::ServeWebRequest(*launcher_, std::move(other),
-                            Device::JsonObject({{"kind", "call"}, {"session", session}}));
+    Device::ServeWebRequest(
+        *launcher_, std::move(other),
+        Device::JsonObject({{"kind", "call"}, {"session", session}, {"type", ""}}));
     return 0;
   });
   other.Close();

@@ -20,7 +20,9 @@
 #include "device/base/child_process.h"
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/base/socket_message.h"
 #include "device/host/web_request.h"
+#include "device/host/wire.h"
 #include "device/model/device.h"
 
 namespace Device {
@@ -162,45 +164,40 @@ pid_t WebHost::Fork(const std::function<int()>& body) {
 }
 
 bool WebHost::TakeMessage() {
-  std::optional<ControlMessage> message = ReceiveControl(control_.Get());
+  std::optional<SocketMessage> message = ReceiveMessage(control_.Get(), kMostMessageBytes);
   if (!message) {
     return false;
   }
   try {
-    Serve(*message);
+    Serve(ParseJson(message->bytes), std::move(message->descriptor));
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "message of the front end: %s", error.what());
   }
   return std::cout.good();  // it does not serve where it could not say
 }
 
-void WebHost::Serve(ControlMessage& message) {
-  if (message.kind != ControlKind::kRequest) {
-    fcntl(message.stream.Get(), F_SETFL, O_NONBLOCK);  // the launcher waits for no reader
-  }
-  switch (message.kind) {
-    case ControlKind::kListening:
-      if (listen_ != message.text || !has_listened_) {
-        listen_ = message.text;  // where any free port was asked for, this one from now on
-        std::cout << announcement_(listen_) << std::endl;
-        has_listened_ = std::cout.good();
-        sd_notify(0, "READY=1");
-      }
-      break;
-    case ControlKind::kRequest:
-      TakeRequest(message.text, std::move(message.stream));
-      break;
-    case ControlKind::kSignIn:
-      TakeSignIn(message.text, std::move(message.stream));
-      break;
-    case ControlKind::kSignOut:
-      TakeSignOut(message);
-      break;
+void WebHost::Serve(const Json::Value& asked, FileDescriptor stream) {
+  const std::string kind = asked["kind"].asString();
+  if (kind == kKindListening) {
+    TakeAddress(asked["address"].asString());
+  } else if (kind == kKindSignIn || kind == kKindSignOut) {
+    fcntl(stream.Get(), F_SETFL, O_NONBLOCK);  // the launcher waits for no reader
+    kind == kKindSignIn ? TakeSignIn(asked, std::move(stream)) : TakeSignOut(asked, stream);
+  } else {
+    TakeRequest(asked, std::move(stream));
   }
 }
 
-void WebHost::TakeRequest(const std::string& text, FileDescriptor stream) {
-  Json::Value asked = ParseJson(text);
+void WebHost::TakeAddress(const std::string& address) {
+  if (listen_ != address || !has_listened_) {
+    listen_ = address;  // where any free port was asked for, this one from now on
+    std::cout << announcement_(listen_) << std::endl;
+    has_listened_ = std::cout.good();
+    sd_notify(0, "READY=1");
+  }
+}
+
+void WebHost::TakeRequest(Json::Value asked, FileDescriptor stream) {
   const std::string session = asked["session"].asString();
   const std::string user = UserOfSession(session);
   if (user.empty() && asked["kind"] != kKindCodes) {
@@ -222,20 +219,18 @@ void WebHost::Enqueue(const Asker& asker, FileDescriptor stream,
                       const std::function<pid_t(FileDescriptor&)>& start) {
   const auto shared = std::make_shared<FileDescriptor>(std::move(stream));
   if (!queue_.Add(asker, [=] { return start(*shared); })) {
-    Answer answer = Refusal(kHttpTooMany, asker.is_stream ? "too many event streams"
-                                                          : "too many requests at the same time");
-    answer.headers = {{"Retry-After", kRetrySeconds}};
-    SendAnswer(shared->Get(), answer);
+    SendAnswer(shared->Get(), Refusal(kHttpTooMany,
+                                      asker.is_stream ? "too many event streams"
+                                                      : "too many requests at the same time",
+                                      kRetrySeconds));
   }
 }
 
-void WebHost::TakeSignIn(const std::string& text, FileDescriptor stream) {
-  const Json::Value asked = ParseJson(text);
+void WebHost::TakeSignIn(const Json::Value& asked, FileDescriptor stream) {
   const std::chrono::seconds wait = gate_.Try(asked["user"].asString(), SignInGate::Clock::now());
   if (wait.count() > 0) {
-    Answer answer = Refusal(kHttpTooMany, "too many wrong passwords");
-    answer.headers = {{"Retry-After", std::to_string(wait.count())}};
-    SendAnswer(stream.Get(), answer);
+    SendAnswer(stream.Get(),
+               Refusal(kHttpTooMany, "too many wrong passwords", std::to_string(wait.count())));
     return;
   }
   // Looking at a password takes its time, which is not the launcher's.
@@ -249,11 +244,11 @@ void WebHost::TakeSignIn(const std::string& text, FileDescriptor stream) {
   });
 }
 
-void WebHost::TakeSignOut(const ControlMessage& message) {
-  SignOut(message.text);
+void WebHost::TakeSignOut(const Json::Value& asked, const FileDescriptor& stream) {
+  SignOut(asked["session"].asString());
   Answer answer(kHttpNoContent);
   answer.headers = {SessionCookie("; Max-Age=0")};
-  SendAnswer(message.stream.Get(), answer);
+  SendAnswer(stream.Get(), answer);
 }
 
 void WebHost::FinishSignIn(const SignInCheck& check, bool is_password) {

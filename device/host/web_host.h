@@ -2,6 +2,7 @@
 // a process for each request, keeps the sessions, and takes leave of every process that ends.
 #pragma once
 
+#include <json/json.h>
 #include <sys/types.h>
 
 #include <csignal>
@@ -13,7 +14,6 @@
 #include "device/host/launcher.h"
 #include "device/host/request_queue.h"
 #include "device/host/sessions.h"
-#include "device/host/wire.h"
 
 namespace Device {
 
@@ -57,13 +57,14 @@ class WebHost {
 
   // False when the front end is gone.
   bool TakeMessage();
-  void Serve(ControlMessage& message);
-  void TakeRequest(const std::string& text, FileDescriptor stream);
+  void Serve(const Json::Value& asked, FileDescriptor stream);
+  void TakeAddress(const std::string& address);
+  void TakeRequest(Json::Value asked, FileDescriptor stream);
   // Has the process started that is to answer, or refuses the request.
   void Enqueue(const Asker& asker, FileDescriptor stream,
                const std::function<pid_t(FileDescriptor&)>& start);
-  void TakeSignIn(const std::string& text, FileDescriptor stream);
-  void TakeSignOut(const ControlMessage& message);
+  void TakeSignIn(const Json::Value& asked, FileDescriptor stream);
+  static void TakeSignOut(const Json::Value& asked, const FileDescriptor& stream);
   void FinishSignIn(const SignInCheck& check, bool is_password);
 
   // False when serving is to end.

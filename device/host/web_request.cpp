@@ -6,7 +6,6 @@
 #include <chrono>
 #include <csignal>
 #include <optional>
-#include <set>
 #include <stdexcept>
 #include <utility>
 
@@ -41,8 +40,11 @@ void TakeIdentity(const std::string& session_id, const std::string& user) {
   }
 }
 
-// What the client sends, in its time. Nothing when it breaks off.
-std::optional<std::string> ReceiveBody(int stream) {
+// What the client sends, in its time: a body, or a path. Nothing when it breaks off.
+std::optional<std::string> Receive(int stream, bool has_body) {
+  if (!has_body) {
+    return ReadFrame(stream);
+  }
   SendAnswer(stream, Answer(kHttpContinue));
   std::string body;
   std::optional<std::string> part;
@@ -56,12 +58,9 @@ Answer RefusalFor(Shortage shortage) {
   if (TheHost().worker > 0) {
     kill(TheHost().worker, SIGKILL);  // it waits for its task's data, which will not come
   }
-  if (shortage == Shortage::kMemory) {
-    return Refusal(kHttpTooLarge, "the request takes too much memory");
-  }
-  Answer answer = Refusal(kHttpUnavailable, "the user's tasks are locked");
-  answer.headers = {{"Retry-After", "2"}};
-  return answer;
+  return shortage == Shortage::kMemory
+             ? Refusal(kHttpTooLarge, "the request takes too much memory")
+             : Refusal(kHttpUnavailable, "the user's tasks are locked", "2");
 }
 
 Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& asked,
@@ -131,13 +130,11 @@ Json::Value PathsOf(const Json::Value& asked, std::string body) {
 }
 
 void Serve(Launcher& launcher, const Json::Value& asked) {
-  static const std::set<std::string> kWithBody = {kKindCall,    kKindFiles,       kKindDownload,
-                                                  kKindArchive, kKindDestination, kKindSize};
   const int stream = launcher.AnswerStream().Get();
   const std::string kind = asked["kind"].asString();
   const std::string session_id = asked["session"].asString();
-  std::optional<std::string> body;
-  if (kWithBody.count(kind) != 0 && !(body = ReceiveBody(stream))) {
+  std::optional<std::string> sent = Receive(stream, asked.isMember("type"));
+  if (!sent) {
     return;
   }
   const std::string user = UserOfSession(session_id);
@@ -147,21 +144,21 @@ void Serve(Launcher& launcher, const Json::Value& asked) {
   } else if (user.empty()) {
     SendAnswer(stream, Refusal(kHttpUnauthorized, "no session"));
   } else if (kind == kKindCall) {
-    SendAnswer(stream, CallApi(launcher, user, asked, std::move(*body)));
+    SendAnswer(stream, CallApi(launcher, user, asked, std::move(*sent)));
   } else if (kind == kKindSession) {
     answer(SessionBody(user));
   } else {
     TakeIdentity(session_id, user);
     if (kind == kKindFiles) {
-      answer(ListFolder(user, *body));
+      answer(ListFolder(user, *sent));
     } else if (kind == kKindDownload) {
-      SendFile(stream, user, *body);
+      SendFile(stream, user, *sent);
     } else if (kind == kKindArchive) {
-      answer(ListArchive(user, *body, Patience(stream, kArchiveTime)));
+      answer(ListArchive(user, *sent, Patience(stream, kArchiveTime)));
     } else if (kind == kKindDestination) {
-      answer(CheckDestination(user, *body));
+      answer(CheckDestination(user, *sent));
     } else if (kind == kKindSize) {
-      answer(SizeOf(user, PathsOf(asked, std::move(*body)), Patience(stream, kSizeTime)));
+      answer(SizeOf(user, PathsOf(asked, std::move(*sent)), Patience(stream, kSizeTime)));
     } else if (kind == kKindTasks) {
       answer(TasksBody(user));
     } else {

@@ -4,22 +4,8 @@
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
-#include "device/base/socket_message.h"
 
 namespace Device {
-
-bool SendControl(int socket, ControlKind kind, const std::string& text, int stream) {
-  return SendMessage(socket, static_cast<char>(kind) + text, stream);
-}
-
-std::optional<ControlMessage> ReceiveControl(int socket) {
-  std::optional<SocketMessage> message = ReceiveMessage(socket, 1 + kMostControlBytes);
-  if (!message) {
-    return std::nullopt;
-  }
-  return ControlMessage{static_cast<ControlKind>(message->bytes.front()), message->bytes.substr(1),
-                        std::move(message->descriptor)};
-}
 
 Answer::Answer(int http_status, const Json::Value& json)
     : Answer(http_status, json.isNull() ? "" : ToUtf8Text(json)) {}

@@ -1,19 +1,20 @@
 // How launcher and front end talk.
 //
-// The front end sends the launcher control messages over a socket of sequenced packets (its
-// standard input): a kind, a text, and the end of a stream for the answer. Everything on that
-// stream is a frame (base/file_io.h). What comes back is an answer, made into text by who knows it
-// and passed through to the client, first a frame with its head:
+// The front end sends the launcher messages over a socket of sequenced packets (its standard
+// input): {"kind"} in JSON with what the kind needs, and the end of a stream for the answer.
+// Everything on that stream is a frame (base/file_io.h). What comes back is an answer, made into
+// text by who knows it and passed through to the client, first a frame with its head:
 //
 //     STATUS \n
 //     NAME: VALUE \n        any number of HTTP headers
 //
 // and then the body in a frame of its own, as the client gets it.
 //
-// Of a request with a body the first answer may have the status 100: it is the request's turn. Then
-// the body goes there as it came, in frames that an empty one ends, and the answer comes. An answer
-// to kKindEvents is followed by frames of server-sent events, as the client gets them; an answer to
-// kKindDownload that has no body, by a message: the user's name with the file's descriptor.
+// A request is followed by a frame with the path that it is about, or nothing. Of one with a "type"
+// the first answer may have the status 100 instead: it is the request's turn. Then the body goes
+// there as it came, in frames that an empty one ends, and the answer comes. An answer to
+// kKindEvents is followed by frames of server-sent events, as the client gets them; one to
+// kKindDownload without a body by a message, the user's name with the file's descriptor.
 #pragma once
 
 #include <json/json.h>
@@ -49,35 +50,21 @@ enum HttpStatus : int {
 };
 
 inline constexpr char kSessionCookie[] = "session";
-inline constexpr std::size_t kMostControlBytes = 8192;
+inline constexpr std::size_t kMostMessageBytes = 8192;
 
-enum class ControlKind : char {
-  kListening = 'l',  // text: ADDRESS:PORT; no stream
-  kRequest = 'r',    // text: {"kind","session","client"}, and what the kind needs
-  kSignIn = 'i',     // text: {"user","password","client"}
-  kSignOut = 'o'     // text: the session's id
-};
-
-struct ControlMessage {
-  ControlKind kind = ControlKind::kRequest;
-  std::string text;  // kMostControlBytes at most
-  FileDescriptor stream;
-};
-
-// False when the other side is gone. `stream` stays the caller's; -1 for none.
-bool SendControl(int socket, ControlKind kind, const std::string& text, int stream);
-
-// Nothing when the other side is gone, or what came is no message.
-std::optional<ControlMessage> ReceiveControl(int socket);
-
-// What a request asks for, by its "kind"; "client" is the address that it comes from.
-inline constexpr char kKindCall[] = "call";          // "type", the body's; body: the API's request
-inline constexpr char kKindSession[] = "session";    // who is signed in
-inline constexpr char kKindFiles[] = "files";        // body: the path
-inline constexpr char kKindDownload[] = "download";  // body: the path; see below
-inline constexpr char kKindArchive[] = "archive";    // body: the path
-inline constexpr char kKindDestination[] = "destination";  // body: the path
-inline constexpr char kKindSize[] = "size";                // "type", the body's; body: {"paths"}
+// For the launcher itself.
+inline constexpr char kKindListening[] = "listening";  // "address": ADDRESS:PORT; no stream
+inline constexpr char kKindSignIn[] = "sign-in";       // "user", "password", "client"
+inline constexpr char kKindSignOut[] = "sign-out";     // "session"
+// What a request asks for; with it are its "session", "client", the address that it comes from, and
+// "type", the body's, where one comes.
+inline constexpr char kKindCall[] = "call";        // body: the API's request
+inline constexpr char kKindSession[] = "session";  // who is signed in
+inline constexpr char kKindFiles[] = "files";      // these four are about a path
+inline constexpr char kKindDownload[] = "download";
+inline constexpr char kKindArchive[] = "archive";
+inline constexpr char kKindDestination[] = "destination";
+inline constexpr char kKindSize[] = "size";  // body: {"paths"}
 inline constexpr char kKindTasks[] = "tasks";
 inline constexpr char kKindEvents[] = "events";
 inline constexpr char kKindCodes[] = "codes";  // no session needed

@@ -6,6 +6,7 @@
 
 #include <iterator>
 
+#include "device/base/json_text.h"
 #include "device/web/connection.h"
 
 namespace Web {
@@ -16,14 +17,15 @@ constexpr int kControl = STDIN_FILENO;  // the launcher has put its socket there
 
 }  // namespace
 
-Exchange::Exchange(Device::ControlKind kind, const std::string& text) {
+Exchange::Exchange(const Json::Value& asked) {
+  Connection::OfThisThread().EndReading();
   int ends[2];
   if (socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) {
     return;
   }
   stream_ = Device::FileDescriptor(ends[0]);
   const Device::FileDescriptor other_side(ends[1]);
-  Device::SendControl(kControl, kind, text, other_side.Get());
+  Device::SendMessage(kControl, Device::ToText(asked), other_side.Get());
 }
 
 Device::Answer Exchange::Receive() {

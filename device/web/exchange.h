@@ -14,8 +14,8 @@ namespace Web {
 
 class Exchange {
  public:
-  // Tells the launcher. Where that fails, no frame will come.
-  Exchange(Device::ControlKind kind, const std::string& text);
+  // Tells the launcher, once the request has been read. Where that fails, no frame will come.
+  explicit Exchange(const Json::Value& asked);
 
   // Sends a part of the body; an empty one ends it. What nobody reads any more is dropped.
   void Send(const std::string& part) { Device::WriteFrame(stream_.Get(), part); }

@@ -11,7 +11,6 @@
 
 #include "device/base/json_text.h"
 #include "device/host/body.h"
-#include "device/web/connection.h"
 #include "device/web/download.h"
 #include "device/web/request_head.h"
 #include "device/web/responses.h"
@@ -40,115 +39,14 @@ constexpr char kCodePages[] =
     R"("KOI8-R","KOI8-U","ISO-8859-1","ISO-8859-2","ISO-8859-15"])"
     "\n";
 
-}  // namespace
-
-FrontEnd::FrontEnd(const PageFiles& page) {
-  server_.new_task_queue = [] { return new ConnectionThreads; };
-  server_.set_tcp_nodelay(true);
-  server_.set_socket_options([this](int socket) {
-    const int yes = 1;
-    setsockopt(socket, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
-    socket_ = socket;
-  });
-  server_.set_default_headers({{"Content-Security-Policy", kPolicy},
-                               {"X-Content-Type-Options", "nosniff"},
-                               {"Referrer-Policy", "no-referrer"},
-                               {"Cross-Origin-Resource-Policy", "same-origin"},
-                               {"Cache-Control", "no-store"}});
-  server_.set_pre_routing_handler([this](const Request& request, Response& response) {
-    // Whole answers only: the library would cut errors too, and send a file once for each range.
-    const_cast<Request&>(request).ranges.clear();
-    ChooseEncoding(const_cast<Request&>(request).headers, request.version);
-    if (is_ending_) {
-      Refuse(response, Device::kHttpUnavailable, "the device is ending");
-    } else if (IsForeign(request) || IsForeignHost(request)) {
-      Refuse(response, Device::kHttpForbidden, "the request comes from another site's page");
-    } else if (request.has_header("Content-Encoding")) {
-      Refuse(response, Device::kHttpNotDecoded, "the body is in an encoding");
-    } else if (!HasBodyRoute(request)) {
-      Refuse(response, Device::kHttpNotFound, ReasonFor(Device::kHttpNotFound));
-    } else {
-      return httplib::Server::HandlerResponse::Unhandled;
-    }
-    return httplib::Server::HandlerResponse::Handled;
-  });
-  server_.set_post_routing_handler([](const Request& /*request*/, Response& /*response*/) {
-    Connection::OfThisThread().AllowForWriting(kAnswerTime);
-  });
-  server_.set_exception_handler(
-      [](const Request& /*request*/, Response& response, const std::exception_ptr& /*error*/) {
-        Refuse(response, Device::kHttpInternal, ReasonFor(Device::kHttpInternal));
-      });
-  server_.set_error_handler([](const Request& /*request*/, Response& response) {
-    if (response.body.empty() && !response.content_provider_) {
-      Refuse(response, response.status, ReasonFor(response.status));
-    }
-  });
-  AddPage(page);
-  AddRoutes();
+// What the launcher is asked, as far as all requests are alike.
+Json::Value Asked(const Request& request, const std::string& kind) {
+  return Device::JsonObject({{"kind", kind},
+                             {"session", SessionOf(request)},
+                             {"client", Connection::OfThisThread().Client()}});
 }
 
-void FrontEnd::AddPage(const PageFiles& page) {
-  for (const auto& [path, file] : page.files) {
-    std::string pattern;
-    for (const char each : path) {
-      pattern += each == '.' ? "\\." : std::string(1, each);
-    }
-    const bool is_index = path == "/";
-    server_.Get(pattern, [&file = file, &page, is_index](const Request& request,
-                                                         Response& response) {
-      const std::string validator = "W/\"" + page.version + "\"";
-      response.headers.erase("Cache-Control");
-      response.set_header("Cache-Control", is_index ? "no-cache" : "max-age=31536000, immutable");
-      response.set_header("Vary", "Accept-Encoding");
-      response.set_header("ETag", validator);
-      if (request.get_header_value("If-None-Match").find(validator) != std::string::npos) {
-        response.status = Device::kHttpNotModified;
-      } else {
-        response.set_content(file.content, file.content_type);
-      }
-    });
-  }
-}
-
-void FrontEnd::AddRoutes() {
-  Post(kSession, &FrontEnd::SignIn);
-  Post(kWebApi, &FrontEnd::CallApi);
-  Post(kSize, &FrontEnd::CallApi);
-  server_.Get("/codepages", [](const Request& /*request*/, Response& response) {
-    response.set_content(kCodePages, kJson);
-  });
-  server_.Delete(kSession,
-                 [](const Request& request, Response& response,
-                    const httplib::ContentReader& /*body*/) { SignOut(request, response); });
-  for (const char* kind : {Device::kKindSession, Device::kKindTasks, Device::kKindCodes}) {
-    server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
-      PassOn(request, response, Ask(Asked(request, kind)));
-    });
-  }
-  for (const char* kind : {Device::kKindFiles, Device::kKindDownload, Device::kKindArchive,
-                           Device::kKindDestination}) {
-    server_.Get(std::string("/") + kind, [kind](const Request& request, Response& response) {
-      AskAboutPath(kind, request, response);
-    });
-  }
-  server_.Get("/events", [this](const Request& request, Response& response) {
-    StreamEvents(request, response);
-  });
-}
-
-void FrontEnd::Post(const char* route,
-                    void (*handler)(const Request&, const httplib::ContentReader&, Response&)) {
-  server_.Post(route, [this, handler](const Request& request, Response& response,
-                                      const httplib::ContentReader& reader) {
-    ++serving_;
-    const std::shared_ptr<void> counted(&serving_, [this](void*) { --serving_; });
-    handler(request, reader, response);
-  });
-}
-
-void FrontEnd::SignIn(const Request& request, const httplib::ContentReader& reader,
-                      Response& response) {
+void SignIn(const Request& request, Response& response, const httplib::ContentReader& reader) {
   std::string body;
   Connection::OfThisThread().ReadBody(false);
   if (!ReadBody(
@@ -160,30 +58,32 @@ void FrontEnd::SignIn(const Request& request, const httplib::ContentReader& read
     const Json::Value asked =
         Device::ParseBody(request.get_header_value("Content-Type"), std::move(body));
     const Json::Value sign_in =
-        Device::JsonObject({{"user", Device::TextField(asked, "user")},
+        Device::JsonObject({{"kind", Device::kKindSignIn},
+                            {"user", Device::TextField(asked, "user")},
                             {"password", Device::TextField(asked, "password")},
                             {"client", Connection::OfThisThread().Client()}});
-    if (Device::ToText(sign_in).size() > Device::kMostControlBytes) {
+    if (Device::ToText(sign_in).size() > Device::kMostMessageBytes) {
       Refuse(response, Device::kHttpUnauthorized, "wrong user name or password");
       return;
     }
-    PassOn(request, response, Ask(Device::ControlKind::kSignIn, sign_in));
+    const auto exchange = std::make_shared<Exchange>(sign_in);
+    PassOn(request, response, exchange->Receive(), exchange);
   } catch (const std::runtime_error& error) {
     Refuse(response, Device::kHttpBadRequest, error.what());
   }
 }
 
-void FrontEnd::SignOut(const Request& request, Response& response) {
-  PassOn(request, response,
-         std::make_shared<Exchange>(Device::ControlKind::kSignOut, SessionOf(request)));
+void SignOut(const Request& request, Response& response, const httplib::ContentReader& /*body*/) {
+  const auto exchange = std::make_shared<Exchange>(Asked(request, Device::kKindSignOut));
+  PassOn(request, response, exchange->Receive(), exchange);
 }
 
-void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& reader,
-                       Response& response) {
+// A request with a body, which is read when it is its turn.
+void AskWithBody(const Request& request, Response& response, const httplib::ContentReader& reader) {
   Json::Value asked =
       Asked(request, request.path == kWebApi ? Device::kKindCall : Device::kKindSize);
   asked["type"] = request.get_header_value("Content-Type").substr(0, kMostTypeBytes);
-  const Asking exchange = Ask(asked);
+  const auto exchange = std::make_shared<Exchange>(asked);
   Device::Answer answer = exchange->Receive();
   const bool is_users = answer.status == Device::kHttpContinue;
   Connection::OfThisThread().ReadBody(is_users);
@@ -201,20 +101,130 @@ void FrontEnd::CallApi(const Request& request, const httplib::ContentReader& rea
   }
 }
 
-void FrontEnd::AskAboutPath(const char* kind, const Request& request, Response& response) {
-  if (!request.has_param("path")) {
-    Refuse(response, Device::kHttpBadRequest, "'path' is missing");
-    return;
+const char* ReasonFor(int status) {
+  switch (status) {
+    case Device::kHttpNotFound:
+      return "no such route";
+    case Device::kHttpTimeout:
+      return "the body takes too long";
+    case Device::kHttpTooLarge:
+      return "the body is too long";
+    case Device::kHttpInternal:
+      return "the front end has failed";
+    default:
+      return "not a request that is understood";
   }
-  const Asking exchange = Ask(Asked(request, kind));
-  Device::Answer answer = exchange->Receive();
-  if (answer.status == Device::kHttpContinue) {
-    exchange->Send(request.get_param_value("path"));
-    exchange->Send("");
-    answer = exchange->Receive();
+}
+
+}  // namespace
+
+FrontEnd::FrontEnd(const PageFiles& page) {
+  new_task_queue = [] { return new ConnectionThreads; };
+  set_tcp_nodelay(true);
+  set_socket_options([](int socket) {
+    const int yes = 1;
+    setsockopt(socket, SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes);
+  });
+  set_default_headers({{"Content-Security-Policy", kPolicy},
+                       {"X-Content-Type-Options", "nosniff"},
+                       {"Referrer-Policy", "no-referrer"},
+                       {"Cross-Origin-Resource-Policy", "same-origin"},
+                       {"Cache-Control", "no-store"}});
+  set_pre_routing_handler([this](const Request& request, Response& response) {
+    // Whole answers only: the library would cut errors too, and send a file once for each range.
+    const_cast<Request&>(request).ranges.clear();
+    ChooseEncoding(const_cast<Request&>(request).headers, request.version);
+    if (is_ending_) {
+      Refuse(response, Device::kHttpUnavailable, "the device is ending");
+    } else if (IsForeign(request) || IsForeignHost(request)) {
+      Refuse(response, Device::kHttpForbidden, "the request comes from another site's page");
+    } else if (request.has_header("Content-Encoding")) {
+      Refuse(response, Device::kHttpNotDecoded, "the body is in an encoding");
+    } else if (!HasBodyRoute(request)) {
+      Refuse(response, Device::kHttpNotFound, ReasonFor(Device::kHttpNotFound));
+    } else {
+      return httplib::Server::HandlerResponse::Unhandled;
+    }
+    return httplib::Server::HandlerResponse::Handled;
+  });
+  set_post_routing_handler([](const Request& /*request*/, Response& /*response*/) {
+    Connection::OfThisThread().AllowForWriting(kAnswerTime);
+  });
+  set_exception_handler(
+      [](const Request& /*request*/, Response& response, const std::exception_ptr& /*error*/) {
+        Refuse(response, Device::kHttpInternal, ReasonFor(Device::kHttpInternal));
+      });
+  set_error_handler([](const Request& /*request*/, Response& response) {
+    if (response.body.empty() && !response.content_provider_) {
+      Refuse(response, response.status, ReasonFor(response.status));
+    }
+  });
+  AddPage(page);
+  AddRoutes();
+}
+
+void FrontEnd::AddPage(const PageFiles& page) {
+  for (const auto& [path, file] : page.files) {
+    std::string pattern;
+    for (const char each : path) {
+      pattern += each == '.' ? "\\." : std::string(1, each);
+    }
+    const bool is_index = path == "/";
+    Get(pattern, [&file = file, &page, is_index](const Request& request, Response& response) {
+      const std::string validator = "W/\"" + page.version + "\"";
+      response.headers.erase("Cache-Control");
+      response.set_header("Cache-Control", is_index ? "no-cache" : "max-age=31536000, immutable");
+      response.set_header("Vary", "Accept-Encoding");
+      response.set_header("ETag", validator);
+      if (request.get_header_value("If-None-Match").find(validator) != std::string::npos) {
+        response.status = Device::kHttpNotModified;
+      } else {
+        response.set_content(file.content, file.content_type);
+      }
+    });
   }
+}
+
+void FrontEnd::AddRoutes() {
+  using Route = std::pair<const char*, HandlerWithContentReader>;
+  for (const auto& [path, handler] :
+       {Route(kSession, SignIn), Route(kWebApi, AskWithBody), Route(kSize, AskWithBody)}) {
+    Post(path, [this, handler = handler](const Request& request, Response& response,
+                                         const httplib::ContentReader& reader) {
+      ++serving_;
+      const std::shared_ptr<void> counted(&serving_, [this](void*) { --serving_; });
+      handler(request, response, reader);
+    });
+  }
+  Delete(kSession, SignOut);
+  Get("/codepages", [](const Request& /*request*/, Response& response) {
+    response.set_content(kCodePages, kJson);
+  });
+  for (const char* kind :
+       {Device::kKindSession, Device::kKindTasks, Device::kKindCodes, Device::kKindEvents}) {
+    Get(std::string("/") + kind,
+        [this, kind](const Request& request, Response& response) { Ask(kind, request, response); });
+  }
+  for (const char* kind : {Device::kKindFiles, Device::kKindDownload, Device::kKindArchive,
+                           Device::kKindDestination}) {
+    Get(std::string("/") + kind, [this, kind](const Request& request, Response& response) {
+      if (request.has_param("path")) {
+        Ask(kind, request, response);
+      } else {
+        Refuse(response, Device::kHttpBadRequest, "'path' is missing");
+      }
+    });
+  }
+}
+
+void FrontEnd::Ask(const std::string& kind, const Request& request, Response& response) {
+  const auto exchange = std::make_shared<Exchange>(Asked(request, kind));
+  exchange->Send(request.get_param_value("path"));
+  const Device::Answer answer = exchange->Receive();
   if (answer.status != Device::kHttpOk || exchange->BodyLeft() > 0) {
     PassOn(request, response, answer, exchange);
+  } else if (kind == Device::kKindEvents) {
+    StreamEvents(exchange, response);
   } else if (std::optional<Device::SocketMessage> file = exchange->ReceiveFile()) {
     SendFile(request, response, answer, std::move(*file));
   } else {
@@ -222,13 +232,7 @@ void FrontEnd::AskAboutPath(const char* kind, const Request& request, Response& 
   }
 }
 
-void FrontEnd::StreamEvents(const Request& request, Response& response) {
-  const Asking exchange = Ask(Asked(request, Device::kKindEvents));
-  const Device::Answer answer = exchange->Receive();
-  if (answer.status != Device::kHttpOk) {
-    PassOn(request, response, answer, exchange);
-    return;
-  }
+void FrontEnd::StreamEvents(const std::shared_ptr<Exchange>& exchange, Response& response) {
   response.set_chunked_content_provider(
       "text/event-stream", [exchange, this](std::size_t /*at*/, httplib::DataSink& sink) {
         // A comment now and then tells whether the client is still there.
@@ -248,16 +252,14 @@ void FrontEnd::StreamEvents(const Request& request, Response& response) {
 
 int FrontEnd::Bind(const std::string& address, int port) {
   errno = 0;
-  const int bound = port == 0                             ? server_.bind_to_any_port(address)
-                    : server_.bind_to_port(address, port) ? port
-                                                          : -1;
+  const int bound = port == 0 ? bind_to_any_port(address) : bind_to_port(address, port) ? port : -1;
   if (bound >= 0) {
-    listen(socket_, kBacklog);
+    ::listen(svr_sock_, kBacklog);
   }
   return bound;
 }
 
-void FrontEnd::Stop() {
+void FrontEnd::End() {
   is_ending_ = true;
   const auto deadline = std::chrono::steady_clock::now() + kEndGrace;
   while (serving_ > 0 && std::chrono::steady_clock::now() < deadline) {

@@ -18,6 +18,8 @@
 #include <thread>
 
 #include "device/base/file_io.h"
+#include "device/base/json_text.h"
+#include "device/base/socket_message.h"
 #include "device/host/wire.h"
 #include "device/web/front_end.h"
 
@@ -70,7 +72,7 @@ void WaitForTheEnd(const sigset_t& ending, Web::FrontEnd& front_end) {
   pollfd sources[] = {{signals, POLLIN, 0}, {STDIN_FILENO, POLLHUP, 0}};
   while (poll(sources, std::size(sources), -1) < 0) {
   }
-  front_end.Stop();
+  front_end.End();
   _exit(0);
 }
 
@@ -114,8 +116,10 @@ void Serve(const std::string& listen, int page, int socket) {
   }
   sigprocmask(SIG_BLOCK, &ending, nullptr);
   std::thread([&] { WaitForTheEnd(ending, front_end); }).detach();
-  Device::SendControl(STDIN_FILENO, Device::ControlKind::kListening, bound, -1);
-  front_end.Listen();
+  const Json::Value listening =
+      Device::JsonObject({{"kind", Device::kKindListening}, {"address", bound}});
+  Device::SendMessage(STDIN_FILENO, Device::ToText(listening), -1);
+  front_end.listen_after_bind();
 }
 
 }  // namespace

@@ -3,9 +3,7 @@
 #include <algorithm>
 #include <array>
 
-#include "device/base/json_text.h"
 #include "device/web/connection.h"
-#include "device/web/request_head.h"
 
 namespace Web {
 
@@ -26,21 +24,8 @@ void Refuse(Response& response, int status, const std::string& reason) {
   Respond(response, Device::Refusal(status, reason));
 }
 
-Json::Value Asked(const Request& request, const char* kind) {
-  return Device::JsonObject({{"kind", kind},
-                             {"session", SessionOf(request)},
-                             {"client", Connection::OfThisThread().Client()}});
-}
-
-Asking Ask(Device::ControlKind kind, const Json::Value& asked) {
-  Connection::OfThisThread().EndReading();
-  return std::make_shared<Exchange>(kind, Device::ToText(asked));
-}
-
-Asking Ask(const Json::Value& asked) { return Ask(Device::ControlKind::kRequest, asked); }
-
 void PassOn(const Request& request, Response& response, const Device::Answer& answer,
-            const Asking& exchange) {
+            const std::shared_ptr<Exchange>& exchange) {
   Respond(response, answer);
   if (exchange->BodyLeft() == 0) {
     return;
@@ -60,25 +45,6 @@ void PassOn(const Request& request, Response& response, const Device::Answer& an
   } else {
     response.set_header("Content-Length", std::to_string(exchange->BodyLeft()));
     response.set_content_provider(kJson, pass);
-  }
-}
-
-void PassOn(const Request& request, Response& response, const Asking& exchange) {
-  PassOn(request, response, exchange->Receive(), exchange);
-}
-
-const char* ReasonFor(int status) {
-  switch (status) {
-    case Device::kHttpNotFound:
-      return "no such route";
-    case Device::kHttpTimeout:
-      return "the body takes too long";
-    case Device::kHttpTooLarge:
-      return "the body is too long";
-    case Device::kHttpInternal:
-      return "the front end has failed";
-    default:
-      return "not a request that is understood";
   }
 }
 

@@ -15,25 +15,13 @@ namespace Web {
 inline constexpr std::chrono::seconds kAnswerTime(60);  // to take a part of an answer, an event
 inline constexpr char kJson[] = "application/json";
 
-using Asking = std::shared_ptr<Exchange>;
-
-// What the launcher is asked, as far as all requests are alike.
-Json::Value Asked(const httplib::Request& request, const char* kind);
-
-// Has the request served by a process of the launcher's.
-Asking Ask(Device::ControlKind kind, const Json::Value& asked);
-Asking Ask(const Json::Value& asked);
-
 void Respond(httplib::Response& response, const Device::Answer& answer);
 void Refuse(httplib::Response& response, int status, const std::string& reason);
-// What is said of a status that comes without a body.
-const char* ReasonFor(int status);
 
 // Passes on an answer and then its body, part by part: the request process waits until the client
 // has taken a part before it can send more.
 void PassOn(const httplib::Request& request, httplib::Response& response,
-            const Device::Answer& answer, const Asking& exchange);
-void PassOn(const httplib::Request& request, httplib::Response& response, const Asking& exchange);
+            const Device::Answer& answer, const std::shared_ptr<Exchange>& exchange);
 
 // Reads the body. False, with the response's status, when it is none, too long or late, or breaks
 // off.
