@@ -80,6 +80,10 @@ std::string ClientOf(int socket) {
 
 }  // namespace
 
+std::string OwnAddress(int socket, int& port) {
+  return NameOf(AddressOf(socket, getsockname), port);
+}
+
 Connection::Connection(int socket) : socket_(socket), client_(ClientOf(socket)) {
   this_threads_connection = this;
   BeginReading(client_, kHeadTime);
@@ -160,7 +164,7 @@ void Connection::get_remote_ip_and_port(std::string& ip, int& port) const {
 }
 
 void Connection::get_local_ip_and_port(std::string& ip, int& port) const {
-  ip = NameOf(AddressOf(socket_, getsockname), port);
+  ip = OwnAddress(socket_, port);
 }
 
 void ConnectionThreads::enqueue(std::function<void()> connection) {

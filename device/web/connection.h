@@ -64,6 +64,9 @@ class Connection : public httplib::Stream {
   std::size_t allowed_ = kMostHeadBytes;
 };
 
+// The numeric address, and the port, at this machine's end.
+std::string OwnAddress(int socket, int& port);
+
 class ConnectionThreads : public httplib::TaskQueue {
  public:
   void enqueue(std::function<void()> connection) override;

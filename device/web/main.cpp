@@ -2,20 +2,23 @@
 // socket, FD the folder of the page, SOCKET where to listen instead, or -1. Gives up root's rights
 // before it serves anybody.
 #include <grp.h>
-#include <netdb.h>
 #include <poll.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/signalfd.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <csignal>
+#include <cstdint>
 #include <cstdlib>
 #include <iostream>
 #include <stdexcept>
 #include <string>
 #include <thread>
+#include <utility>
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
@@ -45,25 +48,21 @@ void AllowManyDescriptors() {
   setrlimit(RLIMIT_NOFILE, &limit);
 }
 
-struct Address {
-  std::string host;  // without brackets
-  int port = 0;
-};
-
-Address ParseAddress(const std::string& listen) {
-  constexpr long kLastPort = 65535;
-  const std::size_t colon = listen.rfind(':');
-  char* end = nullptr;
-  const std::string port = colon == std::string::npos ? "" : listen.substr(colon + 1);
-  const long number = std::strtol(port.c_str(), &end, 10);
-  if (colon == 0 || port.empty() || *end != 0 || number < 0 || number > kLastPort) {
+// The host, without brackets, and the port.
+std::pair<std::string, std::uint16_t> ParseAddress(const std::string& listen) {
+  std::uint16_t port = 0;
+  const std::size_t colon = std::min(listen.rfind(':'), listen.size());
+  const std::string digits = listen.substr(std::min(colon + 1, listen.size()));
+  const char* const end = digits.data() + digits.size();
+  const auto [at, error] = std::from_chars(digits.data(), end, port);
+  if (colon == 0 || at != end || error != std::errc()) {
     throw std::runtime_error("'" + listen + "' is not ADDRESS:PORT");
   }
   std::string host = listen.substr(0, colon);
   if (host.front() == '[' && host.back() == ']') {
     host = host.substr(1, host.size() - 2);
   }
-  return {host, static_cast<int>(number)};
+  return {host, port};
 }
 
 // Ends the process when the launcher asks or is gone.
@@ -78,20 +77,16 @@ void WaitForTheEnd(const sigset_t& ending, Web::FrontEnd& front_end) {
 
 // Of a socket that is bound, as ADDRESS:PORT.
 std::string AddressOf(int socket) {
-  sockaddr_storage address{};
-  socklen_t size = sizeof address;
-  char host[NI_MAXHOST] = "";
-  char port[NI_MAXSERV] = "";
-  getsockname(socket, reinterpret_cast<sockaddr*>(&address), &size);
-  getnameinfo(reinterpret_cast<sockaddr*>(&address), size, host, sizeof host, port, sizeof port,
-              NI_NUMERICHOST | NI_NUMERICSERV);
-  return (address.ss_family == AF_INET6 ? "[" + std::string(host) + "]" : host) + ":" + port;
+  int port = 0;
+  const std::string host = Web::OwnAddress(socket, port);
+  return (host.find(':') == std::string::npos ? host : "[" + host + "]") + ":" +
+         std::to_string(port);
 }
 
 // Binds the port that was asked for, and returns the address.
 std::string Bind(const std::string& listen, Web::FrontEnd& front_end) {
-  const Address address = ParseAddress(listen);
-  const int port = front_end.Bind(address.host, address.port);
+  const auto [host, asked] = ParseAddress(listen);
+  const int port = front_end.Bind(host, asked);
   if (port < 0 && errno == 0) {
     throw std::runtime_error("cannot listen on " + listen + ": no such address");
   }
