@@ -55,6 +55,17 @@ auto Find(const std::string& id) {
                       [&](const Session& each) { return each.id == id; });
 }
 
+// In place of that of a user who is not there: one that costs what looking at a user's does.
+std::string HashFor(const std::string& name) {
+  std::vector<std::string> hashes;
+  for (const User& user : TheDevice().config.users) {
+    if (!user.password.empty()) {
+      hashes.push_back(user.password);
+    }
+  }
+  return hashes.empty() ? kNobodysHash : hashes[std::hash<std::string>()(name) % hashes.size()];
+}
+
 }  // namespace
 
 std::string SignIn(const std::string& user) {
@@ -84,21 +95,6 @@ std::string UserOfSession(const std::string& session_id) {
   const auto found = Find(session_id);
   return found == Sessions().end() || *found->has_ended ? "" : found->user;
 }
-
-namespace {
-
-// In place of that of a user who is not there: one that costs what looking at a user's does.
-std::string HashFor(const std::string& name) {
-  std::vector<std::string> hashes;
-  for (const User& user : TheDevice().config.users) {
-    if (!user.password.empty()) {
-      hashes.push_back(user.password);
-    }
-  }
-  return hashes.empty() ? kNobodysHash : hashes[std::hash<std::string>()(name) % hashes.size()];
-}
-
-}  // namespace
 
 bool IsPassword(const std::string& user, const std::string& password) {
   const User* const known = TheDevice().config.FindUser(user);

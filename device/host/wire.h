@@ -25,8 +25,6 @@
 #include <utility>
 #include <vector>
 
-#include "device/base/file_descriptor.h"
-
 namespace Device {
 
 enum HttpStatus : int {
