@@ -159,10 +159,6 @@ ssize_t Connection::write(const char* from, std::size_t size) {
              : -1;
 }
 
-void Connection::get_remote_ip_and_port(std::string& ip, int& port) const {
-  ip = NameOf(AddressOf(socket_, getpeername), port);
-}
-
 void Connection::get_local_ip_and_port(std::string& ip, int& port) const {
   ip = OwnAddress(socket_, port);
 }
@@ -191,14 +187,6 @@ void ConnectionThreads::enqueue(std::function<void()> connection) {
   } catch (const std::system_error&) {
     serve();  // there is no thread to be had: others wait meanwhile
   }
-}
-
-bool Server::process_and_close_socket(socket_t socket) {
-  Connection connection(socket);
-  bool is_closed = false;
-  // One request each. What a refused one leaves unread, or its length read in another way by a
-  // proxy, would be taken for the next one, which the refusal was to prevent.
-  return process_request(connection, true, is_closed, nullptr);
 }
 
 }  // namespace Web

@@ -43,7 +43,7 @@ class Connection : public httplib::Stream {
   ssize_t read(char* to, std::size_t size) override;
   using Stream::write;
   ssize_t write(const char* from, std::size_t size) override;
-  void get_remote_ip_and_port(std::string& ip, int& port) const override;
+  void get_remote_ip_and_port(std::string& ip, int& /*port*/) const override { ip = client_; }
   void get_local_ip_and_port(std::string& ip, int& port) const override;
   socket_t socket() const override { return socket_; }
 
@@ -71,16 +71,6 @@ class ConnectionThreads : public httplib::TaskQueue {
  public:
   void enqueue(std::function<void()> connection) override;
   void shutdown() override {}  // they end with the process
-};
-
-// A server whose connections are the above.
-class Server : public httplib::Server {
- public:
-  // Serves the connections that come in on a socket which listens already.
-  void Take(int socket) { svr_sock_ = socket; }
-
- private:
-  bool process_and_close_socket(socket_t socket) override;
 };
 
 }  // namespace Web

@@ -3,14 +3,14 @@
 #include <poll.h>
 #include <sys/socket.h>
 
-#include <algorithm>
-#include <array>
+#include <cerrno>
 #include <chrono>
 #include <memory>
 #include <stdexcept>
 
 #include "device/base/json_text.h"
 #include "device/host/body.h"
+#include "device/web/connection.h"
 #include "device/web/download.h"
 #include "device/web/request_head.h"
 #include "device/web/responses.h"
@@ -161,6 +161,14 @@ FrontEnd::FrontEnd(const PageFiles& page) {
   });
   AddPage(page);
   AddRoutes();
+}
+
+bool FrontEnd::process_and_close_socket(socket_t socket) {
+  Connection connection(socket);
+  bool is_closed = false;
+  // One request each. What a refused one leaves unread, or its length read in another way by a
+  // proxy, would be taken for the next one, which the refusal was to prevent.
+  return process_request(connection, true, is_closed, nullptr);
 }
 
 void FrontEnd::AddPage(const PageFiles& page) {

@@ -8,22 +8,24 @@
 #include <memory>
 #include <string>
 
-#include "device/web/connection.h"
 #include "device/web/exchange.h"
 #include "device/web/page_files.h"
 
 namespace Web {
 
-class FrontEnd : public Server {
+class FrontEnd : public httplib::Server {
  public:
   explicit FrontEnd(const PageFiles& page);
 
   // Binds the port, any free one for 0, and returns it; -1 with errno when that fails.
   int Bind(const std::string& address, int port);
+  // Listens there.
+  void Take(int socket) { svr_sock_ = socket; }
   // Lets the requests that are being served end, for a while.
   void End();
 
  private:
+  bool process_and_close_socket(socket_t socket) override;
   void AddRoutes();
   void AddPage(const PageFiles& page);
   void Ask(const std::string& kind, const httplib::Request& request, httplib::Response& response);

@@ -24,6 +24,7 @@
 #include "device/base/json_text.h"
 #include "device/base/socket_message.h"
 #include "device/host/wire.h"
+#include "device/web/connection.h"
 #include "device/web/front_end.h"
 
 namespace {
