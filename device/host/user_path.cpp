@@ -15,23 +15,20 @@
 
 namespace Device {
 
-Refused::Refused(int http_status, int code)
+Refused::Refused(int code)
     : std::runtime_error(ErrorText(code)),
-      answer(http_status, JsonObject({{"code", code}, {"error", ErrorText(code)}})) {}
+      answer(code == KAVO::kErrNoPrivilege || code == KAVO::kErrOutsideShare ? kHttpForbidden
+                                                                             : kHttpNotFound,
+             JsonObject({{"code", code}, {"error", ErrorText(code)}})) {}
 
 namespace {
 
-[[noreturn]] void RefuseFor(int code) {
-  const bool is_forbidden = code == KAVO::kErrNoPrivilege || code == KAVO::kErrOutsideShare;
-  throw Refused(is_forbidden ? kHttpForbidden : kHttpNotFound, code);
-}
-
 [[noreturn]] void RefuseForErrno() {
   if (errno == ELOOP) {
-    RefuseFor(KAVO::kErrOutsideShare);
+    throw Refused(KAVO::kErrOutsideShare);
   }
   SetLastErrno(errno);
-  RefuseFor(LumoLibGetErr());
+  throw Refused(LumoLibGetErr());
 }
 
 }  // namespace
@@ -39,10 +36,10 @@ namespace {
 ResolvedPath ResolveForUser(const std::string& user, const std::string& path) {
   ResolvedPath resolved = Resolve(user, path);
   if (resolved.error != 0) {
-    RefuseFor(resolved.error);
+    throw Refused(resolved.error);
   }
   if (AccessOf(resolved, user) == Access::kNone) {
-    RefuseFor(KAVO::kErrNoPrivilege);
+    throw Refused(KAVO::kErrNoPrivilege);
   }
   return resolved;
 }

@@ -18,7 +18,7 @@ struct Refused : std::runtime_error {
   explicit Refused(int http_status, const std::string& reason)
       : std::runtime_error(reason), answer(Refusal(http_status, reason)) {}
   // With a KAVO::ErrorCode and its words.
-  Refused(int http_status, int code);
+  explicit Refused(int code);
 
   Answer answer;
 };
