@@ -33,15 +33,10 @@ int CheckFolder(const std::string& user, const ResolvedPath& path, const std::st
 
 const char* FolderText(int code, const std::string& folder) {
   struct stat status {};
-  switch (code) {
-    case KAVO::kErrNotFound:
-      return lstat(folder.c_str(), &status) == 0 ? "this is not a folder"
-                                                 : "there is no such folder";
-    case KAVO::kErrNoPrivilege:
-      return "you may not write in this folder";
-    default:
-      return ErrorText(code);
+  if (code == KAVO::kErrNotFound) {
+    return lstat(folder.c_str(), &status) == 0 ? "this is not a folder" : "there is no such folder";
   }
+  return code == KAVO::kErrNoPrivilege ? "you may not write in this folder" : ErrorText(code);
 }
 
 bool IsTaken(const FileDescriptor& folder, const std::string& name, struct stat& status) {
