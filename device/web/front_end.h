@@ -1,4 +1,4 @@
-// The HTTP routes. A route turns a request into a frame for the launcher and its answer into a
+// The HTTP routes. A route turns a request into a message to the launcher and its answer into a
 // response; it knows neither users nor files.
 #pragma once
 
@@ -21,7 +21,7 @@ class FrontEnd : public httplib::Server {
   int Bind(const std::string& address, int port);
   // Listens there.
   void Take(int socket) { svr_sock_ = socket; }
-  // Lets the requests that are being served end, for a while.
+  // Waits a while for the POST requests that are being served.
   void End();
 
  private:
