@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <malloc.h>
 #include <poll.h>
-#include <sched.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
