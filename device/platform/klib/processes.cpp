@@ -158,12 +158,12 @@ void BecomeWorker(uid_t user, Pipe& entered) {
   // more than each job does.
   setpgid(0, 0);
   std::signal(SIGTERM, SIG_DFL);  // the host may have a handler, which ends nothing
+  EnterQueue(user);
+  entered.writer.Close();
   const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   dup2(null.Get(), STDIN_FILENO);
   dup2(null.Get(), STDOUT_FILENO);
   TheHost().leave_request();
-  EnterQueue(user);
-  entered.writer.Close();
   WaitForTurn();
 }
 
