@@ -105,6 +105,8 @@ Outcome Launcher::CallHere(const Request& request) {
   KAVO::APIRequest api_request{&request_state};
   KAVO::APIResponse api_response{&response_state};
   row->handler(&api_request, &api_response);
+  char none = 0;
+  ReadAll(TheHost().worker_entered.Get(), &none, 1);
   return response_state.outcome;
 }
 

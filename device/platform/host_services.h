@@ -7,6 +7,8 @@
 #include <functional>
 #include <string>
 
+#include "device/base/file_descriptor.h"
+
 namespace Device {
 
 struct HostServices {
@@ -17,6 +19,9 @@ struct HostServices {
   std::function<void()> leave_request = [] {};
   // The worker that this request has forked; 0: none.
   pid_t worker = 0;
+  // Comes to its end when that worker has its place in the queue. The request's answer waits for it:
+  // no job that is started later is to come before.
+  FileDescriptor worker_entered;
   // The task that the process is about; empty: none.
   std::string task;
   // Whether the desktop is to be told of the end of the tasks that the process makes.

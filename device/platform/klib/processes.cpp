@@ -176,7 +176,7 @@ pid_t ForkWorker() {
       syslog(LOG_ERR, "fork worker: the user has too many jobs");
       return KlibError(EAGAIN);
     }
-    Pipe entered;  // closes when the worker has its place in the queue, before any that comes later
+    Pipe entered;
     ChildProcess worker = ChildProcess::Fork();
     if (worker.Pid() == 0) {
       if (!TryOrLog("worker", [&] { BecomeWorker(user, entered); })) {
@@ -185,9 +185,7 @@ pid_t ForkWorker() {
     } else {
       RegisterWorker(CurrentUser(), worker.Pid());
       TheHost().worker = worker.Pid();
-      entered.writer.Close();
-      char none = 0;
-      (void)!TEMP_FAILURE_RETRY(read(entered.reader.Get(), &none, 1));
+      TheHost().worker_entered = std::move(entered.reader);
     }
     return worker.Release();
   } catch (const std::exception& error) {

@@ -16,6 +16,7 @@
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
 #include "device/platform/vesk/task_state.h"
+#include "device/tasks/leftovers.h"
 #include "device/tasks/user_tasks.h"
 #include "device/tasks/workers.h"
 
@@ -134,8 +135,10 @@ void CleanTimeOutTasks(const char* user) {
 int DoKill(int pid) {
   return Operation("DoKill", pid).Run([&] {
     bool is_gone = false;
-    Device::TryOrLog("kill worker",
-                     [&] { is_gone = Device::EndWorker(Device::CurrentUser(), pid); });
+    Device::TryOrLog("kill worker", [&] {
+      is_gone = Device::EndWorker(Device::CurrentUser(), pid);
+      Device::RemoveLeftovers(Device::CurrentUser());
+    });
     return is_gone ? 1 : 0;
   });
 }
