@@ -11,6 +11,7 @@
 #include "device/base/child_process.h"
 #include "device/base/fence.h"
 #include "device/base/open_below.h"
+#include "device/base/random_id.h"
 #include "device/base/work_folder.h"
 #include "tests/device_fixture.h"
 #include "tests/libc_calls.h"
@@ -184,6 +185,42 @@ TEST_F(TrustTest, WhatKilledJobsLeaveGoesWithTheNextAndNothingElseDoes) {
   EXPECT_EQ(jobs_folders(), Strings{own});
   EXPECT_TRUE(fs::exists(own + "/newsletter.txt"));
   EXPECT_TRUE(StagedPaths().empty());
+}
+
+// Lists of which nothing is noted: their workers were killed while they wrote them, or are of
+// another device.
+TEST_F(TrustTest, OldListsAreRemovedWithTheNextJob) {
+  const auto unused = [] { return "/tmp/lumozip" + Device::RandomId(1).substr(2); };
+  const std::string of_links = unused();
+  const std::string of_bob = unused();
+  const struct {
+    std::string path;
+    int age;  // seconds
+    uid_t owner;
+    bool stays;
+  } rows[] = {{unused(), 3600, kAlice, false},
+              {unused(), 60, kAlice, true},
+              {unused(), 3600, kBob, true},
+              {unused() + ".txt", 3600, kAlice, true},
+              {of_links + "/lumozip-inner", 3600, kAlice, false},
+              {of_links + "/newsletter.txt", 3600, kAlice, true},
+              {of_bob + "/lumozip-inner", 3600, kAlice, true}};
+  for (const auto& row : rows) {
+    WriteFile(row.path, "list");
+    chmod(row.path.c_str(), 0600);
+    chown(row.path.c_str(), row.owner, 65100);
+    fs::last_write_time(row.path, fs::file_time_type::clock::now() - std::chrono::seconds(row.age));
+  }
+  chown(of_links.c_str(), kAlice, 65100);
+  chown(of_bob.c_str(), kBob, 65100);
+  chmod(of_links.c_str(), 0700);
+  chmod(of_bob.c_str(), 0755);
+  RunJob(JobParams({"/photo/beside"}, "/photo/z.zip"));
+  for (const auto& row : rows) {
+    EXPECT_EQ(fs::remove(row.path), row.stays) << row.path;
+  }
+  fs::remove(of_links);
+  fs::remove(of_bob);
 }
 
 TEST_F(TrustTest, AFailedJobTouchesNothingThatIsNoArchive) {

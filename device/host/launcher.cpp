@@ -175,6 +175,7 @@ void RemoveLeftoversOfAll() {
   for (const User& user : TheDevice().config.users) {
     ChildProcess::Run([&] {
       if (LumoLibUGIDSet(nullptr, user.name.c_str()) == 0) {
+        RemoveOldLists();
         RemoveLeftovers(user.name);
       }
       return 0;

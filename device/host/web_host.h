@@ -33,8 +33,8 @@ class WebHost {
   // The line to print about an ADDRESS:PORT that is served from now on.
   using Announcement = std::function<std::string(const std::string& address)>;
 
-  // `listen` is ADDRESS:PORT. Takes the
-  // open device for this process alone; throws std::runtime_error when another serves it.
+  // `listen` is ADDRESS:PORT. Takes the open device for this process alone; throws
+  // std::runtime_error when another serves it.
   WebHost(FrontEndFiles files, std::string listen, Announcement announcement);
   ~WebHost();
   WebHost(const WebHost&) = delete;

@@ -19,8 +19,8 @@ struct HostServices {
   std::function<void()> leave_request = [] {};
   // The worker that this request has forked; 0: none.
   pid_t worker = 0;
-  // Comes to its end when that worker has its place in the queue. The request's answer waits for it:
-  // no job that is started later is to come before.
+  // Comes to its end when that worker has its place in the queue. The request's answer waits for
+  // it: no job that is started later is to come before.
   FileDescriptor worker_entered;
   // The task that the process is about; empty: none.
   std::string task;

@@ -164,6 +164,7 @@ void BecomeWorker(uid_t user, Pipe& entered) {
   dup2(null.Get(), STDIN_FILENO);
   dup2(null.Get(), STDOUT_FILENO);
   TheHost().leave_request();
+  RemoveOldLists();
   WaitForTurn();
 }
 
