@@ -22,17 +22,17 @@ export class Destination {
     return !existing.hidden;
   }
 
-  askLater(path, format, milliseconds) {
+  askLater(path, milliseconds) {
     this.stop();
-    this.#later = setTimeout(() => this.ask(path, format), milliseconds);
+    this.#later = setTimeout(() => this.ask(path), milliseconds);
   }
 
   // Null when the device does not say, or a later question has overtaken this one.
-  async ask(path, format) {
+  async ask(path) {
     this.stop();
     const { signal } = this.#asked = new AbortController();
     try {
-      const answer = await checkDestination(path, format, signal);
+      const answer = await checkDestination(path, signal);
       if (signal.aborted) return null;
       this.#show(answer, path, signal);
       this.#onAnswer(answer);
@@ -56,7 +56,8 @@ export class Destination {
   async #show({ exists, error, size, modified, free_name: freeName }, path, signal) {
     existing.hidden = !exists || Boolean(error);
     if (existing.hidden) return;
-    byId('free-name').textContent = shown(freeName);
+    existing.querySelector('input').disabled = !freeName;
+    byId('free-name').textContent = freeName ? shown(freeName) : 'no name, as with a number it would be too long';
     const known = `${sizeText(size)}, changed ${dateText(modified)}`;
     setText(facts, known);
     const inside = await listArchive(path, signal).then(archiveText, ({ message }) => `cannot be read: ${message}`);

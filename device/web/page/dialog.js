@@ -125,7 +125,7 @@ export class CompressDialog {
   #look(milliseconds) {
     this.#destination.hide();
     if (formatOf(name.value) && this.#folder().startsWith(ROOT)) {
-      this.#destination.askLater(join(this.#folder(), name.value), format.value, milliseconds);
+      this.#destination.askLater(join(this.#folder(), name.value), milliseconds);
     }
   }
 
@@ -151,17 +151,26 @@ export class CompressDialog {
   async #start() {
     const wasChoiceShown = this.#destination.isChoiceShown;
     const draft = this.draft;
-    const place = await this.#destination.ask(join(draft.folder, draft.name), draft.format);
+    const place = await this.#destination.ask(join(draft.folder, draft.name));
     form.querySelector('[aria-invalid]')?.focus();
     if (!dialog.open || place?.error) return;
-    if (place?.exists && !wasChoiceShown) {
-      form.elements.mode.value = KEEP_BOTH;
-      byId('existing').querySelector('input').focus();
+    if (!place) {
+      setText(generalError, 'The device did not say what is at this place. Try again.');
       return;
     }
-    const isKept = place?.exists && draft.mode === KEEP_BOTH;
+    if (place.exists && !wasChoiceShown) {
+      form.elements.mode.value = KEEP_BOTH;
+      byId('existing').querySelector('input:enabled').focus();
+      return;
+    }
+    const isKept = place.exists && draft.mode === KEEP_BOTH;
+    if (isKept && !place.free_name) {
+      showError(name, 'With a number, the name would be too long. Choose another, or what becomes of the archive.');
+      name.focus();
+      return;
+    }
     if (isKept) draft.name = place.free_name;
-    const mode = place?.exists && !isKept ? draft.mode : ADD;
+    const mode = place.exists && !isKept ? draft.mode : ADD;
     const path = join(draft.folder, draft.name);
     const taskid = await startTask(draft.sources, path, {
       format: draft.format,
