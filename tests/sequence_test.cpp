@@ -2,7 +2,6 @@
 // stand in tests/sequences. Failures are tested against their beginnings.
 #include <gmock/gmock.h>
 
-#include "device/model/device.h"
 #include "device/platform/operations.h"
 #include "tests/device_fixture.h"
 

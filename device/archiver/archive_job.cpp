@@ -138,8 +138,8 @@ std::vector<std::string> MemorySwitches(const Request& request, std::uint64_t me
     text += " " + each;
   }
   if (!text.empty()) {
-    syslog(LOG_NOTICE, "%s: within %" PRIu64 " MiB of memory by%s", request.archive.c_str(),
-           memory >> 20U, text.c_str());
+    syslog(LOG_NOTICE, "%s: within %" PRIu64 " MiB of memory by%s",
+           NameInError(request.archive).c_str(), memory >> 20U, text.c_str());
   }
   return switches;
 }

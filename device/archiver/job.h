@@ -1,7 +1,6 @@
 #pragma once
 
 #include <string>
-#include <vector>
 
 #include "device/archiver/cancel.h"
 #include "device/archiver/command_line.h"

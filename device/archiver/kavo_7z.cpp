@@ -13,7 +13,6 @@
 #include <fstream>
 #include <limits>
 #include <optional>
-#include <utility>
 
 #include "device/archiver/archive_job.h"
 #include "device/archiver/cancel.h"

@@ -102,7 +102,7 @@ std::vector<std::string> FindSpecials(const WorkPlace& place,
                                       const std::vector<std::string>& excluded) {
   Scan scan(!place.shares.empty(), excluded);
   for (const std::string& source : sources) {
-    scan.Visit(OpenSource(place, source, O_PATH), source);
+    scan.Visit(OpenSource(place, source), source);
   }
   return std::move(scan.found);
 }
@@ -112,7 +112,7 @@ Device::FileDescriptor MirrorSpecials(const WorkPlace& place,
   const fs::path mirror = Device::PathOf(work_folder) + "/" + Device::kWorkMirror;
   fs::create_directory(mirror);
   for (const std::string& special : specials) {
-    const Device::FileDescriptor original = OpenSource(place, special, O_PATH);
+    const Device::FileDescriptor original = OpenSource(place, special);
     const fs::path copy = mirror / special;
     const struct stat info = Status(original.Get(), "", AT_EMPTY_PATH);
     fs::create_directories(copy.parent_path());

@@ -81,14 +81,14 @@ WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::stri
   return place;
 }
 
-Device::FileDescriptor OpenSource(const WorkPlace& place, const std::string& source, int flags) {
+Device::FileDescriptor OpenSource(const WorkPlace& place, const std::string& source) {
   const size_t slash = source.find('/');
   const auto share = place.shares.find(source.substr(0, slash));
   Device::FileDescriptor opened =
-      share == place.shares.end() ? Device::OpenBelow(place.folder.Get(), source, flags)
+      share == place.shares.end() ? Device::OpenBelow(place.folder.Get(), source, O_PATH)
       : slash == std::string::npos
-          ? Device::OpenBelow(share->second.Get(), ".", flags)
-          : Device::OpenBelow(share->second.Get(), source.substr(slash + 1), flags);
+          ? Device::OpenBelow(share->second.Get(), ".", O_PATH)
+          : Device::OpenBelow(share->second.Get(), source.substr(slash + 1), O_PATH);
   if (!opened && errno == ELOOP) {
     throw NamedFailure(kCannotPack, source, "it lies behind a symbolic link");
   }
@@ -105,7 +105,7 @@ std::unordered_set<std::string> AllowSources(const WorkPlace& place,
   bool is_listed = false;
   for (const std::string& source : sources) {
     is_listed = is_listed || source.find_first_of(kWildcards) != std::string::npos;
-    const Device::FileDescriptor opened = OpenSource(place, source, O_PATH);
+    const Device::FileDescriptor opened = OpenSource(place, source);
     struct stat info {};
     if (fstat(opened.Get(), &info) != 0) {
       throw SystemFailure(kCannotPack, source, errno);

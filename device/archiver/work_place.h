@@ -14,8 +14,8 @@ namespace Archiver {
 // Where 7z runs so that it finds the sources under the names which the archive is to give them.
 struct WorkPlace {
   Device::FileDescriptor folder;
-  // What the first parts of sources that are links of a staging folder lead to, when only following
-  // links leads through them; empty otherwise.
+  // By a source's first part: the shared folder, where 7z gets there only by following the staging
+  // folder's link. Empty when 7z follows none.
   std::map<std::string, Device::FileDescriptor> shares;
 };
 
@@ -25,9 +25,9 @@ struct WorkPlace {
 // packed from there, without any link; only what is scattered needs following.
 WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::string& list_path);
 
-// A source, or what lies below one. Follows no link but those of a staging folder; a link is opened
-// itself with O_PATH. Throws Failure.
-Device::FileDescriptor OpenSource(const WorkPlace& place, const std::string& source, int flags);
+// A source, or what lies below one, opened as a path (O_PATH). Follows no link but those of a
+// staging folder. Throws Failure.
+Device::FileDescriptor OpenSource(const WorkPlace& place, const std::string& source);
 
 // Opens each source and allows it to 7z: nothing that takes its place afterwards is allowed.
 // Returns the sources that are no plain files. Throws Failure for a source that is missing or lies

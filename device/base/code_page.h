@@ -9,7 +9,8 @@
 
 namespace Device {
 
-// A character set that agrees with ASCII on what makes a path, by its IANA name or as "CPnnn".
+// A character set that agrees with ASCII on what makes a path, by its IANA name or as "CPnnn" or
+// "nnn".
 class CodePage {
  public:
   // Null for a name that is unknown or cannot serve in file names.

@@ -24,7 +24,7 @@ class Fence {
   void AllowListing(int fd);
   // A folder and the files in it. Throws std::system_error.
   void AllowWriting(int fd);
-  // A program. Throws std::system_error.
+  // A program, or a folder of programs and libraries. Throws std::system_error.
   void AllowRunning(int fd);
 
   // Confines the calling process, for good. False, with errno, when it cannot. Safe after vfork.

@@ -6,7 +6,6 @@
 
 #include <cstdio>
 #include <new>
-#include <string>
 
 #include "device/base/file_io.h"
 

@@ -38,8 +38,9 @@ class WorkFolder {
   FileDescriptor mark_;
 };
 
-// Removes a work folder whose job is gone. Leaves alone what is not the caller's, bears no mark or
-// is in use, and what no job has put there. False when one of a job's stays, to be tried again.
+// Removes a work folder whose job is gone. Leaves alone what is not the caller's or is in use,
+// what bears no mark unless it is empty, and what no job has put there. False when one of a job's
+// stays, to be tried again.
 bool RemoveStaleWorkFolder(const FileDescriptor& parent, const std::string& name);
 
 }  // namespace Device

@@ -1,13 +1,12 @@
 // "call": one request through the module.
-#include <iostream>
 #include <stdexcept>
 
 #include "device/base/json_text.h"
 #include "device/cli/client.h"
 #include "device/cli/commands.h"
+#include "device/cli/output.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
-#include "device/model/device.h"
 
 namespace Device {
 
@@ -47,9 +46,7 @@ int CallCommand(const Target& target, const CallOptions& options) {
     AddParam(param, request.params);
   }
   const Outcome outcome = launcher.Call(request);
-  // Built by hand, so that the code comes first.
-  std::cout << R"({"code":)" << outcome.code << R"(,"data":)" << ToText(outcome.data) << "}\n"
-            << std::flush;
+  PrintJson(JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
   return outcome.code == 0 ? kExitDone : kExitFailed;
 }
 

@@ -9,9 +9,9 @@
 #include "device/host/sessions.h"
 #include "device/model/device.h"
 #include "device/platform/lumo/errors.h"
+#include "device/platform/lumo/identity.h"
 #include "device/tasks/job_queue.h"
 #include "device/tasks/user_tasks.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -29,7 +29,7 @@ Json::Value AskAs(const std::string& user, const std::function<Json::Value()>& b
   FileDescriptor stream;
   const std::optional<Json::Value> answer = AskProcess(stream, [&] {
     try {
-      if (LumoLibUGIDSet(nullptr, user.c_str()) < 0) {
+      if (SwitchTo(nullptr, user.c_str()) < 0) {
         throw std::runtime_error("cannot take on the identity of '" + user + "'");
       }
       return JsonObject({{"result", body()}});

@@ -14,7 +14,6 @@
 #include "device/cli/commands.h"
 #include "device/cli/output.h"
 #include "device/cli/progress_bar.h"
-#include "device/model/device.h"
 #include "device/platform/lumo/paths.h"
 #include "platform/kavo/error_codes.h"
 

@@ -6,7 +6,6 @@
 #include <fstream>
 #include <iostream>
 #include <random>
-#include <stdexcept>
 
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"

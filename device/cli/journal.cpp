@@ -45,7 +45,7 @@ extern "C" void syslog(int priority, const char* format, ...) {
     if (!line.empty() && line.back() == '\n') {
       line.pop_back();
     }
-    line = Device::Printable(line, line.size());
+    line = Device::Printable(line);
     const std::string& task = Device::TheHost().task;
     if (!is_journal) {
       Pass(priority, "%s", line.c_str());

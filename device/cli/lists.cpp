@@ -11,7 +11,6 @@
 #include "device/host/task_events.h"
 #include "device/host/user_files.h"
 #include "device/platform/lumo/errors.h"
-#include "device/tasks/job_queue.h"
 #include "device/tasks/user_tasks.h"
 
 namespace Device {
@@ -61,14 +60,7 @@ int PrintList(const Target& target, const char* items, void (*print)(const Json:
 }  // namespace
 
 int TasksCommand(const Target& target) {
-  return PrintList(target, "tasks", PrintTask, [&] {
-    Json::Value list = JsonObject({{"tasks", Json::arrayValue}});
-    const auto waiting = WaitingWorkers();
-    for (const TaskRow& row : AllTasks(target.user)) {
-      list["tasks"].append(TaskView(row, waiting));
-    }
-    return list;
-  });
+  return PrintList(target, "tasks", PrintTask, [&] { return TaskList(target.user); });
 }
 
 int LsCommand(const Target& target, const std::string& folder) {

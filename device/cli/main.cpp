@@ -125,7 +125,7 @@ void AddCall(CLI::App& app, CommandLine& line) {
   AddTraceOptions(*command, line);
 }
 
-int Serve(const CommandLine& line) {
+int ServeCommand(const CommandLine& line) {
   Device::FrontEndFiles files;
   Device::OpenFor(line.target);
   const std::string& root = Device::TheDevice().root;
@@ -153,7 +153,7 @@ void AddCommands(CLI::App& app, CommandLine& line) {
              [&line] { return Device::NotificationsCommand(line.target); });
   AddCall(app, line);
   CLI::App* const serve = AddCommand(app, line, "serve", "Serve the device over HTTP", false,
-                                     [&line] { return Serve(line); });
+                                     [&line] { return ServeCommand(line); });
   serve->add_option("--listen", line.listen, "ADDRESS:PORT, unless systemd hands over a socket")
       ->capture_default_str();
   AddTraceOptions(*serve, line);

@@ -71,7 +71,7 @@ std::string Printable(const std::string& text, std::size_t most_bytes) {
 }
 
 std::string Shown(const std::string& name) {
-  return isatty(STDOUT_FILENO) != 0 ? Printable(name, name.size()) : name;
+  return isatty(STDOUT_FILENO) != 0 ? Printable(name) : name;
 }
 
 std::string StateText(const Json::Value& task) {
@@ -81,7 +81,7 @@ std::string StateText(const Json::Value& task) {
 }
 
 void PrintError(const std::string& reason) {
-  std::cerr << "kavo-device: " << Printable(reason, reason.size()) << '\n';
+  std::cerr << "kavo-device: " << Printable(reason) << '\n';
 }
 
 void PrintJson(const Json::Value& value) { std::cout << ToUtf8Text(value) << '\n'; }

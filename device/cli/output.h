@@ -24,7 +24,7 @@ bool FinishOutput();
 
 // The text's last bytes, so many at most, with "?" for control characters. On a terminal they take
 // no more columns than there are bytes.
-std::string Printable(const std::string& text, std::size_t most_bytes);
+std::string Printable(const std::string& text, std::size_t most_bytes = std::string::npos);
 // A name as it goes to standard output: printable on a terminal.
 std::string Shown(const std::string& name);
 

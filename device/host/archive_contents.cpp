@@ -10,7 +10,6 @@
 
 #include "device/base/child_process.h"
 #include "device/base/code_page.h"
-#include "device/base/file_io.h"
 #include "device/base/json_text.h"
 #include "device/base/open_below.h"
 #include "device/base/shortage.h"

@@ -37,7 +37,7 @@ std::string ContentDisposition(const std::string& name) {
 
 }  // namespace
 
-void SendFile(int stream, const std::string& user, const std::string& path) {
+void HandOverFile(int stream, const std::string& user, const std::string& path) {
   const ResolvedPath resolved = ResolveForUser(user, path);
   struct stat status {};
   const FileDescriptor file = OpenFileOf(user, resolved, status);

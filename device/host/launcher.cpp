@@ -14,15 +14,16 @@
 #include "device/base/child_process.h"
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/base/open_below.h"
 #include "device/base/shortage.h"
 #include "device/host/sessions.h"
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
 #include "device/platform/kavo/request.h"
+#include "device/platform/lumo/identity.h"
 #include "device/tasks/leftovers.h"
 #include "device/tasks/task_store.h"
 #include "platform/kavo/error_codes.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -34,7 +35,7 @@ std::string DlError() {
 }
 
 void* LoadModule() {
-  const std::string path = "/proc/self/fd/" + std::to_string(TheDevice().module.Get());
+  const std::string path = PathOf(TheDevice().module.Get());
   void* const module = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
   if (module == nullptr) {
     throw std::runtime_error("cannot load module: " + DlError());
@@ -174,7 +175,7 @@ void Launcher::Reap() {
 void RemoveLeftoversOfAll() {
   for (const User& user : TheDevice().config.users) {
     ChildProcess::Run([&] {
-      if (LumoLibUGIDSet(nullptr, user.name.c_str()) == 0) {
+      if (SwitchTo(nullptr, user.name.c_str()) == 0) {
         RemoveOldLists();
         RemoveLeftovers(user.name);
       }

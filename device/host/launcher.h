@@ -5,7 +5,6 @@
 #include <functional>
 #include <memory>
 #include <optional>
-#include <string>
 
 #include "device/base/file_descriptor.h"
 #include "device/platform/kavo/request.h"
@@ -13,9 +12,9 @@
 
 namespace Device {
 
-// Where the log lines of workers go that are written while this process may have ended.
+// Whether workers keep this process's standard error, which they may outlive.
 enum class WorkerLog {
-  kHere,       // to standard error, like those of the launcher
+  kHere,       // they log there, like the launcher
   kSyslogOnly  // who reads standard error to its end would else wait for the workers
 };
 

@@ -1,7 +1,6 @@
 #include <dirent.h>
 #include <fcntl.h>
 
-#include <cerrno>
 #include <memory>
 
 #include "device/base/json_text.h"

@@ -20,7 +20,7 @@ void AddEntry(std::string& entries, const std::string& name, const struct stat& 
 // Answers on the stream about a regular file with its HTTP headers alone, then with a message, the
 // user's name with the file's descriptor. The front end sends the content, so that a long download
 // needs no process of the user's.
-void SendFile(int stream, const std::string& user, const std::string& path);
+void HandOverFile(int stream, const std::string& user, const std::string& path);
 
 // Lists a zip or 7z as 7z does, which runs fenced and under the limit of memory that the request
 // has: {"format", "entries", as above, "count", "size", "complete", "encrypted"}. Not complete

@@ -23,11 +23,11 @@ struct Refused : std::runtime_error {
   Answer answer;
 };
 
-// Opens it by the identity of the process, which must be the user's; follows no link. Throws
-// Refused.
-FileDescriptor OpenForUser(const std::string& user, const ResolvedPath& path, int flags);
 // For a path that leads to no place where the user has access, throws Refused.
 ResolvedPath ResolveForUser(const std::string& user, const std::string& path);
+// Opens what a path was resolved to, by the identity of the process, which must be the user's;
+// follows no link. Throws Refused.
+FileDescriptor OpenForUser(const std::string& user, const ResolvedPath& path, int flags);
 
 // A regular file to be read, and no other is touched: to open a pipe or a device can have effects.
 // Throws Refused.

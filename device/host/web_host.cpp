@@ -20,6 +20,7 @@
 #include "device/base/child_process.h"
 #include "device/base/file_io.h"
 #include "device/base/json_text.h"
+#include "device/base/open_below.h"
 #include "device/base/socket_message.h"
 #include "device/host/web_request.h"
 #include "device/host/wire.h"
@@ -33,7 +34,6 @@ constexpr char kFrontEndProgram[] = "kavo-web";
 constexpr char kPageFolder[] = "page";
 constexpr int kRestartPauseMs = 500;
 constexpr std::chrono::seconds kFrontEndGrace(6);
-constexpr char kRetrySeconds[] = "10";
 
 // A lock that belongs to this process alone: no worker takes it along.
 FileDescriptor LockDevice() {
@@ -114,7 +114,7 @@ void WebHost::StartFrontEnd() {
   control_ = FileDescriptor(ends[0]);
   const FileDescriptor front_end_side(ends[1]);
   ProgramStart start;
-  start.program = "/proc/self/fd/" + std::to_string(files_.program.Get());
+  start.program = PathOf(files_.program.Get());
   start.arguments = {kFrontEndProgram, listen_, std::to_string(files_.page.Get()),
                      std::to_string(files_.socket.Get())};
   start.input = front_end_side.Get();
@@ -169,14 +169,14 @@ bool WebHost::TakeMessage() {
     return false;
   }
   try {
-    Serve(ParseJson(message->bytes), std::move(message->descriptor));
+    Dispatch(ParseJson(message->bytes), std::move(message->descriptor));
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "message of the front end: %s", error.what());
   }
   return std::cout.good();  // it does not serve where it could not say
 }
 
-void WebHost::Serve(const Json::Value& asked, FileDescriptor stream) {
+void WebHost::Dispatch(const Json::Value& asked, FileDescriptor stream) {
   const std::string kind = asked["kind"].asString();
   if (kind == kKindListening) {
     TakeAddress(asked["address"].asString());

@@ -40,8 +40,8 @@ class WebHost {
   WebHost(const WebHost&) = delete;
   WebHost& operator=(const WebHost&) = delete;
 
-  // Serves until SIGTERM or SIGINT. False when the front end cannot listen; it has said why. Jobs
-  // that are under way go on.
+  // Serves until SIGTERM, SIGINT or SIGHUP. False when the front end cannot listen; it has said
+  // why. Jobs that are under way go on.
   bool Run();
 
  private:
@@ -57,7 +57,7 @@ class WebHost {
 
   // False when the front end is gone.
   bool TakeMessage();
-  void Serve(const Json::Value& asked, FileDescriptor stream);
+  void Dispatch(const Json::Value& asked, FileDescriptor stream);
   void TakeAddress(const std::string& address);
   void TakeRequest(Json::Value asked, FileDescriptor stream);
   // Has the process started that is to answer, or refuses the request.

@@ -20,22 +20,22 @@
 #include "device/model/device.h"
 #include "device/platform/host_services.h"
 #include "device/platform/lumo/errors.h"
-#include "device/tasks/job_queue.h"
+#include "device/platform/lumo/identity.h"
 #include "device/tasks/task_store.h"
 #include "device/tasks/user_tasks.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
 namespace {
 
+// Beside what a process has at its start: some 64 MiB in all.
 constexpr std::size_t kMostMemory = std::size_t{57} << 20U;
 constexpr std::chrono::seconds kStorePatience(2);
 constexpr std::chrono::seconds kArchiveTime(15);
 constexpr std::chrono::seconds kSizeTime(30);
 
 void TakeIdentity(const std::string& session_id, const std::string& user) {
-  if (LumoLibUGIDSet(session_id.c_str(), user.c_str()) != 0) {
+  if (SwitchTo(session_id.c_str(), user.c_str()) != 0) {
     throw std::runtime_error("cannot take on the identity of '" + user + "'");
   }
 }
@@ -85,17 +85,6 @@ Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& a
              : Answer(kHttpOk, JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
 }
 
-Json::Value TasksBody(const std::string& user) {
-  Json::Value tasks(Json::arrayValue);
-  const auto waiting = WaitingWorkers();
-  for (const TaskRow& row : AllTasks(user)) {
-    if (HasData(row)) {
-      tasks.append(TaskView(row, waiting));
-    }
-  }
-  return JsonObject({{"tasks", tasks}});
-}
-
 Json::Value CodesBody() {
   Json::Value body(Json::objectValue);
   for (const auto& [code, text] : ErrorTexts()) {
@@ -129,7 +118,7 @@ Json::Value PathsOf(const Json::Value& asked, std::string body) {
   }
 }
 
-void Serve(Launcher& launcher, const Json::Value& asked) {
+void AnswerRequest(Launcher& launcher, const Json::Value& asked) {
   const int stream = launcher.AnswerStream().Get();
   const std::string kind = asked["kind"].asString();
   const std::string session_id = asked["session"].asString();
@@ -143,16 +132,16 @@ void Serve(Launcher& launcher, const Json::Value& asked) {
     answer(CodesBody());
   } else if (user.empty()) {
     SendAnswer(stream, Refusal(kHttpUnauthorized, "no session"));
-  } else if (kind == kKindCall) {
-    SendAnswer(stream, CallApi(launcher, user, asked, std::move(*sent)));
   } else if (kind == kKindSession) {
     answer(SessionBody(user));
   } else {
     TakeIdentity(session_id, user);
-    if (kind == kKindFiles) {
+    if (kind == kKindCall) {
+      SendAnswer(stream, CallApi(launcher, user, asked, std::move(*sent)));
+    } else if (kind == kKindFiles) {
       answer(ListFolder(user, *sent));
     } else if (kind == kKindDownload) {
-      SendFile(stream, user, *sent);
+      HandOverFile(stream, user, *sent);
     } else if (kind == kKindArchive) {
       answer(ListArchive(user, *sent, Patience(stream, kArchiveTime)));
     } else if (kind == kKindDestination) {
@@ -160,7 +149,7 @@ void Serve(Launcher& launcher, const Json::Value& asked) {
     } else if (kind == kKindSize) {
       answer(SizeOf(user, PathsOf(asked, std::move(*sent)), Patience(stream, kSizeTime)));
     } else if (kind == kKindTasks) {
-      answer(TasksBody(user));
+      answer(TaskList(user));
     } else {
       StreamEvents(stream, user, session_id);
     }
@@ -179,7 +168,7 @@ void ServeWebRequest(Launcher& launcher, FileDescriptor stream, const Json::Valu
   try {
     LimitMemory(kMostMemory);
     Database::SetPatience(kStorePatience);
-    Serve(launcher, asked);
+    AnswerRequest(launcher, asked);
   } catch (const Refused& refused) {
     SendAnswer(answer, refused.answer);
   } catch (const std::exception& error) {

@@ -48,6 +48,7 @@ enum HttpStatus : int {
 };
 
 inline constexpr char kSessionCookie[] = "session";
+inline constexpr char kRetrySeconds[] = "10";  // for who has too much at the same time
 inline constexpr std::size_t kMostMessageBytes = 8192;
 
 // For the launcher itself.

@@ -11,6 +11,7 @@
 #include <stdexcept>
 
 #include "device/base/file_descriptor.h"
+#include "device/base/open_below.h"
 
 namespace Device {
 
@@ -41,7 +42,7 @@ bool Replace(const fs::path& closed, const fs::path& root) {
     return false;
   }
   const FileDescriptor device(open(root.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-  const std::string source = "/proc/self/fd/" + std::to_string(device.Get());
+  const std::string source = PathOf(device.Get());
   if (mount("kavo-device", closed.c_str(), "tmpfs", 0, "mode=0755,size=1m") != 0) {
     return false;
   }

@@ -88,8 +88,8 @@ void AddJobsOfOthers(off64_t first, off64_t last, std::vector<QueuedJob>& jobs) 
   if (first > last) {
     return;
   }
-  // A length of 0 reaches to the end of all files. Asked so, the kernel names no lock for reading:
-  // those are held by who waits for a job.
+  // A length of 0 reaches to the end. Asked about a read lock, the kernel names write locks alone:
+  // the places of jobs, not who waits for one.
   struct flock64 found = Range(F_RDLCK, first, last == kLastByte ? 0 : last - first + 1);
   if (fcntl(TheDevice().queue.Get(), F_GETLK64, &found) != 0) {
     ThrowErrno("queue of jobs");

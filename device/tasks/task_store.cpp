@@ -1,10 +1,8 @@
 #include "device/tasks/task_store.h"
 
 #include <ctime>
-#include <stdexcept>
 #include <utility>
 
-#include "device/base/json_text.h"
 #include "device/model/device.h"
 
 namespace Device {

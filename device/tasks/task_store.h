@@ -85,7 +85,8 @@ class TaskStore {
   // Stores the properties and the finished state together, and brings the row up to date. Only what
   // differs from the store is written. False when there is no such task.
   bool UpdateTask(TaskRow& row, std::map<std::string, StoredValue> properties, bool finished);
-  // With what is known of its worker, if it has one, but for a stop: that tells how the task went.
+  // Forgets its worker too, unless that was stopped: by that note a stopped task is told from one
+  // that was dismissed.
   void RemoveTask(const std::string& id, pid_t worker = -1);
 
   void AddWorker(pid_t pid, std::uint64_t start_time);

@@ -8,6 +8,7 @@
 #include "device/base/json_text.h"
 #include "device/base/try_or_log.h"
 #include "device/model/device.h"
+#include "device/tasks/job_queue.h"
 #include "device/tasks/workers.h"
 #include "platform/kavo/error_codes.h"
 
@@ -27,15 +28,10 @@ Json::Value InfoOf(const TaskRow& row) {
   return info.isObject() ? info : Json::Value(Json::objectValue);
 }
 
-// The task manager's note has it too, and is small; the request's parameters can be large.
+// As the task manager noted it: the request's parameters, which have it too, can be large.
 Json::Value Destination(const TaskRow& row) {
-  Json::Value title = InfoOf(row)["title"];
-  if (title.isString()) {
-    return title;
-  }
-  const Json::Value params = row.Property(kPropData).Member("params");
-  const Json::Value dest = params.isObject() ? params["dest_file_path"] : Json::Value();
-  return dest.isString() ? dest : Json::Value("");
+  const Json::Value title = InfoOf(row)["title"];
+  return title.isString() ? title : Json::Value("");
 }
 
 // The module stores a fraction of 32 bits, such as 0.28999999; meant are hundredths.
@@ -73,6 +69,7 @@ std::string WithUserPaths(std::string text) {
 }
 
 void StoreFailure(const std::string& user, TaskRow& row) {
+  // A row of a list lacks "params"; what it has not read stays as it is.
   StoredValue data = row.Property(kPropData);
   data.members[kDataErrors] = ToText(GeneralError(row));
   const std::int64_t version = row.version;
@@ -176,6 +173,17 @@ Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& wai
     view["ended"] = Json::Int64{row.updated};
   }
   return view;
+}
+
+Json::Value TaskList(const std::string& user) {
+  Json::Value tasks(Json::arrayValue);
+  const auto waiting = WaitingWorkers();
+  for (const TaskRow& row : AllTasks(user)) {
+    if (HasData(row)) {
+      tasks.append(TaskView(row, waiting));
+    }
+  }
+  return JsonObject({{"tasks", tasks}});
 }
 
 }  // namespace Device

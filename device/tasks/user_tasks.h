@@ -42,4 +42,7 @@ pid_t WorkerOf(const TaskRow& row);
 // when they are known. No password. `waiting` is what WaitingWorkers says.
 Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& waiting);
 
+// {"tasks": [views]} of all that have data, in the order of AllTasks. Throws std::runtime_error.
+Json::Value TaskList(const std::string& user);
+
 }  // namespace Device

@@ -29,7 +29,7 @@ thread_local Connection* this_threads_connection = nullptr;
 struct Connections {
   struct Reading {
     Connection* connection;
-    std::string payer;  // the client, while no user is known
+    std::string counted_for;  // the client, while no user is known
   };
   std::mutex mutex;
   std::condition_variable changed;
@@ -37,9 +37,9 @@ struct Connections {
   std::size_t threads = 0;
   bool is_one_closing = false;  // to make room
 
-  void CloseOldest(const std::string* payer) {
+  void CloseOldest(const std::string* counted_for) {
     const auto oldest = std::find_if(reading.begin(), reading.end(), [&](const Reading& each) {
-      return payer == nullptr || each.payer == *payer;
+      return counted_for == nullptr || each.counted_for == *counted_for;
     });
     ::shutdown(oldest->connection->socket(), SHUT_RDWR);
     reading.erase(oldest);
@@ -98,20 +98,22 @@ Connection::~Connection() {
 
 Connection& Connection::OfThisThread() { return *this_threads_connection; }
 
-void Connection::BeginReading(const std::string& payer, std::chrono::seconds time) {
+void Connection::BeginReading(const std::string& counted_for, std::chrono::seconds time) {
   deadline_ = Clock::now() + time;
   Connections& all = All();
   const std::lock_guard<std::mutex> lock(all.mutex);
-  const auto is_theirs = [&](const auto& each) { return !payer.empty() && each.payer == payer; };
+  const auto is_theirs = [&](const auto& each) {
+    return !counted_for.empty() && each.counted_for == counted_for;
+  };
   if (std::count_if(all.reading.begin(), all.reading.end(), is_theirs) >=
       std::ptrdiff_t{kMostReadOfOne}) {
-    all.CloseOldest(&payer);
+    all.CloseOldest(&counted_for);
   }
-  all.reading.push_back({this, payer});
+  all.reading.push_back({this, counted_for});
   all.changed.notify_all();
 }
 
-void Connection::ReadBody(bool is_users) {
+void Connection::BeginBody(bool is_users) {
   NotePart();
   BeginReading(is_users ? "" : client_, kBodyTime);
 }

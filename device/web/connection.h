@@ -28,7 +28,7 @@ class Connection : public httplib::Stream {
   // From now on a body is read, of a signed-in user or not. Those that are being read, heads among
   // them, make room for others, the oldest first: when there are too many of one client's without
   // a session, or there is no thread for a new one.
-  void ReadBody(bool is_users);
+  void BeginBody(bool is_users);
   // A part of the body has come. Without that only so much is read as a head may have: the library
   // keeps a line of any length, and any number of them.
   void NotePart() { allowed_ = kMostHeadBytes; }
@@ -51,7 +51,7 @@ class Connection : public httplib::Stream {
   using Clock = std::chrono::steady_clock;
   static constexpr std::size_t kMostHeadBytes = std::size_t{64} << 10U;
 
-  void BeginReading(const std::string& payer, std::chrono::seconds time);
+  void BeginReading(const std::string& counted_for, std::chrono::seconds time);
   // False at the deadline.
   bool WaitFor(short event) const;
 

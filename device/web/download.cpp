@@ -25,7 +25,6 @@ using httplib::Response;
 namespace {
 
 constexpr std::size_t kMostOfOne = 16;
-constexpr char kRetrySeconds[] = "10";
 
 struct Places {
   std::mutex mutex;
@@ -85,7 +84,7 @@ void SendFile(const Request& request, Response& response, const Device::Answer& 
   const std::shared_ptr<void> place = TakePlace(message.bytes);
   if (!place) {
     Respond(response, Device::Refusal(Device::kHttpTooMany, "too many downloads at the same time",
-                                      kRetrySeconds));
+                                      Device::kRetrySeconds));
     return;
   }
   const auto file = std::make_shared<Device::FileDescriptor>(std::move(message.descriptor));

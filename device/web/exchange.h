@@ -14,7 +14,8 @@ namespace Web {
 
 class Exchange {
  public:
-  // Tells the launcher, once the request has been read. Where that fails, no frame will come.
+  // Tells the launcher, once the head has been read, and of a sign-in the body. Where that fails,
+  // no frame will come.
   explicit Exchange(const Json::Value& asked);
 
   // Sends a part of the body; an empty one ends it. What nobody reads any more is dropped.

@@ -48,7 +48,7 @@ Json::Value Asked(const Request& request, const std::string& kind) {
 
 void SignIn(const Request& request, Response& response, const httplib::ContentReader& reader) {
   std::string body;
-  Connection::OfThisThread().ReadBody(false);
+  Connection::OfThisThread().BeginBody(false);
   if (!ReadBody(
           request, reader, kMostSignInBytes, [&](const std::string& part) { body += part; },
           response)) {
@@ -86,7 +86,7 @@ void AskWithBody(const Request& request, Response& response, const httplib::Cont
   const auto exchange = std::make_shared<Exchange>(asked);
   Device::Answer answer = exchange->Receive();
   const bool is_users = answer.status == Device::kHttpContinue;
-  Connection::OfThisThread().ReadBody(is_users);
+  Connection::OfThisThread().BeginBody(is_users);
   const auto take = [&](const std::string& part) {
     if (is_users) {
       exchange->Send(part);

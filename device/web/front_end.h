@@ -1,5 +1,5 @@
 // The HTTP routes. A route turns a request into a message to the launcher and its answer into a
-// response; it knows neither users nor files.
+// response; of users and files it knows what the launcher hands over.
 #pragma once
 
 #include <httplib.h>

@@ -7,6 +7,7 @@
 #include <utility>
 
 #include "device/base/file_io.h"
+#include "device/base/open_below.h"
 
 namespace Web {
 
@@ -34,7 +35,7 @@ std::string ContentType(const std::string& extension) {
 PageFiles ReadPageFiles(int folder) {
   std::map<std::string, PageFile> by_name;
   std::string all;
-  for (const auto& entry : fs::directory_iterator("/proc/self/fd/" + std::to_string(folder))) {
+  for (const auto& entry : fs::directory_iterator(Device::PathOf(folder))) {
     by_name[entry.path().filename().string()] = {Device::ReadTextFile(entry.path().string()),
                                                  ContentType(entry.path().extension().string())};
   }

@@ -7,7 +7,6 @@
 #pragma once
 
 #include <json/json.h>
-#include <sys/types.h>
 
 #include <cstdint>
 #include <string>

@@ -6,7 +6,6 @@
 #include <syslog.h>
 #include <unistd.h>
 
-#include <cerrno>
 #include <filesystem>
 #include <stdexcept>
 #include <utility>

@@ -32,6 +32,8 @@ bool BecomeUser(const User& user) {
          setresuid(user.uid, user.uid, user.uid) == 0;
 }
 
+}  // namespace
+
 int SwitchTo(const char* session_id, const char* name) {
   const User* const user = name == nullptr ? nullptr : TheDevice().config.FindUser(name);
   if (user == nullptr) {
@@ -51,8 +53,6 @@ int SwitchTo(const char* session_id, const char* name) {
   current_user = user->name;
   return 0;
 }
-
-}  // namespace
 
 const std::string& CurrentUser() { return current_user; }
 

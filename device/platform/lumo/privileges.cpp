@@ -1,6 +1,5 @@
 // What users may do on shared folders, and with files.
 #include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>

@@ -3,7 +3,7 @@ import { encodePath, pathList } from './names.js';
 
 const API = 'KAVO.Zantro.Compress';
 const API_VERSION = 3;
-const UNAUTHORIZED = 401;
+export const UNAUTHORIZED = 401;
 
 // The device said no: the HTTP status, or the API's code, and the reason in words.
 export class Refusal extends Error {
@@ -63,7 +63,7 @@ export async function signOut() {
 
 export const listFolder = (path, signal) => request('GET', `/files?path=${encodePath(path)}`, { signal });
 export const listArchive = (path, signal) => request('GET', `/archive?path=${encodePath(path)}`, { signal });
-export const checkDestination = (path, format, signal) => request('GET', `/destination?path=${encodePath(path)}&format=${format}`, { signal });
+export const checkDestination = (path, signal) => request('GET', `/destination?path=${encodePath(path)}`, { signal });
 export const countTree = (paths, signal) => request('POST', '/size', { body: { paths }, signal });
 export const listCodepages = () => request('GET', '/codepages');
 export const listTasks = async () => (await request('GET', '/tasks')).tasks;

@@ -32,9 +32,8 @@ export async function lookInside(path) {
 }
 
 export function archiveText({ format, count, size, complete, encrypted }) {
-  const entriesText = count === 1 ? '1 entry' : `${counted(count, 'entrie')}`;
   return [
-    `${format}, ${complete ? '' : 'more than '}${entriesText}, ${sizeText(size)} unpacked`,
+    `${format}, ${complete ? '' : 'more than '}${counted(count, 'entry', 'entries')}, ${sizeText(size)} unpacked`,
     encrypted && 'protected by a password',
   ].filter(Boolean).join(', ');
 }

@@ -12,7 +12,7 @@ const PATIENCE_MS = 150;
 const HASH = '#';
 const titleOf = (path) => (path === ROOT ? ROOT_TITLE : shown(lastName(path)));
 
-export const locationOf = (path) => HASH + encodePath(path);
+const locationOf = (path) => HASH + encodePath(path);
 
 export class Files {
   #main = byId('files');

@@ -37,8 +37,8 @@ export function momentText(seconds) {
   return isToday ? timeFormat.format(date) : dateFormat.format(date);
 }
 
-export function counted(count, noun) {
-  return `${wholeFormat.format(count)} ${noun}${count === 1 ? '' : 's'}`;
+export function counted(count, noun, nouns = `${noun}s`) {
+  return `${wholeFormat.format(count)} ${count === 1 ? noun : nouns}`;
 }
 
 // Whole per cents that are done. What is not a binary fraction may lie a little below.

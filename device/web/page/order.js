@@ -15,7 +15,7 @@ const sortKey = (entry) => (entry.key ??= entry.name.replace(DIGITS, (digits) =>
 export const byName = (one, other) => collator.compare(sortKey(one), sortKey(other));
 
 // A name as people look for it, without case and accents.
-export const fold = (name) => name.normalize('NFD').replace(MARKS, '').toLowerCase();
+const fold = (name) => name.normalize('NFD').replace(MARKS, '').toLowerCase();
 
 const foldedName = (entry) => (entry.folded ??= fold(entry.name));
 

@@ -1,9 +1,8 @@
 // The sign-in form.
-import { Refusal, signIn } from './api.js';
+import { Refusal, UNAUTHORIZED, signIn } from './api.js';
 import { byId, setText } from './dom.js';
 import { counted } from './format.js';
 
-const UNAUTHORIZED = 401;
 const TOO_MANY = 429;
 
 const view = byId('sign-in');
