@@ -1,5 +1,6 @@
 // The page's jobs in a browser: what is there already, what comes of a job, many windows, breaks.
 import assert from 'node:assert/strict';
+import { writeFileSync } from 'node:fs';
 
 import { button, check, compress, device, noFaults, page, row, shows, signIn, task, visit } from './browser.mjs';
 import { Client, isRoot, kill, listing, until } from './device.mjs';
@@ -29,6 +30,7 @@ check('an archive that is there is told of before, and never added to unasked', 
 });
 
 check('the dialog says what would fail, and the format and the ending follow each other', async () => {
+  writeFileSync(device.at(`vol1/photo/${'n'.repeat(251)}.zip`), '');
   await visit('bob', '/attic');
   await row('old.txt').click();
   await button('Compress…').click();
@@ -53,6 +55,17 @@ check('the dialog says what would fail, and the format and the ending follow eac
   assert.equal(await name.inputValue(), 'trip.7z');
   await name.fill('trip.zip');
   assert.equal(await dialog().getByLabel('Format').inputValue(), 'zip');
+  const compressButton = dialog().getByRole('button', { name: 'Compress' });
+  const long = `${'n'.repeat(251)}.zip`;
+  await name.fill(long);
+  await dialog().getByText(/with a number it would be too long/).waitFor();
+  await compressButton.click();
+  await until(async () => await name.getAttribute('aria-invalid') === 'true');
+  await page.route(/destination/, (route) => route.abort());
+  await name.fill('unasked.zip');
+  await compressButton.click();
+  await dialog().getByText(/Try again/).waitFor();
+  await page.unroute(/destination/);
   const pages = await dialog().getByLabel('Code page').locator('option').allTextContents();
   assert.deepEqual(pages.slice(0, 2), ['CP932 (your own setting)', 'UTF-8']);
   await page.keyboard.press('Escape');
@@ -91,7 +104,20 @@ check('a failed job tells the archiver\'s reason and is tried again, but for the
     ['full.7z', '/video', 'store', '']);
   device.inside('umount "$1/vol2/video"');
   await dialog().getByRole('button', { name: 'Compress' }).click();
+  await dialog().getByText(/There was a password/).waitFor();  // and no archive without
+  await dialog().getByLabel('Password (optional)').fill('secret');
+  await dialog().getByRole('button', { name: 'Compress' }).click();
   await task('/video/full.7z').getByText('Done').waitFor();
+  await shows('photo');
+  await row('trip').click();
+  await button('Compress…').click();
+  await dialog().getByLabel('Folder', { exact: true }).fill('/video');
+  await dialog().getByLabel('Archive name').fill('full.7z');
+  await dialog().getByText(/protected by a password/).waitFor();
+  await dialog().getByLabel('Add').check();
+  await dialog().getByRole('button', { name: 'Compress' }).click();
+  await dialog().getByText(/give its password/).waitFor();
+  await page.keyboard.press('Escape');
 }, { skip: !isRoot && 'mounts take root' });
 
 check('many windows share one stream, hidden ones have none, and all come back after a break', async () => {

@@ -11,6 +11,7 @@ const facts = byId('existing-facts');
 export class Destination {
   #asked = new AbortController();
   #later = 0;
+  #isProtected = false;
   #onAnswer;
 
   // onAnswer gets what the device says of the place that was asked for last.
@@ -20,6 +21,11 @@ export class Destination {
 
   get isChoiceShown() {
     return !existing.hidden;
+  }
+
+  // By a password, as far as is known of what stands there.
+  get isProtected() {
+    return this.#isProtected;
   }
 
   askLater(path, milliseconds) {
@@ -51,6 +57,7 @@ export class Destination {
   hide() {
     this.stop();
     existing.hidden = true;
+    this.#isProtected = false;
   }
 
   async #show({ exists, error, size, modified, free_name: freeName }, path, signal) {
@@ -60,7 +67,9 @@ export class Destination {
     byId('free-name').textContent = freeName ? shown(freeName) : 'no name, as with a number it would be too long';
     const known = `${sizeText(size)}, changed ${dateText(modified)}`;
     setText(facts, known);
-    const inside = await listArchive(path, signal).then(archiveText, ({ message }) => `cannot be read: ${message}`);
-    if (!signal.aborted) setText(facts, `${known}; ${inside}`);
+    const archive = await listArchive(path, signal).catch(({ message }) => ({ message }));
+    if (signal.aborted) return;
+    this.#isProtected = Boolean(archive.encrypted);
+    setText(facts, `${known}; ${archive.message ? `cannot be read: ${archive.message}` : archiveText(archive)}`);
   }
 }

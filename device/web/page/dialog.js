@@ -5,7 +5,7 @@ import { byId, element, setText } from './dom.js';
 import { FolderPicker } from './folder-picker.js';
 import { counted } from './format.js';
 import { keepFolder, keepJob, keptFolder } from './keep.js';
-import { ROOT, byteLength, formatOf, join, lastName, parentOf, shown, typeable } from './names.js';
+import { ROOT, byteLength, formatOf, join, lastName, parentOf, shareOf, shown, typeable } from './names.js';
 import { TreeSize } from './tree-size.js';
 
 const HOME = '/home';
@@ -28,6 +28,7 @@ const generalError = byId('compress-error');
 export class CompressDialog {
   #sources = [];
   #proposed = HOME;  // the folder that the field shows as long as nobody types there
+  #wantsPassword = false;  // the draft had one, which is not kept
   #isSending = false;
   #destination = new Destination(showPlaceError);
   #picker = new FolderPicker();
@@ -77,6 +78,7 @@ export class CompressDialog {
       level: level.value,
       mode: form.elements.mode.value,
       codepage: codepage.value,
+      isProtected: this.#wantsPassword || password.value !== '',
     };
   }
 
@@ -93,9 +95,12 @@ export class CompressDialog {
     this.#setFormat(draft.format ?? format.value);
     name.value = draft.name ?? `${proposedName(draft.sources)}.${format.value}`;
     offerCodepages(ownCodepage, draft.codepage ?? ownCodepage);
+    byId('compress-names').hidden = new Set(draft.sources.map(shareOf)).size < 2;
+    this.#wantsPassword = Boolean(draft.isProtected);
+    if (this.#wantsPassword) showError(password, 'The password is not kept. Type it again.');
     this.#destination.hide();
     dialog.showModal();
-    name.focus();
+    (this.#wantsPassword ? password : name).focus();
     name.setSelectionRange(0, name.value.replace(ENDING, '').length);
     this.#look(0);
     this.#size.ask(this.#sources);
@@ -149,7 +154,7 @@ export class CompressDialog {
 
   // What has come to stand there unseen is shown first.
   async #start() {
-    const wasChoiceShown = this.#destination.isChoiceShown;
+    const { isChoiceShown: wasChoiceShown, isProtected } = this.#destination;
     const draft = this.draft;
     const place = await this.#destination.ask(join(draft.folder, draft.name));
     form.querySelector('[aria-invalid]')?.focus();
@@ -167,6 +172,11 @@ export class CompressDialog {
     if (isKept && !place.free_name) {
       showError(name, 'With a number, the name would be too long. Choose another, or what becomes of the archive.');
       name.focus();
+      return;
+    }
+    if (place.exists && !isKept && isProtected && !password.value) {
+      showError(password, 'The archive is protected: give its password.');
+      password.focus();
       return;
     }
     if (isKept) draft.name = place.free_name;
@@ -197,9 +207,17 @@ export class CompressDialog {
     if (format.value === ZIP && !PRINTABLE_ASCII.test(password.value)) {
       showError(password, 'A zip takes printable ASCII only.');
     }
+    if (this.#wantsPassword && !password.value) {
+      showError(password, 'There was a password. Type it again, or press Compress once more to go without.');
+      this.#wantsPassword = false;
+    }
+    const unlisted = this.#sources.map(lastName).find((each) => each.includes('\n'));
+    if (unlisted) {
+      setText(generalError, `"${shown(unlisted)}" has a line break in its name. Select the folder that it is in instead.`);
+    }
     const invalid = form.querySelector('[aria-invalid]');
     invalid?.focus();
-    return !invalid;
+    return !invalid && !unlisted;
   }
 }
 

@@ -62,6 +62,7 @@ export class FolderPicker {
     this.#folders = sorted(folders, { by: 'name' });
     byId('picker-path').replaceChildren(cutNameElement(this.#path === ROOT ? 'Shared folders' : this.#path));
     up.disabled = this.#path === ROOT;
+    choose.textContent = this.#path === ROOT ? 'Choose' : `Choose ${shown(lastName(this.#path))}`;
     const kept = Math.max(0, this.#folders.findIndex((folder) => folder.name === active));
     this.#rows.fill(this.#folders.length, kept);
     list.hidden = folders.length === 0;

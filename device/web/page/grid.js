@@ -39,6 +39,7 @@ export class FileGrid {
       if (!event.target.matches('input')) this.#on.open(this.#entries[indexOf(event)]);
     });
     this.#body.addEventListener('keydown', (event) => this.#keyDown(event));
+    this.#body.addEventListener('focusin', (event) => this.#keep(indexOf(event)));
     this.#body.addEventListener('contextmenu', (event) => this.#contextMenu(event));
     this.#selectAll.addEventListener('change', () => this.#toggleAll());
     this.#filter.addEventListener('input', () => this.#rearrange());
@@ -185,19 +186,24 @@ export class FileGrid {
   }
 
   #moveTo(index) {
-    const target = Math.min(Math.max(index, 0), this.#entries.length - 1);
-    this.#rows.at(this.#rows.kept).tabIndex = -1;
-    this.#rows.kept = target;
-    const row = this.#rows.at(target);
-    row.tabIndex = 0;
+    const row = this.#keep(Math.min(Math.max(index, 0), this.#entries.length - 1));
     row.focus({ preventScroll: true });
     row.scrollIntoView({ block: 'nearest' });
+  }
+
+  // The row that takes the focus from now on, and stays in the page wherever that is scrolled.
+  #keep(index) {
+    this.#rows.at(this.#rows.kept).tabIndex = -1;
+    this.#rows.kept = index;
+    const row = this.#rows.at(index);
+    row.tabIndex = 0;
+    return row;
   }
 
   #click(event) {
     const index = indexOf(event);
     const entry = this.#entries[index];
-    const isCheck = event.target.matches('input');
+    const isCheck = event.target.closest('.cell-check') !== null;
     // A finger has no double click: a tap opens, and the checkbox selects.
     if (this.#touched && !isCheck && entry.kind === 'folder') {
       this.#on.open(entry);
@@ -207,7 +213,7 @@ export class FileGrid {
     else if (isCheck || this.#touched || event.ctrlKey || event.metaKey) this.#selection.toggle(entry);
     else this.#selection.only(entry);
     // The click has turned the checkbox by itself, even where the selection stays as it was.
-    if (isCheck) event.target.checked = this.#selection.chosen.has(entry);
+    if (event.target.matches('input')) event.target.checked = this.#selection.chosen.has(entry);
     this.#moveTo(index);
   }
 

@@ -28,6 +28,11 @@ export function lastName(path) {
   return path.slice(path.lastIndexOf('/') + 1);
 }
 
+// The name of the shared folder.
+export function shareOf(path) {
+  return path.split('/')[1];
+}
+
 // The archive's format by its ending, '' for any other file.
 export function formatOf(name) {
   return /\.(zip|7z)$/i.exec(name)?.[1].toLowerCase() ?? '';

@@ -80,9 +80,9 @@ export class Tasks {
   }
 
   tellNotification({ taskid, message, arguments: encoded }) {
-    const [path, reason] = encoded.map(decodeEntities);
+    const [path] = encoded.map(decodeEntities);
     if (message === COMPLETED) this.#tellCompleted(taskid, path);
-    else if (message === FAILED) this.#tellFailed(taskid, path, reason);
+    else if (message === FAILED) this.#tellFailed(taskid, path);
     else notify(taskid, shown([message, ...encoded.map(decodeEntities)].join(' ')));
   }
 
@@ -120,9 +120,9 @@ export class Tasks {
     this.#changed();
   }
 
-  #tellEnd({ task: { taskid, state, dest_file_path: path, reason } }) {
+  #tellEnd({ task: { taskid, state, dest_file_path: path } }) {
     this.#expected.delete(taskid);
-    if (state === 'failed') this.#tellFailed(taskid, path, reason);
+    if (state === 'failed') this.#tellFailed(taskid, path);
     else this.#tellCompleted(taskid, path);
     this.#on.end(path);
   }
@@ -131,9 +131,10 @@ export class Tasks {
     notify(taskid, `${shown(path)} is ready.`, { go: () => this.#on.show(path) });
   }
 
-  #tellFailed(taskid, path, reason) {
+  // Its reason stands with the task.
+  #tellFailed(taskid, path) {
     const go = () => this.#on.seen(this.#items.get(taskid)?.element ?? byId('tasks-title'));
-    notify(taskid, `${shown(path)} could not be made${reason ? `: ${shown(reason)}` : ''}.`, { isFailure: true, go });
+    notify(taskid, `${shown(path)} could not be made.`, { isFailure: true, go });
   }
 
   #changed() {
