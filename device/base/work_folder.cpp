@@ -38,8 +38,13 @@ void Remove(const FileDescriptor& folder) {
   }
   fs::remove_all(PathOf(folder.Get()) + "/" + kWorkMirror, ignored);
   unlinkat(folder.Get(), kMark, 0);
-  // Where it lies by now: others can have renamed it.
-  rmdir(fs::read_symlink(PathOf(folder.Get()), ignored).c_str());
+  // Where it lies by now: others can have renamed it, or what it lies in.
+  const std::string name = fs::read_symlink(PathOf(folder.Get()), ignored).filename();
+  const FileDescriptor parent(openat(folder.Get(), "..", O_PATH | O_DIRECTORY | O_CLOEXEC));
+  const FileDescriptor found(openat(parent.Get(), name.c_str(), O_PATH | O_NOFOLLOW | O_CLOEXEC));
+  if (fs::equivalent(PathOf(found.Get()), PathOf(folder.Get()), ignored)) {
+    unlinkat(parent.Get(), name.c_str(), AT_REMOVEDIR);
+  }
 }
 
 bool IsOwn(const FileDescriptor& folder) {
