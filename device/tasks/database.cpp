@@ -157,6 +157,7 @@ bool Database::EmptyLog() {
 }
 
 void Database::EraseMarked() {
+  const Shortage shortage = TheShortage();
   try {
     const std::int64_t mark = Number(kMark);
     if (mark <= 0 || !EmptyLog()) {
@@ -172,7 +173,9 @@ void Database::EraseMarked() {
         }
       });
     }
-  } catch (const std::runtime_error& error) {
+  } catch (const std::exception& error) {
+    // A process that has less memory than the file leaves it to the next one.
+    TheShortage() = shortage;
     syslog(LOG_ERR, "erase what was removed: %s", error.what());
   }
 }
