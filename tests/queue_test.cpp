@@ -163,9 +163,7 @@ TEST_F(QueueTest, WhoStopsAWorkerKeepsNobodysJobWaiting) {
   while (stopped.size() <= Device::MostJobs()) {  // the last one of them waits
     stopped.push_back(Start("bob"));
   }
-  for (const Job& job : stopped) {
-    kill(job.worker, SIGSTOP);
-  }
+  ASSERT_TRUE(WaitUntil([&] { return Group(stopped.front().worker).size() > 1; }));
   // As one has that is stopped in the midst of a change.
   const pid_t holder = fork();
   if (holder == 0) {
@@ -176,10 +174,18 @@ TEST_F(QueueTest, WhoStopsAWorkerKeepsNobodysJobWaiting) {
     raise(SIGSTOP);
   }
   EXPECT_TRUE(WaitUntil([&] { return Device::IsStopped(holder); }));
+  for (const pid_t pid : Group(stopped.front().worker)) {
+    if (pid != stopped.front().worker) {  // its archiver
+      kill(pid, SIGSTOP);
+    }
+  }
+  for (std::size_t job = 1; job < stopped.size(); ++job) {
+    kill(stopped[job].worker, SIGSTOP);
+  }
   const Job job = Start();
   EXPECT_TRUE(IsAtWork(job));
   for (const Job& each : stopped) {
-    kill(each.worker, SIGKILL);
+    kill(-each.worker, SIGKILL);
   }
   kill(holder, SIGKILL);
   waitpid(holder, nullptr, 0);

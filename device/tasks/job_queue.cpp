@@ -141,9 +141,10 @@ bool TakeTurn(std::vector<QueuedJob>& jobs) {
   const Change change;
   jobs = JobsOfOthers();
   // A user who stops a worker by SIGSTOP must not keep its place from others.
-  jobs.erase(std::remove_if(jobs.begin(), jobs.end(),
-                            [](const QueuedJob& job) { return IsStopped(job.worker); }),
-             jobs.end());
+  jobs.erase(
+      std::remove_if(jobs.begin(), jobs.end(),
+                     [](const QueuedJob& job) { return IsStopped(job.worker, job.is_running); }),
+      jobs.end());
   jobs.push_back(own_job);
   if (!IsIn(own_job, NextToRun(jobs, TheDevice().config.jobs_at_once, MostJobs()))) {
     return false;

@@ -55,20 +55,23 @@ std::optional<ProcessStat> ReadStat(pid_t pid) {
 
 bool HasEnded(const ProcessStat& stat) { return stat.state == 'Z' || stat.state == 'X'; }
 
-bool IsEmpty(pid_t group) {
+// True if there is such a process in the group.
+bool HasProcess(pid_t group, bool (*is_such)(const ProcessStat&)) {
   const std::unique_ptr<DIR, int (*)(DIR*)> processes(opendir("/proc"), closedir);
   while (const dirent* const entry = processes ? readdir(processes.get()) : nullptr) {
     const pid_t pid = std::atoi(entry->d_name);  // 0 of what is no process
     const std::optional<ProcessStat> stat = pid > 0 ? ReadStat(pid) : std::nullopt;
-    if (stat && stat->group == group && !HasEnded(*stat)) {
-      return false;
+    if (stat && stat->group == group && is_such(*stat)) {
+      return true;
     }
   }
-  return true;
+  return false;
 }
 
+bool IsStopped(const ProcessStat& stat) { return stat.state == 'T' || stat.state == 't'; }
+
 bool WaitForGroup(pid_t group, Clock::time_point deadline) {
-  while (!IsEmpty(group)) {
+  while (HasProcess(group, [](const ProcessStat& stat) { return !HasEnded(stat); })) {
     if (Clock::now() >= deadline) {
       return false;
     }
@@ -105,9 +108,9 @@ void RegisterWorker(const std::string& user, pid_t pid) {
   StoreOf(user).AddWorker(pid, stat->start_time);
 }
 
-bool IsStopped(pid_t pid) {
+bool IsStopped(pid_t pid, bool with_group) {
   const std::optional<ProcessStat> stat = ReadStat(pid);
-  return stat && stat->state == 'T';
+  return (stat && IsStopped(*stat)) || (with_group && HasProcess(pid, IsStopped));
 }
 
 bool IsWorkerAlive(const std::string& user, pid_t pid) {

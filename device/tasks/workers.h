@@ -13,8 +13,9 @@ namespace Device {
 // Enters a process that has just been forked. Throws std::runtime_error.
 void RegisterWorker(const std::string& user, pid_t pid);
 
-// True if a signal has stopped the process, which goes on when another one comes.
-bool IsStopped(pid_t pid);
+// True if a signal has stopped the worker, or a process of its group, which takes longer to find
+// out. It goes on when another one comes.
+bool IsStopped(pid_t pid, bool with_group = false);
 
 // True if the process is a worker of the user's and has not ended; a zombie has.
 bool IsWorkerAlive(const std::string& user, pid_t pid);
