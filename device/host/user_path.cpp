@@ -57,7 +57,7 @@ FileDescriptor OpenFileOf(const std::string& user, const ResolvedPath& path, str
   if (fstat(found.Get(), &status) != 0 || !S_ISREG(status.st_mode)) {
     throw Refused(kHttpNotFound, "not a file");
   }
-  FileDescriptor file(open(PathOf(found.Get()).c_str(), O_RDONLY | O_CLOEXEC));
+  FileDescriptor file(open(PathOf(found.Get()).c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
   if (!file) {
     RefuseForErrno();
   }
