@@ -171,6 +171,13 @@ TEST_F(TrustTest, WhatKilledJobsLeaveGoesWithTheNextAndNothingElseDoes) {
   for (const auto& process : fs::directory_iterator("/proc")) {
     EXPECT_EQ(ReadFile(process.path() / "cmdline").find("geheim"), std::string::npos);
   }
+  // The user can make the archiver do anything, also with root's terminal.
+  for (const pid_t pid : Group(Worker())) {
+    EXPECT_EQ(getsid(pid), Worker());
+    const std::string errors = fs::read_symlink("/proc/" + std::to_string(pid) + "/fd/2");
+    EXPECT_TRUE(pid == Worker() || errors == "/dev/null" || errors.rfind("pipe:", 0) == 0)
+        << errors;
+  }
   kill(-Worker(), SIGKILL);
   ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
   EXPECT_EQ(jobs_folders().size(), 1U);

@@ -1,10 +1,8 @@
 #include "device/archiver/archive_job.h"
 
-#include <syslog.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cinttypes>
 #include <iterator>
 #include <set>
 #include <unordered_set>
@@ -127,7 +125,8 @@ void PackWithSpecials(Job& job, const WorkPlace& place, PackRun run,
   }
 }
 
-std::vector<std::string> MemorySwitches(const Request& request, std::uint64_t memory) {
+std::vector<std::string> MemorySwitches(const Request& request, std::uint64_t memory,
+                                        Report& report) {
   if (request.zip) {
     return {};  // takes little
   }
@@ -138,8 +137,8 @@ std::vector<std::string> MemorySwitches(const Request& request, std::uint64_t me
     text += " " + each;
   }
   if (!text.empty()) {
-    syslog(LOG_NOTICE, "%s: within %" PRIu64 " MiB of memory by%s",
-           NameInError(request.archive).c_str(), memory >> 20U, text.c_str());
+    report.Note(NameInError(request.archive) + ": within " + std::to_string(memory >> 20U) +
+                " MiB of memory by" + text);
   }
   return switches;
 }
@@ -164,7 +163,7 @@ Device::FileDescriptor PackArchive(const Request& request, const Device::Archive
 
   PackRun run;
   run.sources = DivideNames(sources);
-  run.memory = MemorySwitches(request, call.memory);
+  run.memory = MemorySwitches(request, call.memory, report);
   PrepareArchive(job, run);
   const std::vector<std::string> left_out = NamesOf(place, job.target);
   if (place.shares.empty() && !request.zip) {  // a 7z archive has empty files without opening them

@@ -6,7 +6,6 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <syslog.h>
 #include <unistd.h>
 
 #include <exception>
@@ -52,7 +51,6 @@ int main(int argc, char** argv) {
     return 1;  // nobody to report to
   }
   Device::OccupyStandardStreams();
-  openlog("kavo-7z", LOG_PID | LOG_PERROR, LOG_USER);
   BeFirstToGo();
   try {
     const Archiver::Cancel cancel(STDOUT_FILENO);

@@ -34,6 +34,8 @@ void Report::Done() { Percent(100); }
 
 void Report::Error(const std::string& reason) { Line("Error: " + Printable(reason)); }
 
+void Report::Note(const std::string& text) { Line("Note: " + Printable(text)); }
+
 void Report::CancelledRun() {
   // On a line of its own, as the one before may be cut off.
   constexpr std::string_view kText = "\nError: cancelled\n";

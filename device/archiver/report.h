@@ -22,6 +22,8 @@ class Report {
   // The archive stands under its final name.
   void Done();
   void Error(const std::string& reason);
+  // For the device's log.
+  void Note(const std::string& text);
   // The same for a run that was cancelled, if somebody still reads; never blocks.
   void CancelledRun();
 

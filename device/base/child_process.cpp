@@ -60,7 +60,7 @@ bool Redirect(int from, int to) {
 }
 
 // In the child: returns only when the program cannot run, with the reason in errno.
-void Execute(const ProgramStart& start, int input, char* const* arguments, char* const* environment,
+void Execute(const ProgramStart& start, int null, char* const* arguments, char* const* environment,
              pid_t parent) {
   ResetSignals();
   if (start.ends_with_caller) {
@@ -69,8 +69,10 @@ void Execute(const ProgramStart& start, int input, char* const* arguments, char*
       raise(SIGKILL);  // the parent has ended in the moment before
     }
   }
-  if ((start.folder < 0 || fchdir(start.folder) == 0) && Redirect(input, STDIN_FILENO) &&
-      Redirect(start.output, STDOUT_FILENO) && Redirect(start.errors, STDERR_FILENO) &&
+  if ((start.folder < 0 || fchdir(start.folder) == 0) &&
+      Redirect(start.input < 0 ? null : start.input, STDIN_FILENO) &&
+      Redirect(start.output, STDOUT_FILENO) &&
+      Redirect(start.errors < 0 ? null : start.errors, STDERR_FILENO) &&
       (start.fence == nullptr || start.fence->Enter())) {
     for (const int fd : start.kept) {
       fcntl(fd, F_SETFD, 0);
@@ -81,12 +83,12 @@ void Execute(const ProgramStart& start, int input, char* const* arguments, char*
 
 // The child shares the caller's memory until the program runs: a copy would cost more than a small
 // job. Why it does not run, it tells `failure`.
-pid_t Spawn(const ProgramStart& start, int input, char* const* arguments, char* const* environment,
+pid_t Spawn(const ProgramStart& start, int null, char* const* arguments, char* const* environment,
             int failure) {
   const pid_t parent = getpid();
   const pid_t pid = vfork();
   if (pid == 0) {
-    Execute(start, input, arguments, environment, parent);
+    Execute(start, null, arguments, environment, parent);
     const int error = errno;
     [[maybe_unused]] const ssize_t told = write(failure, &error, sizeof error);
     _exit(kCannotStart);
@@ -98,15 +100,14 @@ pid_t Spawn(const ProgramStart& start, int input, char* const* arguments, char* 
 
 ChildProcess ChildProcess::Start(const ProgramStart& start) {
   Pipe failure;  // gets the error number, or just closes when the program runs
-  const FileDescriptor null(open("/dev/null", O_RDONLY | O_CLOEXEC));
-  const int input = start.input < 0 ? null.Get() : start.input;
+  const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   const std::vector<char*> arguments = Pointers(start.arguments);
   const std::vector<char*> variables = Pointers(start.environment);
   ChildProcess child(0);
   {
     const SignalsHeldBack held_back;
     child.pid_ =
-        Spawn(start, input, arguments.data(),
+        Spawn(start, null.Get(), arguments.data(),
               start.environment.empty() ? environ : variables.data(), failure.writer.Get());
   }
   if (child.pid_ < 0) {

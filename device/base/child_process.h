@@ -21,7 +21,7 @@ struct ProgramStart {
   int folder = -1;                       // working directory; -1: the caller's
   int input = -1;                        // standard input; -1: /dev/null
   int output = -1;                       // standard output; -1: the caller's
-  int errors = -1;                       // standard error; -1: the caller's
+  int errors = -1;                       // standard error; -1: /dev/null
   std::vector<int> kept;                 // further descriptors, open there under their numbers
   bool ends_with_caller = false;         // killed when the calling process ends, however that is
   const Fence* fence = nullptr;          // confines it; null: it may what the caller may

@@ -7,6 +7,7 @@
 #include <sys/wait.h>
 #include <syslog.h>
 #include <systemd/sd-daemon.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <chrono>
@@ -118,6 +119,7 @@ void WebHost::StartFrontEnd() {
   start.arguments = {kFrontEndProgram, listen_, std::to_string(files_.page.Get()),
                      std::to_string(files_.socket.Get())};
   start.input = front_end_side.Get();
+  start.errors = STDERR_FILENO;
   start.kept = {files_.page.Get(), files_.socket.Get()};
   try {
     front_end_ = ChildProcess::Start(start).Release();
@@ -146,6 +148,8 @@ void WebHost::EndFrontEnd() {
 pid_t WebHost::Fork(const std::function<int()>& body) {
   try {
     return ChildProcess::Run([&] {
+             setsid();  // away from the launcher's terminal, which the user's programs are not to
+                        // have
              // What belongs to the launcher alone.
              control_.Close();
              signals_.Close();

@@ -1,6 +1,7 @@
 // kavo-web LISTEN FD SOCKET: the device's HTTP front end. Its standard input is the launcher's
 // socket, FD the folder of the page, SOCKET where to listen instead, or -1. Gives up root's rights
 // before it serves anybody.
+#include <fcntl.h>
 #include <grp.h>
 #include <poll.h>
 #include <sys/prctl.h>
@@ -101,6 +102,7 @@ void Serve(const std::string& listen, int page, int socket) {
   const Web::PageFiles files = Web::ReadPageFiles(page);
   close(page);
   AllowManyDescriptors();
+  setsid();  // away from root's terminal
   Web::FrontEnd front_end(files);
   front_end.Take(socket);
   const std::string bound = socket < 0 ? Bind(listen, front_end) : AddressOf(socket);
@@ -115,6 +117,7 @@ void Serve(const std::string& listen, int page, int socket) {
   const Json::Value listening =
       Device::JsonObject({{"kind", Device::kKindListening}, {"address", bound}});
   Device::SendMessage(STDIN_FILENO, Device::ToText(listening), -1);
+  dup2(Device::FileDescriptor(open("/dev/null", O_RDWR | O_CLOEXEC)).Get(), STDERR_FILENO);
   front_end.listen_after_bind();
 }
 

@@ -87,10 +87,13 @@ void NoteWhatIsLeft(const Arguments& arguments, const std::string& work_folder) 
 void ArchiverNews::Take(const std::string& line) {
   static const std::string kFile = "Compressing ";
   static const std::string kError = "Error: ";
+  static const std::string kNote = "Note: ";
   if (line.rfind(kFile, 0) == 0) {
     file = line.substr(kFile.size());
   } else if (reason.empty() && line.rfind(kError, 0) == 0) {  // what follows says less
     reason = line.substr(kError.size());
+  } else if (line.rfind(kNote, 0) == 0) {
+    syslog(LOG_NOTICE, "%s", line.substr(kNote.size()).c_str());
   }
 }
 

@@ -152,11 +152,10 @@ int CloseProgram(FILE* stream) {
   return source->status;
 }
 
-// A process group of its own, and nothing of the request's. Returns when it is the worker's turn.
+// A session and a process group of its own, and nothing of the request's. Returns when it is the
+// worker's turn.
 void BecomeWorker(uid_t user, Pipe& entered) {
-  // No session of its own: where the kernel shares out time by sessions, the launcher would get no
-  // more than each job does.
-  setpgid(0, 0);
+  setsid();                       // and no terminal: the user can make the archiver do anything
   std::signal(SIGTERM, SIG_DFL);  // the host may have a handler, which ends nothing
   EnterQueue(user);
   entered.writer.Close();
