@@ -117,7 +117,9 @@ void Serve(const std::string& listen, int page, int socket) {
   const Json::Value listening =
       Device::JsonObject({{"kind", Device::kKindListening}, {"address", bound}});
   Device::SendMessage(STDIN_FILENO, Device::ToText(listening), -1);
-  dup2(Device::FileDescriptor(open("/dev/null", O_RDWR | O_CLOEXEC)).Get(), STDERR_FILENO);
+  const Device::FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
+  dup2(null.Get(), STDOUT_FILENO);
+  dup2(null.Get(), STDERR_FILENO);
   front_end.listen_after_bind();
 }
 
