@@ -154,6 +154,7 @@ std::string ListArchive(const std::string& user, const std::string& path,
   start.kept = {file.Get()};
   start.ends_with_caller = true;
   start.fence = &fence;
+  setsid();  // away from the launcher's terminal, which the user's program is not to have
   ChildProcess program = ChildProcess::Start(start);
   output.writer.Close();
   errors.writer.Close();

@@ -7,7 +7,6 @@
 #include <sys/wait.h>
 #include <syslog.h>
 #include <systemd/sd-daemon.h>
-#include <unistd.h>
 
 #include <cerrno>
 #include <chrono>
