@@ -147,8 +147,6 @@ void WebHost::EndFrontEnd() {
 pid_t WebHost::Fork(const std::function<int()>& body) {
   try {
     return ChildProcess::Run([&] {
-             setsid();  // away from the launcher's terminal, which the user's programs are not to
-                        // have
              // What belongs to the launcher alone.
              control_.Close();
              signals_.Close();
