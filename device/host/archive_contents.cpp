@@ -31,6 +31,14 @@ std::string FormatOf(const FileDescriptor& file) {
   return begin == "7z\xBC\xAF" ? "7z" : begin == "PK\x03\x04" || begin == "PK\x05\x06" ? "zip" : "";
 }
 
+// Seconds that local time is ahead of UTC now. 7z shifts all times by it, those of another season
+// too.
+long OffsetOfToday() {
+  const std::time_t now = std::time(nullptr);
+  std::tm local{};
+  return localtime_r(&now, &local)->tm_gmtoff;
+}
+
 // What 7z tells of one entry after the other, in lines "KEY = VALUE".
 class Contents {
  public:
@@ -49,9 +57,9 @@ class Contents {
       entry_.st_size = std::strtoll(value.c_str(), nullptr, 10);
     } else if (key == "Modified") {
       std::tm time{};
-      time.tm_isdst = -1;
-      entry_.st_mtime =
-          strptime(value.c_str(), "%Y-%m-%d %T", &time) == nullptr ? 0 : mktime(&time);
+      entry_.st_mtime = strptime(value.c_str(), "%Y-%m-%d %T", &time) == nullptr
+                            ? 0
+                            : timegm(&time) - OffsetOfToday();
     } else if ((key == "Folder" && value == "+") || (key == "Attributes" && value[0] == 'D')) {
       entry_.st_mode = S_IFDIR;
     } else if (key == "Encrypted" && value == "+") {
