@@ -85,6 +85,8 @@ TEST_F(ArchiverTest, UpdatesAsTheActionsSay) {
 TEST_F(ArchiverTest, StoresZipNamesInTheCodePageAndFindsThemAgain) {
   WriteFile(share / "d/가", "cannot go to the code page");
   WriteFile(share / "d/plain", "1");
+  WriteFile(share / "d/îΩ", "what 語 becomes in the code page");
+  WriteFile(share / "d/語", "so this stays");
   for (const char* content : {"first", "second"}) {
     WriteFile(share / "d/日本ソ", content);
     Good("a.zip", {"d"}, {"a", "", "pass word", "CP932"});
@@ -97,8 +99,8 @@ TEST_F(ArchiverTest, StoresZipNamesInTheCodePageAndFindsThemAgain) {
       names.insert(raw + (raw == zip_get_name(zip, index, ZIP_FL_ENC_STRICT) ? " utf8" : " raw"));
     }
     zip_discard(zip);
-    EXPECT_EQ(names, (std::set<std::string>{"d/ utf8", "d/plain utf8", "d/가 utf8",
-                                            "d/\x93\xFA\x96\x7B\x83\x5C raw"}));
+    EXPECT_EQ(names, (std::set<std::string>{"d/ utf8", "d/plain utf8", "d/가 utf8", "d/îΩ utf8",
+                                            "d/語 utf8", "d/\x93\xFA\x96\x7B\x83\x5C raw"}));
     const Strings unpack = {"/usr/bin/7z", "x", "-so", "-ppass word", out / "a.zip"};
     EXPECT_NE(RunProgram(unpack).out.find(content), std::string::npos);
   }
@@ -197,6 +199,8 @@ TEST_F(ArchiverTest, SaysWhyARequestCannotBeMet) {
   }
   Bad("new", {"a"}, "command", {"x", "", "", nullptr});
   EXPECT_EQ(InOut(), Strings{});
+  WriteFile(share / "@eaDir/x", "");
+  Good("new", {"@eaDir/x", "a"});
 }
 
 }  // namespace

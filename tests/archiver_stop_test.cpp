@@ -39,6 +39,15 @@ TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
   }
 }
 
+TEST_F(ArchiverTest, MakesNothingInAFolderThatHasMoved) {
+  const auto run = Pack({}, 200 << 20);
+  fs::rename(out, root / "moved");
+  fs::create_directory(out);
+  EXPECT_EQ(run->Wait(), 1);
+  EXPECT_TRUE(run->ReadUntil("its folder has moved meanwhile"));
+  EXPECT_TRUE(fs::is_empty(out) && fs::is_empty(root / "moved"));
+}
+
 TEST_F(ArchiverTest, SaysAHundredPercentWhenTheArchiveIsThere) {
   const auto run = Pack({}, 100 << 20);
   EXPECT_FALSE(fs::exists(out / "new"));

@@ -130,6 +130,15 @@ TEST_F(CliTest, ADetachedJobIsFoundStoppedAndDismissed) {
   EXPECT_EQ(As("alice", "tasks", {"--json"}).out, "{\"tasks\":[]}\n");
 }
 
+TEST_F(CliTest, APasswordIsTheFirstLineOfItsFile) {
+  Add("vol1/photo/a.txt", "a");
+  const std::string file = temp_.Path() + "/password";
+  WriteFile(file, "one two\r\nthree\n");
+  As("alice", "compress", {"/photo/a.txt", "/photo/z.7z", "--password-file", file});
+  EXPECT_EQ(RunProgram({"/usr/bin/7z", "t", "-pone two", At("vol1/photo/z.7z")}).status, 0);
+  EXPECT_NE(RunProgram({"/usr/bin/7z", "t", "-pnone", At("vol1/photo/z.7z")}).status, 0);
+}
+
 TEST_F(CliTest, InterruptedCompressStopsItsJob) {
   fs::resize_file(Add("vol1/photo/zeros", ""), std::uintmax_t{1} << 40U);
   const std::string trace = temp_.Path() + "/cli-trace";

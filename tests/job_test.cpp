@@ -79,6 +79,9 @@ TEST_F(JobTest, SourcesOfSeveralSharesAreNamedFromTheirShareWithLinksKept) {
     const Ran listing =
         RunProgram({"/usr/bin/7z", "l", At("vol1/photo/z." + format), "music/round"});
     EXPECT_NE(listing.out.find("2001-09-0"), std::string::npos) << listing.out;
+    const Ran pipe =
+        RunProgram({"/usr/bin/7z", "l", "-slt", At("vol1/photo/z." + format), "music/pipe"});
+    EXPECT_NE(pipe.out.find("rw-r--"), std::string::npos) << pipe.out;
     // The list file is gone; the folder of links is left behind, as every caller knows.
     ASSERT_EQ(StagedPaths().size(), ++jobs);
     EXPECT_TRUE(fs::is_symlink(StagedPaths().back() + "/music"));
@@ -125,6 +128,9 @@ TEST_F(JobTest, WhatTheUserMayNotReadFailsTheJob) {
   EXPECT_EQ(FailJob(JobParams({"/music"}, "/home/z.zip"), "carol"), Strings{"/music: 407"});
   EXPECT_EQ(FailJob(JobParams({"/photo"}, "/home/z.zip"), "carol"),
             (Strings{"/photo: 407", "/home/z.zip: 1300"}));
+  chmod(At("vol1/photo/trip").c_str(), 0744);
+  EXPECT_EQ(FailJob(JobParams({"/photo/trip"}, "/photo/z.zip"), "bob"),
+            Strings{"/photo/trip: 407"});
   EXPECT_FALSE(fs::exists(At("vol1/photo/z.zip")));
   EXPECT_TRUE(fs::is_empty(At("vol1/homes/carol")));
 }

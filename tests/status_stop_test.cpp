@@ -98,11 +98,22 @@ TEST_F(TaskTest, AKilledJobIsReportedAsFailed) {
       }
     }
     ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
+    const Json::Value view = Device::TaskView(Device::AllTasks("alice").back(), {});
+    EXPECT_NE(view["reason"].asString().find("was killed"), std::string::npos) << view;
+    Device::CloseStores();
     const Json::Value answer = Ask("status", task_id).data;
     EXPECT_TRUE(answer["finished"].asBool());
     EXPECT_EQ(Device::ToText(answer["errors"]), R"([{"code":1300,"path":"/photo/z.7z"}])");
     EXPECT_EQ(Ask("status", task_id).code, 599);
   }
+}
+
+TEST_F(TaskTest, AFailureThatIsNotMarkedAsTheEndIsReportedOnce) {
+  AddFaults({"Vesk::Task::beginUpdate=0", "Vesk::Task::finish=0"});
+  const Outcome started = Call("start", JobParams({"/photo/none"}, "/photo/z.zip"));
+  const std::string task_id = started.data["taskid"].asString();
+  EXPECT_TRUE(Follow(task_id).isMember("errors"));
+  EXPECT_EQ(Ask("status", task_id).code, 599);
 }
 
 // What the module does not keep.

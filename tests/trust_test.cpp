@@ -210,6 +210,7 @@ TEST_F(TrustTest, OldListsAreRemovedWithTheNextJob) {
               {unused(), 3600, kBob, true},
               {unused() + ".txt", 3600, kAlice, true},
               {of_links + "/lumozip-inner", 3600, kAlice, false},
+              {of_links + "/lumozip-young", 60, kAlice, true},
               {of_links + "/newsletter.txt", 3600, kAlice, true},
               {of_bob + "/lumozip-inner", 3600, kAlice, true}};
   for (const auto& row : rows) {

@@ -108,6 +108,8 @@ test('the page is asked for again by its validator, and what it consists of neve
   }
   const again = { headers: { 'If-None-Match': `W/"other", ${page.headers.get('etag')}` } };
   assert.deepEqual([(await alice.ask('/', again)).status, (await alice.ask('/', again)).text], [304, '']);
+  const { stdout: old } = await run('curl', ['-sD-', '-o/dev/null', '--http1.0', '-H', 'Accept-Encoding: gzip', `${device.url}/codes`]);
+  assert.doesNotMatch(old, /-encoding:/i);
   for (const [accepted, sent] of [['br', null], ['br, gzip', 'gzip'], ['gzip; q=0', null]]) {
     for (const route of ['/codes', files.at(-1)]) {
       const { headers } = await fetch(device.url + route, { headers: { 'Accept-Encoding': accepted } });

@@ -50,6 +50,18 @@ check('the dialog says what would fail, and the format and the ending follow eac
     await until(async () => (await field?.getAttribute('aria-invalid') ?? null) === (field && 'true'));
   }
   await noFaults('dialog');
+  const held = new Promise((resolve) => { page.route(/none.late.zip/, resolve, { times: 1 }); });
+  await folder.fill('/none');
+  await name.fill('late.zip');
+  const late = await held;
+  const answered = page.waitForResponse(/photo.trip.zip/);
+  await folder.fill('/photo');
+  await name.fill('trip.zip');
+  await answered;
+  await late.continue().catch(() => {});
+  await page.evaluate(() => fetch('/session').then((later) => later.text()));
+  assert.equal(await folder.getAttribute('aria-invalid'), null);
+  await name.press('Tab');
   assert.equal(await name.inputValue(), 'trip.zip');
   await dialog().getByLabel('Format').selectOption('7z');
   assert.equal(await name.inputValue(), 'trip.7z');
