@@ -1,10 +1,10 @@
 // "call": one request through the module.
+#include <iostream>
 #include <stdexcept>
 
 #include "device/base/json_text.h"
 #include "device/cli/client.h"
 #include "device/cli/commands.h"
-#include "device/cli/output.h"
 #include "device/host/launcher.h"
 #include "device/host/sessions.h"
 
@@ -46,7 +46,8 @@ int CallCommand(const Target& target, const CallOptions& options) {
     AddParam(param, request.params);
   }
   const Outcome outcome = launcher.Call(request);
-  PrintJson(JsonObject({{"code", outcome.code}, {"data", outcome.data}}));
+  // Odd bytes go out as they are.
+  std::cout << ToText(JsonObject({{"code", outcome.code}, {"data", outcome.data}})) << '\n';
   return outcome.code == 0 ? kExitDone : kExitFailed;
 }
 
