@@ -7,6 +7,7 @@
 
 #include "device/base/json_text.h"
 #include "device/tasks/task_store.h"
+#include "device/tasks/user_tasks.h"
 #include "tests/device_fixture.h"
 
 namespace {
@@ -85,6 +86,21 @@ TEST_F(StoreTest, ARowSeesWhatAnotherHasChangedMemberByMember) {
   std::map<std::string, Device::TaskRow> rows = {{mine.id, mine}};
   store.RefreshTasks(rows);
   EXPECT_TRUE(rows.empty());
+
+  // Of many tasks, what is large would take too much memory.
+  Device::TaskRow failed;
+  failed.id = "failed";
+  Json::Value data;
+  data["params"]["path"] = "/photo";
+  data["errors"][0]["path"] = std::string(Device::kLargeMember, 'x');
+  failed.properties["data"] = data;
+  store.AddTask(failed);
+  store.RefreshTasks(rows);
+  const Device::StoredValue& listed = rows["failed"].Property("data");
+  EXPECT_FALSE(listed.HasMember("params"));
+  EXPECT_EQ(listed.Member("errors"), Json::Value());
+  EXPECT_EQ(Device::TaskView(rows["failed"], {})["errors"].size(), 1U);
+  EXPECT_EQ(store.FindTask("failed")->Property("data").Value(), data);
 }
 
 // The bytes in the files, not what the database shows of them.

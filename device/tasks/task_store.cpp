@@ -1,6 +1,7 @@
 #include "device/tasks/task_store.h"
 
 #include <ctime>
+#include <limits>
 #include <utility>
 
 #include "device/model/device.h"
@@ -99,16 +100,17 @@ void TaskStore::WriteProperty(TaskRow& row, const std::string& name, StoredValue
   known = std::move(value);
 }
 
-bool TaskStore::ReadChanges(TaskRow& row, bool with_params) {
+bool TaskStore::ReadChanges(TaskRow& row, bool with_large) {
   Statement task(database_, "SELECT finished, updated, version FROM tasks WHERE id = ?", row.id);
   if (!task.Step()) {
     return false;
   }
   const std::string left_out = kMemberMark + std::string(kDataParams);
   Statement changes(database_,
-                    "SELECT name, member, value FROM members WHERE task = ? AND version > ? "
-                    "AND member IS NOT ? ORDER BY name, member",
-                    row.id, row.version, with_params ? nullptr : &left_out);
+                    "SELECT name, member, iif(length(value) > ?, 'null', value) FROM members "
+                    "WHERE task = ? AND version > ? AND member IS NOT ? ORDER BY name, member",
+                    with_large ? std::numeric_limits<std::int64_t>::max() : kLargeMember, row.id,
+                    row.version, with_large ? nullptr : &left_out);
   while (changes.Step()) {
     StoredValue& property = row.properties[changes.Text(0)];
     const std::string member = changes.Text(1);

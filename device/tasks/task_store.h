@@ -20,6 +20,7 @@ inline constexpr char kPropData[] = "data";
 inline constexpr char kDataPid[] = "pid";
 inline constexpr char kDataErrors[] = "errors";
 inline constexpr char kDataParams[] = "params";  // large when there are many sources
+inline constexpr std::int64_t kLargeMember = 65536;
 // A property of the device's own: what the archiver has told, by member.
 inline constexpr char kPropArchiver[] = "archiver";
 inline constexpr char kArchiverFile[] = "file";          // that is packed
@@ -79,8 +80,9 @@ class TaskStore {
   // Brings the row up to date. Only what has changed is read, of a property that is an object only
   // the members that have. False when there is no such task any more.
   bool RefreshTask(TaskRow& row);
-  // Brings all rows, by id, up to date: new ones come, and those that are gone go. None gets
-  // kDataParams, which of many tasks would take too much memory.
+  // Brings all rows, by id, up to date: new ones come, and those that are gone go. As many tasks
+  // would take too much memory, none gets kDataParams, and "null" is in place of members with more
+  // than kLargeMember characters.
   void RefreshTasks(std::map<std::string, TaskRow>& rows);
   // Stores the properties and the finished state together, and brings the row up to date. Only what
   // differs from the store is written. False when there is no such task.
@@ -115,7 +117,7 @@ class TaskStore {
 
  private:
   // Within a transaction.
-  bool ReadChanges(TaskRow& row, bool with_params);
+  bool ReadChanges(TaskRow& row, bool with_large);
   void WriteProperty(TaskRow& row, const std::string& name, StoredValue value);
   void WriteMember(const TaskRow& row, const std::string& name, const std::string& member,
                    const std::string* text);

@@ -16,8 +16,6 @@ namespace Device {
 
 namespace {
 
-constexpr std::size_t kMostListedErrors = std::size_t{64} << 10U;  // bytes of text
-
 bool HasLostWorker(const std::string& user, const TaskRow& row) {
   return !row.finished && !row.HasErrors() && HasDied(user, WorkerOf(row));
 }
@@ -151,8 +149,9 @@ Json::Value TaskView(const TaskRow& row, const std::map<pid_t, std::size_t>& wai
   const auto waits = waiting.find(WorkerOf(row));
   if (row.HasErrors()) {
     view["state"] = "failed";
-    const bool is_listed = data.members.at(kDataErrors).size() <= kMostListedErrors;
-    view[kDataErrors] = is_listed ? data.Member(kDataErrors) : GeneralError(row);
+    const bool is_listed = data.members.at(kDataErrors).size() <= kLargeMember;
+    const Json::Value errors = is_listed ? data.Member(kDataErrors) : Json::Value();
+    view[kDataErrors] = errors.isArray() ? errors : GeneralError(row);
     for (Json::Value& item : view[kDataErrors]) {
       item["path"] = WithUserPaths(item["path"].asString());
     }
