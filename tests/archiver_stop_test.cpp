@@ -28,8 +28,10 @@ TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
       WriteFile(share / "b", "b");
       Good("new", {"b"});
     }
-    const auto run = Pack({}, 200 << 20);
+    const auto run = Pack({}, 50 << 20);
+    kill(run->Pid(), SIGSTOP);
     Good("new", {"a"});
+    kill(run->Pid(), SIGCONT);
     const std::string other = ReadFile(out / "new");
     EXPECT_EQ(run->Wait(), 1);
     EXPECT_TRUE(run->ReadUntil("\nCompressing huge\nProgress: "));
@@ -40,9 +42,11 @@ TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
 }
 
 TEST_F(ArchiverTest, MakesNothingInAFolderThatHasMoved) {
-  const auto run = Pack({}, 200 << 20);
+  const auto run = Pack({}, 50 << 20);
+  kill(run->Pid(), SIGSTOP);
   fs::rename(out, root / "moved");
   fs::create_directory(out);
+  kill(run->Pid(), SIGCONT);
   EXPECT_EQ(run->Wait(), 1);
   EXPECT_TRUE(run->ReadUntil("its folder has moved meanwhile"));
   EXPECT_TRUE(fs::is_empty(out) && fs::is_empty(root / "moved"));
