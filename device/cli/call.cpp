@@ -36,12 +36,8 @@ void AddParam(const std::string& text, Json::Value& params) {
 int CallCommand(const Target& target, const CallOptions& options) {
   OpenFor({target.folder, "", target.is_json, target.is_quiet});  // the API itself refuses users
   Launcher launcher(WorkerLog::kSyslogOnly);
-  Request request;
-  request.api = options.api;
-  request.method = options.method;
-  request.version = options.version;
-  request.user = target.user;
-  request.session_id = SignIn(target.user);
+  Request request{options.api,       options.method, options.version,
+                  Json::objectValue, target.user,    SignIn(target.user)};
   for (const std::string& param : options.params) {
     AddParam(param, request.params);
   }

@@ -72,10 +72,6 @@ Outcome Client::Ask(const std::string& method, const Json::Value& params) {
       {"KAVO.Zantro.Compress", method, kApiVersion, params, user_, session_id_, is_follower_});
 }
 
-Outcome Client::AskAbout(const std::string& method, const std::string& task_id) {
-  return Ask(method, JsonObject({{"taskid", task_id}}));
-}
-
 Json::Value Client::Task(const std::string& id) const {
   return AskAs(user_, [&] {
     const std::optional<TaskRow> row = ReadTask(user_, id);

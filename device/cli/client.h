@@ -28,7 +28,6 @@ class Client {
   Client(const Target& target, bool is_follower);
 
   Outcome Ask(const std::string& method, const Json::Value& params);
-  Outcome AskAbout(const std::string& method, const std::string& task_id);
   // Null when there is no such task.
   Json::Value Task(const std::string& id) const;
 

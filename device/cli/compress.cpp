@@ -122,7 +122,7 @@ class Job {
       }
       bar_.Show(task);
       if (task["state"] == "finished" || task["state"] == "failed") {
-        client_.AskAbout("status", task_id_);  // which takes it off the list
+        client_.Ask("status", JsonObject({{"taskid", task_id_}}));  // which takes it off the list
         return End(task);
       }
       if (interrupted_by != 0) {
@@ -132,7 +132,7 @@ class Job {
   }
 
   int Stop(int signal_number) {
-    const int code = client_.AskAbout("stop", task_id_).code;
+    const int code = client_.Ask("stop", JsonObject({{"taskid", task_id_}})).code;
     if (code != 0) {
       return EndWith(code);
     }

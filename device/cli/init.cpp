@@ -11,7 +11,6 @@
 #include "device/base/json_text.h"
 #include "device/cli/commands.h"
 #include "device/cli/output.h"
-#include "device/model/config.h"
 #include "device/model/device.h"
 
 namespace Device {
@@ -45,16 +44,13 @@ constexpr char kSampleConfig[] = R"({
   ]
 }
 )";
-constexpr char kSampleOwner[] = "alice";
+constexpr uid_t kSampleOwner = 65001;  // alice
 
 constexpr std::size_t kKiB = 1024;
 constexpr std::size_t kMiB = 1024 * kKiB;
 
-struct SampleFile {
-  const char* path;
-  std::size_t size;  // bytes
-};
-constexpr SampleFile kSampleFiles[] = {
+// With their sizes in bytes.
+constexpr std::pair<const char*, std::size_t> kSampleFiles[] = {
     {"vol1/photo/cat.jpg", 300 * kKiB},
     {"vol1/photo/trip/day1/a.jpg", 3 * kMiB},
     {"vol1/photo/trip/day1/b, the second.jpg", 2 * kMiB},
@@ -69,11 +65,8 @@ constexpr SampleFile kSampleFiles[] = {
 };
 constexpr char kSampleEmptyFolder[] = "vol1/photo/trip/empty";
 
-struct SampleLink {
-  const char* path;
-  const char* target;
-};
-constexpr SampleLink kSampleLinks[] = {
+// With their targets.
+constexpr std::pair<const char*, const char*> kSampleLinks[] = {
     {"vol1/photo/trip/best.jpg", "day1/a.jpg"},  // inside the shared folder
     {"vol1/photo/host", "/etc"},                 // off the device
 };
@@ -93,26 +86,21 @@ void WriteNoise(const fs::path& path, std::size_t size) {
 
 // Gives what the sample put below a folder of the device to its owner, not the folder itself.
 void GiveToOwner(const fs::path& folder) {
-  const Config config = ParseConfig(kSampleConfig);
-  const User* const owner = config.FindUser(kSampleOwner);
-  if (geteuid() != 0 || owner == nullptr) {
-    return;
-  }
   for (const fs::directory_entry& entry : fs::recursive_directory_iterator(folder)) {
-    if (lchown(entry.path().c_str(), owner->uid, kUsersGroup) != 0) {
+    if (geteuid() == 0 && lchown(entry.path().c_str(), kSampleOwner, kUsersGroup) != 0) {
       ThrowErrno("owner of '" + entry.path().string() + "'");
     }
   }
 }
 
 void AddSampleFiles(const fs::path& root) {
-  for (const SampleFile& file : kSampleFiles) {
-    fs::create_directories((root / file.path).parent_path());
-    WriteNoise(root / file.path, file.size);
+  for (const auto& [path, size] : kSampleFiles) {
+    fs::create_directories((root / path).parent_path());
+    WriteNoise(root / path, size);
   }
   fs::create_directories(root / kSampleEmptyFolder);
-  for (const SampleLink& link : kSampleLinks) {
-    fs::create_symlink(link.target, root / link.path);
+  for (const auto& [path, target] : kSampleLinks) {
+    fs::create_symlink(target, root / path);
   }
   for (const char* folder :
        {"vol1/photo", "vol1/music", "vol1/attic", "vol2/video", "vol2/vault", "vol1/homes/alice"}) {

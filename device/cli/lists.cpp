@@ -96,7 +96,8 @@ int TaskCommand(const Target& target, const std::string& command,
       error = "the job has not ended; \"stop\" ends it";
     } else if (error.empty() && command != "status") {
       // A "status" that reports the end of a task takes it off the list.
-      const int code = client.AskAbout(command == "stop" ? "stop" : "status", id).code;
+      const std::string method = command == "stop" ? "stop" : "status";
+      const int code = client.Ask(method, JsonObject({{"taskid", id}})).code;
       error = code == 0 ? "" : ErrorText(code);
     }
     if (!error.empty()) {

@@ -29,16 +29,13 @@ namespace Device {
 
 namespace {
 
-std::string DlError() {
-  const char* const reason = dlerror();
-  return reason == nullptr ? "unknown reason" : reason;
-}
+constexpr char kCannotLoad[] = "cannot load module: ";
 
 void* LoadModule() {
   const std::string path = PathOf(TheDevice().module.Get());
   void* const module = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
   if (module == nullptr) {
-    throw std::runtime_error("cannot load module: " + DlError());
+    throw std::runtime_error(std::string(kCannotLoad) + dlerror());
   }
   return module;
 }
@@ -46,9 +43,25 @@ void* LoadModule() {
 const KAVO::ApiRow* GetTable(void* module) {
   auto* const get_table = reinterpret_cast<void* (*)()>(dlsym(module, "GetAPITable"));
   if (get_table == nullptr) {
-    throw std::runtime_error("cannot load module: " + DlError());
+    throw std::runtime_error(std::string(kCannotLoad) + dlerror());
   }
   return static_cast<const KAVO::ApiRow*>(get_table());
+}
+
+// Null, and the host's error code in `code`, when no row serves the request.
+const KAVO::ApiRow* FindRow(const KAVO::ApiRow* row, const Request& request, int& code) {
+  code = KAVO::kErrNoApi;
+  for (; row->api != nullptr; ++row) {
+    if (request.api == row->api) {
+      const bool is_method = request.method == row->method;
+      if (is_method && request.version == row->version) {
+        return row;
+      }
+      // The one that comes nearest is told: the codes ascend.
+      code = std::max<int>(code, is_method ? KAVO::kErrNoVersion : KAVO::kErrNoMethod);
+    }
+  }
+  return nullptr;
 }
 
 // True if somebody may read standard error until every process has closed it.
@@ -79,24 +92,9 @@ Launcher::Launcher(WorkerLog worker_log)
 
 Launcher::~Launcher() { TheHost() = {}; }
 
-const KAVO::ApiRow* Launcher::FindRow(const Request& request, int& code) const {
-  code = KAVO::kErrNoApi;
-  for (const KAVO::ApiRow* row = table_; row->api != nullptr; ++row) {
-    if (request.api == row->api) {
-      const bool is_method = request.method == row->method;
-      if (is_method && request.version == row->version) {
-        return row;
-      }
-      // The one that comes nearest is told: the codes ascend.
-      code = std::max<int>(code, is_method ? KAVO::kErrNoVersion : KAVO::kErrNoMethod);
-    }
-  }
-  return nullptr;
-}
-
 Outcome Launcher::CallHere(const Request& request) {
   Outcome outcome;
-  const KAVO::ApiRow* const row = FindRow(request, outcome.code);
+  const KAVO::ApiRow* const row = FindRow(table_, request, outcome.code);
   if (row == nullptr) {
     return outcome;
   }
@@ -130,11 +128,7 @@ Outcome Launcher::CallSafely(const Request& request) {
 }
 
 Outcome Launcher::Call(const Request& request) {
-  Outcome outcome;
-  if (FindRow(request, outcome.code) == nullptr) {
-    return outcome;
-  }
-  outcome.code = KAVO::kErrInternal;
+  Outcome outcome{KAVO::kErrInternal, Json::Value()};
   try {
     const std::optional<Json::Value> reached = AskProcess(answer_, [&] {
       const Outcome own = CallSafely(request);

@@ -47,9 +47,6 @@ class Launcher {
   static void Reap();
 
  private:
-  // Null, and the host's error code in `code`, when no row serves the request.
-  const KAVO::ApiRow* FindRow(const Request& request, int& code) const;
-
   std::unique_ptr<void, int (*)(void*)> module_;
   const KAVO::ApiRow* table_ = nullptr;
   FileDescriptor answer_;

@@ -71,14 +71,13 @@ Answer CallApi(Launcher& launcher, const std::string& user, const Json::Value& a
   } catch (const std::runtime_error& error) {
     return Refusal(kHttpBadRequest, error.what());
   }
-  Request request;
-  request.api = call["api"].asString();
-  request.method = call["method"].asString();
-  request.version = call["version"].asInt();
-  request.params = std::move(call["params"]);  // may be large, and a worker inherits it
-  request.is_followed = asked["followed"].asBool();
-  request.user = user;
-  request.session_id = asked["session"].asString();
+  const Request request{call["api"].asString(),
+                        call["method"].asString(),
+                        call["version"].asInt(),
+                        std::move(call["params"]),  // may be large, and a worker inherits it
+                        user,
+                        asked["session"].asString(),
+                        asked["followed"].asBool()};
   const Outcome outcome = launcher.CallSafely(request);
   return outcome.code != 0 && TheShortage() != Shortage::kNone
              ? RefusalFor(TheShortage())
