@@ -133,7 +133,6 @@ void WebHost::EndFrontEnd() {
   if (front_end_ < 0) {
     return;
   }
-  kill(front_end_, SIGTERM);
   const auto deadline = std::chrono::steady_clock::now() + kFrontEndGrace;
   while (waitpid(front_end_, nullptr, WNOHANG) == 0) {
     if (std::chrono::steady_clock::now() > deadline) {

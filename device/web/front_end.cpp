@@ -12,6 +12,7 @@
 #include "device/host/body.h"
 #include "device/web/connection.h"
 #include "device/web/download.h"
+#include "device/web/page_files.h"
 #include "device/web/request_head.h"
 #include "device/web/responses.h"
 
@@ -118,7 +119,7 @@ const char* ReasonFor(int status) {
 
 }  // namespace
 
-FrontEnd::FrontEnd(const PageFiles& page) {
+FrontEnd::FrontEnd(int page) {
   new_task_queue = [] { return new ConnectionThreads; };
   set_tcp_nodelay(true);
   set_socket_options([](int socket) {
@@ -159,7 +160,7 @@ FrontEnd::FrontEnd(const PageFiles& page) {
       Refuse(response, response.status, ReasonFor(response.status));
     }
   });
-  AddPage(page);
+  AddPage(*this, page);
   AddRoutes();
 }
 
@@ -169,28 +170,6 @@ bool FrontEnd::process_and_close_socket(socket_t socket) {
   // One request each. What a refused one leaves unread, or its length read in another way by a
   // proxy, would be taken for the next one, which the refusal was to prevent.
   return process_request(connection, true, is_closed, nullptr);
-}
-
-void FrontEnd::AddPage(const PageFiles& page) {
-  for (const auto& [path, file] : page.files) {
-    std::string pattern;
-    for (const char each : path) {
-      pattern += each == '.' ? "\\." : std::string(1, each);
-    }
-    const bool is_index = path == "/";
-    Get(pattern, [&file = file, &page, is_index](const Request& request, Response& response) {
-      const std::string validator = "W/\"" + page.version + "\"";
-      response.headers.erase("Cache-Control");
-      response.set_header("Cache-Control", is_index ? "no-cache" : "max-age=31536000, immutable");
-      response.set_header("Vary", "Accept-Encoding");
-      response.set_header("ETag", validator);
-      if (request.get_header_value("If-None-Match").find(validator) != std::string::npos) {
-        response.status = Device::kHttpNotModified;
-      } else {
-        response.set_content(file.content, file.content_type);
-      }
-    });
-  }
 }
 
 void FrontEnd::AddRoutes() {

@@ -9,13 +9,13 @@
 #include <string>
 
 #include "device/web/exchange.h"
-#include "device/web/page_files.h"
 
 namespace Web {
 
 class FrontEnd : public httplib::Server {
  public:
-  explicit FrontEnd(const PageFiles& page);
+  // Serves the page that lies in the open folder.
+  explicit FrontEnd(int page);
 
   // Binds the port, any free one for 0, and returns it; -1 with errno when that fails.
   int Bind(const std::string& address, int port);
@@ -27,7 +27,6 @@ class FrontEnd : public httplib::Server {
  private:
   bool process_and_close_socket(socket_t socket) override;
   void AddRoutes();
-  void AddPage(const PageFiles& page);
   void Ask(const std::string& kind, const httplib::Request& request, httplib::Response& response);
   void StreamEvents(const std::shared_ptr<Exchange>& exchange, httplib::Response& response);
 

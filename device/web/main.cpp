@@ -6,7 +6,6 @@
 #include <poll.h>
 #include <sys/prctl.h>
 #include <sys/resource.h>
-#include <sys/signalfd.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -67,11 +66,10 @@ std::pair<std::string, std::uint16_t> ParseAddress(const std::string& listen) {
   return {host, port};
 }
 
-// Ends the process when the launcher asks or is gone.
-void WaitForTheEnd(const sigset_t& ending, Web::FrontEnd& front_end) {
-  const int signals = signalfd(-1, &ending, SFD_CLOEXEC);
-  pollfd sources[] = {{signals, POLLIN, 0}, {STDIN_FILENO, POLLHUP, 0}};
-  while (poll(sources, std::size(sources), -1) < 0) {
+// Ends the process when the launcher has closed its socket or is gone.
+void WaitForTheEnd(Web::FrontEnd& front_end) {
+  pollfd launcher = {STDIN_FILENO, POLLHUP, 0};
+  while (poll(&launcher, 1, -1) < 0) {
   }
   front_end.End();
   _exit(0);
@@ -99,21 +97,14 @@ std::string Bind(const std::string& listen, Web::FrontEnd& front_end) {
 }
 
 void Serve(const std::string& listen, int page, int socket) {
-  const Web::PageFiles files = Web::ReadPageFiles(page);
-  close(page);
   AllowManyDescriptors();
   setsid();  // away from root's terminal
-  Web::FrontEnd front_end(files);
+  Web::FrontEnd front_end(page);
+  close(page);
   front_end.Take(socket);
   const std::string bound = socket < 0 ? Bind(listen, front_end) : AddressOf(socket);
   GiveUpRights();
-  sigset_t ending;
-  sigemptyset(&ending);
-  for (const int signal_number : {SIGTERM, SIGINT, SIGHUP}) {
-    sigaddset(&ending, signal_number);
-  }
-  sigprocmask(SIG_BLOCK, &ending, nullptr);
-  std::thread([&] { WaitForTheEnd(ending, front_end); }).detach();
+  std::thread([&] { WaitForTheEnd(front_end); }).detach();
   const Json::Value listening =
       Device::JsonObject({{"kind", Device::kKindListening}, {"address", bound}});
   Device::SendMessage(STDIN_FILENO, Device::ToText(listening), -1);

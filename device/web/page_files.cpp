@@ -2,12 +2,15 @@
 
 #include <filesystem>
 #include <functional>
+#include <map>
 #include <regex>
 #include <stdexcept>
+#include <string>
 #include <utility>
 
 #include "device/base/file_io.h"
 #include "device/base/open_below.h"
+#include "device/host/wire.h"
 
 namespace Web {
 
@@ -32,25 +35,40 @@ std::string ContentType(const std::string& extension) {
 
 }  // namespace
 
-PageFiles ReadPageFiles(int folder) {
-  std::map<std::string, PageFile> by_name;
-  std::string all;
+void AddPage(httplib::Server& server, int folder) {
+  std::map<fs::path, std::string> files;
   for (const auto& entry : fs::directory_iterator(Device::PathOf(folder))) {
-    by_name[entry.path().filename().string()] = {Device::ReadTextFile(entry.path().string()),
-                                                 ContentType(entry.path().extension().string())};
+    files[entry.path().filename()] = Device::ReadTextFile(entry.path().string());
   }
-  for (const auto& [name, file] : by_name) {
-    all.append(name).append(file.content);
+  std::string all;
+  for (const auto& [name, content] : files) {
+    all.append(name).append(content);
   }
-  PageFiles page{std::to_string(std::hash<std::string>()(all)), {}};
-  for (auto& [name, file] : by_name) {
-    if (name == kIndex) {
+  const std::string version = std::to_string(std::hash<std::string>()(all));
+  for (auto& [name, content] : files) {
+    const bool is_index = name == kIndex;
+    if (is_index) {
       static const std::regex kFileUrl("(href|src)=\"/(?=[a-z])");
-      file.content = std::regex_replace(file.content, kFileUrl, "$1=\"/" + page.version + "/");
+      content = std::regex_replace(content, kFileUrl, "$1=\"/" + version + "/");
     }
-    page.files[name == kIndex ? "/" : "/" + page.version + "/" + name] = std::move(file);
+    // A pattern: but for the dot of the ending, names are letters and hyphens.
+    const std::string path =
+        is_index ? "/"
+                 : "/" + version + "/" + name.stem().string() + "\\" + name.extension().string();
+    server.Get(path, [content = content, type = ContentType(name.extension()), is_index,
+                      validator = "W/\"" + version + "\""](const httplib::Request& request,
+                                                           httplib::Response& response) {
+      response.headers.erase("Cache-Control");
+      response.set_header("Cache-Control", is_index ? "no-cache" : "max-age=31536000, immutable");
+      response.set_header("Vary", "Accept-Encoding");
+      response.set_header("ETag", validator);
+      if (request.get_header_value("If-None-Match").find(validator) != std::string::npos) {
+        response.status = Device::kHttpNotModified;
+      } else {
+        response.set_content(content, type);
+      }
+    });
   }
-  return page;
 }
 
 }  // namespace Web

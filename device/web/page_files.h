@@ -1,24 +1,13 @@
 // The page's files, read once.
 #pragma once
 
-#include <map>
-#include <string>
+#include <httplib.h>
 
 namespace Web {
 
-struct PageFile {
-  std::string content;
-  std::string content_type;
-};
-
-struct PageFiles {
-  std::string version;                    // changes with any of them
-  std::map<std::string, PageFile> files;  // by URL path
-};
-
-// Every file of the folder. index.html is "/"; the others lie below the version, under which
-// index.html names them, so that who has them need never ask for them again. Throws
-// std::runtime_error that names the file and the reason.
-PageFiles ReadPageFiles(int folder);
+// Serves every file of the folder. index.html is "/"; the others lie below a version that changes
+// with any of them, under which index.html names them, so that who has them need never ask for them
+// again. Throws std::runtime_error that names the file and the reason.
+void AddPage(httplib::Server& server, int folder);
 
 }  // namespace Web
