@@ -28,49 +28,35 @@ class ConfigReader {
   using MemberReaders = std::map<std::string, std::function<void(const Json::Value&)>>;
 
   // Every member must have a reader and every reader its member, but those that are optional.
-  void ReadObject(const Json::Value& object, const std::string& what, const MemberReaders& required,
-                  const MemberReaders& optional) const {
-    if (!object.isObject()) {
-      Fail(object, what + " is not an object");
-    }
+  void ReadObject(const Json::Value& object, const std::string& what, const MemberReaders& readers,
+                  const std::set<std::string>& optional) const {
+    Expect(object.isObject(), object, what + " is not an object");
     for (const std::string& key : object.getMemberNames()) {
-      const Json::Value& member = object[key];
-      if (const auto found = required.find(key); found != required.end()) {
-        found->second(member);
-      } else if (const auto other = optional.find(key); other != optional.end()) {
-        other->second(member);
-      } else {
-        Fail(member, std::string("unknown key '").append(key).append("'"));
-      }
+      const auto found = readers.find(key);
+      Expect(found != readers.end(), object[key], "unknown key '" + key + "'");
+      found->second(object[key]);
     }
-    for (const auto& [key, reader] : required) {
-      if (!object.isMember(key)) {
-        Fail(object, what + " lacks '" + key + "'");
-      }
+    for (const auto& [key, reader] : readers) {
+      Expect(object.isMember(key) || optional.count(key) != 0, object,
+             what + " lacks '" + key + "'");
     }
   }
 
   void ReadArray(const Json::Value& array, const std::string& what,
                  const std::function<void(const Json::Value&)>& reader) const {
-    if (!array.isArray()) {
-      Fail(array, "'" + what + "' is not an array");
-    }
+    Expect(array.isArray(), array, "'" + what + "' is not an array");
     for (const Json::Value& element : array) {
       reader(element);
     }
   }
 
   std::string Text(const Json::Value& value) const {
-    if (!value.isString()) {
-      Fail(value, "expected a text");
-    }
+    Expect(value.isString(), value, "expected a text");
     return value.asString();
   }
 
   bool Bool(const Json::Value& value) const {
-    if (!value.isBool()) {
-      Fail(value, "expected true or false");
-    }
+    Expect(value.isBool(), value, "expected true or false");
     return value.asBool();
   }
 
@@ -81,20 +67,20 @@ class ConfigReader {
     const bool is_plain = std::all_of(name.begin(), name.end(), [](char each) {
       return static_cast<unsigned char>(each) > ' ' && each != '/';
     });
-    if (name.empty() || name.size() > kNameMax || name[0] == '.' || name[0] == '@' || !is_plain) {
-      Fail(value, "'" + name + "' is not a valid name");
-    }
+    Expect(is_plain && !name.empty() && name.size() <= kNameMax && name[0] != '.' && name[0] != '@',
+           value, "'" + name + "' is not a valid name");
     return name;
   }
 
   unsigned int Number(const Json::Value& value) const {
-    if (!value.isUInt() || value.asUInt() == 0) {
-      Fail(value, "expected a whole number above 0");
-    }
+    Expect(value.isUInt() && value.asUInt() != 0, value, "expected a whole number above 0");
     return value.asUInt();
   }
 
-  [[noreturn]] void Fail(const Json::Value& value, const std::string& reason) const {
+  void Expect(bool is_right, const Json::Value& value, const std::string& reason) const {
+    if (is_right) {
+      return;
+    }
     const auto end = text_.begin() +
                      std::min<std::ptrdiff_t>(value.getOffsetStart(), std::ptrdiff_t(text_.size()));
     throw std::runtime_error("line " + std::to_string(std::count(text_.begin(), end, '\n') + 1) +
@@ -121,25 +107,22 @@ bool IsPasswordHash(const std::string& text) {
 
 std::string ReadPassword(const ConfigReader& reader, const Json::Value& value) {
   std::string hash = reader.Text(value);
-  if (!IsPasswordHash(hash)) {
-    reader.Fail(value, "'password' is no hash of crypt(3), as 'openssl passwd -6' prints one");
-  }
+  reader.Expect(IsPasswordHash(hash), value,
+                "'password' is no hash of crypt(3), as 'openssl passwd -6' prints one");
   return hash;
 }
 
 std::string ReadCodePage(const ConfigReader& reader, const Json::Value& value) {
   std::string name = reader.Text(value);
-  if (!CodePage::IsUtf8(name) && !CodePage::Open(name)) {
-    reader.Fail(value, "unknown code page '" + name + "'");
-  }
+  reader.Expect(CodePage::IsUtf8(name) || CodePage::Open(name), value,
+                "unknown code page '" + name + "'");
   return name;
 }
 
 uid_t ReadUid(const ConfigReader& reader, const Json::Value& value) {
-  if (!value.isUInt() || value.asUInt() == 0 ||
-      value.asUInt() == std::numeric_limits<std::uint32_t>::max()) {
-    reader.Fail(value, "'uid' is not a number above 0");
-  }
+  reader.Expect(value.isUInt() && value.asUInt() != 0 &&
+                    value.asUInt() != std::numeric_limits<std::uint32_t>::max(),
+                value, "'uid' is not a number above 0");
   return value.asUInt();
 }
 
@@ -147,25 +130,23 @@ Access ReadAccess(const ConfigReader& reader, const Json::Value& value) {
   static const std::map<std::string, Access> kWords = {
       {"rw", Access::kReadWrite}, {"ro", Access::kReadOnly}, {"list-denied", Access::kListDenied}};
   const auto found = kWords.find(reader.Text(value));
-  if (found == kWords.end()) {
-    reader.Fail(value, "access is one of 'rw', 'ro', 'list-denied'");
-  }
+  reader.Expect(found != kWords.end(), value, "access is one of 'rw', 'ro', 'list-denied'");
   return found->second;
+}
+
+bool HasVolume(const Config& config, const std::string& name) {
+  return std::find(config.volumes.begin(), config.volumes.end(), name) != config.volumes.end();
 }
 
 void CheckVolume(const ConfigReader& reader, const Json::Value& where, const Config& config,
                  const std::string& volume) {
-  if (std::find(config.volumes.begin(), config.volumes.end(), volume) == config.volumes.end()) {
-    reader.Fail(where, "no volume '" + volume + "'");
-  }
+  reader.Expect(HasVolume(config, volume), where, "no volume '" + volume + "'");
 }
 
 void AddVolume(const ConfigReader& reader, const Json::Value& value, Config& config) {
   std::string name = reader.Name(value);
-  if (kReservedVolumes.count(name) != 0 ||
-      std::find(config.volumes.begin(), config.volumes.end(), name) != config.volumes.end()) {
-    reader.Fail(value, std::string("the name '").append(name).append("' is taken"));
-  }
+  reader.Expect(kReservedVolumes.count(name) == 0 && !HasVolume(config, name), value,
+                "the name '" + name + "' is taken");
   config.volumes.push_back(std::move(name));
 }
 
@@ -175,15 +156,15 @@ void AddUser(const ConfigReader& reader, const Json::Value& value, Config& confi
       value, "user",
       {{"name", [&](const Json::Value& each) { user.name = reader.Name(each); }},
        {"uid", [&](const Json::Value& each) { user.uid = ReadUid(reader, each); }},
-       {"home", [&](const Json::Value& each) { user.home = reader.Name(each); }}},
-      {{"admin", [&](const Json::Value& each) { user.admin = reader.Bool(each); }},
+       {"home", [&](const Json::Value& each) { user.home = reader.Name(each); }},
+       {"admin", [&](const Json::Value& each) { user.admin = reader.Bool(each); }},
        {"codepage", [&](const Json::Value& each) { user.codepage = ReadCodePage(reader, each); }},
-       {"password", [&](const Json::Value& each) { user.password = ReadPassword(reader, each); }}});
+       {"password", [&](const Json::Value& each) { user.password = ReadPassword(reader, each); }}},
+      {"admin", "codepage", "password"});
   CheckVolume(reader, value, config, user.home);
   for (const User& other : config.users) {
-    if (other.name == user.name || other.uid == user.uid) {
-      reader.Fail(value, "user '" + user.name + "' has the name or uid of another");
-    }
+    reader.Expect(other.name != user.name && other.uid != user.uid, value,
+                  "user '" + user.name + "' has the name or uid of another");
   }
   config.users.push_back(std::move(user));
 }
@@ -191,13 +172,9 @@ void AddUser(const ConfigReader& reader, const Json::Value& value, Config& confi
 void AddShare(const ConfigReader& reader, const Json::Value& value, Config& config) {
   Share share;
   const auto read_access = [&](const Json::Value& access) {
-    if (!access.isObject()) {
-      reader.Fail(access, "'access' is not an object");
-    }
+    reader.Expect(access.isObject(), access, "'access' is not an object");
     for (const std::string& user : access.getMemberNames()) {
-      if (config.FindUser(user) == nullptr) {
-        reader.Fail(access[user], "no user '" + user + "'");
-      }
+      reader.Expect(config.FindUser(user) != nullptr, access[user], "no user '" + user + "'");
       share.access[user] = ReadAccess(reader, access[user]);
     }
   };
@@ -205,13 +182,13 @@ void AddShare(const ConfigReader& reader, const Json::Value& value, Config& conf
       value, "shared folder",
       {{"name", [&](const Json::Value& each) { share.name = reader.Name(each); }},
        {"volume", [&](const Json::Value& each) { share.volume = reader.Name(each); }},
-       {"access", read_access}},
-      {{"encrypted", [&](const Json::Value& each) { share.encrypted = reader.Bool(each); }},
-       {"read_only", [&](const Json::Value& each) { share.read_only = reader.Bool(each); }}});
+       {"access", read_access},
+       {"encrypted", [&](const Json::Value& each) { share.encrypted = reader.Bool(each); }},
+       {"read_only", [&](const Json::Value& each) { share.read_only = reader.Bool(each); }}},
+      {"encrypted", "read_only"});
   CheckVolume(reader, value, config, share.volume);
-  if (config.FindShare(share.name) != nullptr || kReservedShares.count(share.name) != 0) {
-    reader.Fail(value, "the name '" + share.name + "' is taken");
-  }
+  reader.Expect(config.FindShare(share.name) == nullptr && kReservedShares.count(share.name) == 0,
+                value, "the name '" + share.name + "' is taken");
   config.shares.push_back(std::move(share));
 }
 
@@ -243,12 +220,14 @@ Config ParseConfig(const std::string& file) {
   reader.ReadObject(root, "the device",
                     {{"volumes", read_volumes},
                      {"users", [&](const Json::Value& each) { users = each; }},
-                     {"shares", [&](const Json::Value& each) { shares = each; }}},
-                    {{"jobs_at_once",
+                     {"shares", [&](const Json::Value& each) { shares = each; }},
+                     {"jobs_at_once",
                       [&](const Json::Value& each) { config.jobs_at_once = reader.Number(each); }},
-                     {"memory_for_jobs_mib", [&](const Json::Value& each) {
+                     {"memory_for_jobs_mib",
+                      [&](const Json::Value& each) {
                         config.memory_for_jobs = std::uint64_t{reader.Number(each)} << 20U;
-                      }}});
+                      }}},
+                    {"jobs_at_once", "memory_for_jobs_mib"});
   reader.ReadArray(users, "users", [&](const Json::Value& each) { AddUser(reader, each, config); });
   reader.ReadArray(shares, "shares",
                    [&](const Json::Value& each) { AddShare(reader, each, config); });
