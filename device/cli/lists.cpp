@@ -76,8 +76,8 @@ int LsCommand(const Target& target, const std::string& folder) {
 int NotificationsCommand(const Target& target) {
   return PrintList(target, "notifications", PrintNotification, [&] {
     Json::Value list = JsonObject({{"notifications", Json::arrayValue}});
-    for (const NotificationRow& row : StoreOf(target.user).NotificationsAfter(0)) {
-      list["notifications"].append(NotificationView(row));
+    for (const auto& [number, view] : StoreOf(target.user).NotificationsAfter(0)) {
+      list["notifications"].append(view);
     }
     return list;
   });

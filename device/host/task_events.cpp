@@ -88,9 +88,9 @@ class Watcher {
   }
 
   void SendNotifications() {
-    for (const NotificationRow& row : StoreOf(user_).NotificationsAfter(last_)) {
-      Send("notification", NotificationView(row));
-      last_ = row.number;
+    for (const auto& [number, view] : StoreOf(user_).NotificationsAfter(last_)) {
+      Send("notification", view);
+      last_ = number;
     }
   }
 
@@ -106,14 +106,6 @@ class Watcher {
 };
 
 }  // namespace
-
-Json::Value NotificationView(const NotificationRow& row) {
-  return JsonObject({{"time", Json::Int64{row.time}},
-                     {"taskid", row.task},
-                     {"title", row.title},
-                     {"message", row.message},
-                     {"arguments", JsonArray(row.arguments)}});
-}
 
 void SendTaskEvents(int stream, const std::string& user, const std::string& session_id) {
   Watcher watcher(stream, user);

@@ -59,8 +59,6 @@ struct LeftoversRow {
 };
 
 struct NotificationRow {
-  std::int64_t number = 0;  // from 1 on, in the order of sending
-  std::int64_t time = 0;    // seconds since 1970
   std::string app;
   std::string task;
   std::string title;
@@ -106,8 +104,9 @@ class TaskStore {
   void RemoveLeftovers(std::int64_t number);
 
   void AddNotification(const NotificationRow& row);
-  // The ones after that number, all for 0.
-  std::vector<NotificationRow> NotificationsAfter(std::int64_t number);
+  // The ones after that number, from 1 on in the order of sending: "time" (seconds since 1970),
+  // "taskid", "title", "message" (a key), "arguments" (HTML-encoded).
+  std::map<std::int64_t, Json::Value> NotificationsAfter(std::int64_t number);
   std::int64_t LastNotification();
 
   // A number that changes whenever another connection has changed the store.

@@ -84,22 +84,23 @@ void NoteWhatIsLeft(const Arguments& arguments, const std::string& work_folder) 
 
 }  // namespace
 
-void ArchiverNews::Take(const std::string& line) {
+Json::Value& TheArchiverNews() {
+  static Json::Value news(Json::objectValue);
+  return news;
+}
+
+void TakeArchiverLine(const std::string& line) {
   static const std::string kFile = "Compressing ";
   static const std::string kError = "Error: ";
   static const std::string kNote = "Note: ";
+  Json::Value& news = TheArchiverNews();
   if (line.rfind(kFile, 0) == 0) {
-    file = line.substr(kFile.size());
-  } else if (reason.empty() && line.rfind(kError, 0) == 0) {  // what follows says less
-    reason = line.substr(kError.size());
+    news[kArchiverFile] = line.substr(kFile.size());
+  } else if (line.rfind(kError, 0) == 0 && !news.isMember(kArchiverReason)) {
+    news[kArchiverReason] = line.substr(kError.size());  // what follows says less
   } else if (line.rfind(kNote, 0) == 0) {
     syslog(LOG_NOTICE, "%s", line.substr(kNote.size()).c_str());
   }
-}
-
-ArchiverNews& TheArchiverNews() {
-  static ArchiverNews news;
-  return news;
 }
 
 ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun& run) {
@@ -137,7 +138,9 @@ ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun
 void TakeArchive(const ArchiverRun& run) {
   if (FileDescriptor made = ReceiveMadeArchive(run.call.Get())) {
     struct stat status {};
-    TheArchiverNews().size = fstat(made.Get(), &status) == 0 ? status.st_size : 0;
+    if (fstat(made.Get(), &status) == 0) {
+      TheArchiverNews()[kArchiverSize] = Json::UInt64(status.st_size);
+    }
     the_archive = {run.archive, std::move(made)};
   }
 }

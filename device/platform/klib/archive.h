@@ -1,7 +1,8 @@
 // The archiver that stands behind /usr/bin/7z, and the archive that it has made.
 #pragma once
 
-#include <cstdint>
+#include <json/json.h>
+
 #include <string>
 
 #include "device/base/child_process.h"
@@ -15,17 +16,11 @@ struct ArchiverRun {
   std::string archive;  // path
 };
 
-// What this process's archiver has told.
-struct ArchiverNews {
-  std::string file;        // that is packed; empty: none was named yet
-  std::string reason;      // why it failed; empty: it did not, or gave none
-  std::uint64_t size = 0;  // of the archive that was made, in bytes
-
-  // Takes what a line of its output says.
-  void Take(const std::string& line);
-};
-
-ArchiverNews& TheArchiverNews();
+// What this process's archiver has told, for the task: an object of kArchiverFile, kArchiverReason
+// and kArchiverSize, as far as they are known.
+Json::Value& TheArchiverNews();
+// Takes what a line of its output says.
+void TakeArchiverLine(const std::string& line);
 
 // Starts the device's archiver with the module's argument vector; the password in it is handed over
 // by descriptor, as everybody can read argument lists. Throws std::exception, among others when the

@@ -64,7 +64,7 @@ struct ProgramOutput {
       if (*text != '\n') {
         line += *text;
       } else {
-        TheArchiverNews().Take(std::exchange(line, {}));
+        TakeArchiverLine(std::exchange(line, {}));
       }
     }
   }
@@ -131,7 +131,7 @@ FILE* OpenProgram(const char* program, const char* mode, char* const* arguments)
     return nullptr;
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "%s: %s", program, error.what());
-    TheArchiverNews().reason = error.what();
+    TheArchiverNews()[kArchiverReason] = error.what();
     KlibError(EPERM);
     return nullptr;
   }

@@ -2,7 +2,6 @@
 #include <syslog.h>
 
 #include <cstdarg>
-#include <ctime>
 #include <map>
 #include <memory>
 #include <stdexcept>
@@ -45,22 +44,6 @@ auto LogAndThrow(const char* operation, Body body) {
   }
 }
 
-// For who watches the task: the module keeps no names of files and no reasons.
-Json::Value NewsOfArchiver() {
-  const Device::ArchiverNews& news = Device::TheArchiverNews();
-  Json::Value told(Json::objectValue);
-  for (const auto& [name, text] : {std::pair(Device::kArchiverFile, news.file),
-                                   std::pair(Device::kArchiverReason, news.reason)}) {
-    if (!text.empty()) {
-      told[name] = text;
-    }
-  }
-  if (news.size > 0) {
-    told[Device::kArchiverSize] = Json::UInt64{news.size};
-  }
-  return told;
-}
-
 }  // namespace
 
 const Device::StoredValue& Task::State::Find(const std::string& name) const {
@@ -69,13 +52,8 @@ const Device::StoredValue& Task::State::Find(const std::string& name) const {
 }
 
 bool Task::State::Set(const std::string& name, Device::StoredValue value) {
-  if (is_updating) {
-    pending[name] = std::move(value);
-    return true;
-  }
-  std::map<std::string, Device::StoredValue> properties;
-  properties.emplace(name, std::move(value));
-  return StoreNow(std::move(properties), false);
+  pending[name] = std::move(value);
+  return is_updating || Store(false);
 }
 
 bool Task::State::Store(bool is_finished) {
@@ -85,7 +63,8 @@ bool Task::State::Store(bool is_finished) {
 
 bool Task::State::StoreNow(std::map<std::string, Device::StoredValue> properties,
                            bool is_finished) {
-  if (const Json::Value news = NewsOfArchiver(); !news.empty()) {
+  // For who watches the task: the module keeps no names of files and no reasons.
+  if (const Json::Value& news = Device::TheArchiverNews(); !news.empty()) {
     properties[Device::kPropArchiver] = news;
   }
   bool is_stored = false;
@@ -191,7 +170,7 @@ void Task::remove() {
 
 void Task::sendNotifyMessageNoEncode(const char* app, const char* task_id, const char* title,
                                      const char* message, ...) {
-  Device::NotificationRow row{0, std::time(nullptr), app, task_id, title, message, {}};
+  Device::NotificationRow row{app, task_id, title, message, {}};
   va_list arguments;
   va_start(arguments, message);
   const auto found = kArgumentCounts.find(message);
