@@ -1,7 +1,6 @@
 #include "device/archiver/command_line.h"
 
 #include <algorithm>
-#include <cstring>
 
 #include "device/archiver/failure.h"
 
@@ -9,24 +8,13 @@ namespace Archiver {
 namespace {
 
 constexpr char kProgress[] = "-progress";
-constexpr char kPassword[] = "-p";
 constexpr char kAdd[] = "a";
 
 bool StartsWith(const std::string& text, const char* prefix) { return text.rfind(prefix, 0) == 0; }
 
 // "-progress" is the last argument; anywhere else it is the password "rogress".
 bool IsPassword(const std::string& argument, bool last) {
-  return StartsWith(argument, kPassword) && !(last && argument == kProgress);
-}
-
-bool IsActions(const std::string& text) {
-  for (size_t i = 0; i < text.size(); i += 2) {
-    if (std::strchr("pqrxyzw", text[i]) == nullptr || i + 1 == text.size() || text[i + 1] < '0' ||
-        text[i + 1] > '3') {
-      return false;
-    }
-  }
-  return !text.empty();
+  return StartsWith(argument, "-p") && !(last && argument == kProgress);
 }
 
 void ParseSwitch(const std::string& argument, bool last, Request* request) {
@@ -37,7 +25,8 @@ void ParseSwitch(const std::string& argument, bool last, Request* request) {
     request->code_page = argument.substr(5);
   } else if (StartsWith(argument, "-xr!") && argument.size() > 4) {
     request->exclude.push_back(argument.substr(4));
-  } else if (StartsWith(argument, "-u") && IsActions(argument.substr(2))) {
+  } else if (StartsWith(argument, "-u") && argument.size() > 2 &&
+             argument.find_first_not_of("pqrxyzw0123", 2) == std::string::npos) {
     request->actions = argument.substr(2);
   } else if (argument.size() == 4 && StartsWith(argument, "-mx") && argument[3] >= '0' &&
              argument[3] <= '9') {

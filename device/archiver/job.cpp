@@ -25,9 +25,8 @@ Device::WorkFolder MakeWorkFolder(const Target& target, const std::string& name)
 
 }  // namespace
 
-Job::Job(const Request& asked, const Device::ArchiverCall& call, const Cancel& stop, Report& lines)
+Job::Job(const Request& asked, const Device::ArchiverCall& call, Report& lines)
     : request(asked),
-      cancel(stop),
       report(lines),
       target(asked.archive, call.fixed_folders),
       work(MakeWorkFolder(target, call.work_folder)),

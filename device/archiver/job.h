@@ -2,7 +2,6 @@
 
 #include <string>
 
-#include "device/archiver/cancel.h"
 #include "device/archiver/command_line.h"
 #include "device/archiver/report.h"
 #include "device/archiver/target.h"
@@ -18,14 +17,13 @@ namespace Archiver {
 struct Job {
   // Opens the target and makes the work folder, and allows these. The references must outlive the
   // job. Throws Failure.
-  Job(const Request& asked, const Device::ArchiverCall& call, const Cancel& stop, Report& lines);
+  Job(const Request& asked, const Device::ArchiverCall& call, Report& lines);
 
   // The new archive and the old one, as the programs know them.
   std::string Result() const;
   std::string Old() const;
 
   const Request& request;
-  const Cancel& cancel;
   Report& report;
   const Target target;
   const Device::WorkFolder work;

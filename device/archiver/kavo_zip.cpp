@@ -5,7 +5,6 @@
 // archive is written anew only when there is something to change. A name that cannot be converted,
 // or whose converted form another entry bears, stays as it is.
 
-#include <unistd.h>
 #include <zip.h>
 
 #include <algorithm>

@@ -1,17 +1,15 @@
 #include "device/archiver/old_archive.h"
 
 #include <fcntl.h>
+#include <sys/sendfile.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <array>
 #include <cerrno>
 
 #include "device/archiver/failure.h"
 #include "device/archiver/program.h"
-#include "device/archiver/stock_7z.h"
 #include "device/archiver/zip_program.h"
-#include "device/base/file_io.h"
 #include "device/base/open_below.h"
 
 namespace Archiver {
@@ -29,17 +27,13 @@ Device::FileDescriptor Open(const std::string& path, int flags) {
 }
 
 void CopyOldArchive(const Job& job) {
-  const std::string& name = job.target.Path();
   const Device::FileDescriptor in = Open(job.Old(), O_RDONLY);
   const Device::FileDescriptor out = Open(job.Result(), O_WRONLY | O_CREAT | O_EXCL);
-  std::array<char, 65536> block{};
-  while (const ssize_t size = read(in.Get(), block.data(), block.size())) {
-    job.cancel.Check();
-    if (size < 0) {
-      throw SystemFailure("cannot read", name, errno);
-    }
-    if (!Device::WriteAll(out.Get(), {block.data(), static_cast<size_t>(size)})) {
-      throw SystemFailure("cannot write a copy of", name, errno);
+  constexpr size_t kAtOnce = 1 << 20;
+  while (const ssize_t sent = sendfile(out.Get(), in.Get(), nullptr, kAtOnce)) {
+    job.report.CheckCancelled();
+    if (sent < 0) {
+      throw SystemFailure("cannot write a copy of", job.target.Path(), errno);
     }
   }
 }
@@ -53,7 +47,7 @@ bool RunZip(const Job& job, const std::string& command, const std::string& archi
   start.input = password.Get();
   std::string reason;
   const int status = RunProgram(
-      start, job.cancel, [](const std::string& /*none*/) {},
+      start, job.report, [](const std::string& /*none*/) {},
       [&](const std::string& bytes) { reason += bytes; });
   if (!WIFEXITED(status) || (WEXITSTATUS(status) != kZipYes && WEXITSTATUS(status) != kZipNo)) {
     throw NamedFailure(kCannotUpdate, job.target.Path(),
@@ -70,7 +64,7 @@ std::string AskAboutOld7z(const Job& job, const char* command) {
   start.arguments = {kStock7z, command, "-t7z", "-slt", "-bsp0", job.Old()};
   start.input = password.Get();
   std::string output;
-  Run7z(start, {}, job.cancel, [&](const std::string& bytes) { output += bytes; });
+  Run7z(start, {}, job.report, [&](const std::string& bytes) { output += bytes; });
   return output;
 }
 

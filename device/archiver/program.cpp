@@ -1,17 +1,26 @@
 #include "device/archiver/program.h"
 
 #include <poll.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
 #include <array>
 #include <cerrno>
-#include <system_error>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <utility>
 
 #include "device/archiver/failure.h"
-#include "device/base/file_descriptor.h"
+#include "device/archiver/output_of_7z.h"
 
 namespace Archiver {
+
+const char* const kStock7z = KAVO_STOCK_7Z;
+
 namespace {
+
+constexpr int kWarned = 1;  // its exit status
 
 void ReadSome(Device::FileDescriptor& fd, const OutputReader& reader) {
   std::array<char, 65536> buffer{};
@@ -23,35 +32,44 @@ void ReadSome(Device::FileDescriptor& fd, const OutputReader& reader) {
   }
 }
 
-Device::ChildProcess StartOrFail(const Device::ProgramStart& start) {
-  try {
-    return Device::ChildProcess::Start(start);
-  } catch (const std::system_error& error) {
-    throw SystemFailure("cannot start", start.arguments.front(), error.code().value());
+// The caller's, with a locale under which 7z takes names for UTF-8 and speaks English. With the
+// zone that holds anyway, but named, the C library does not look at its file again for each time
+// of each source that 7z converts.
+std::vector<std::string> Environment() {
+  std::vector<std::string> result;
+  for (char** entry = environ; *entry != nullptr; ++entry) {
+    if (std::strncmp(*entry, "LC_", 3) != 0 && std::strncmp(*entry, "LANG", 4) != 0) {
+      result.emplace_back(*entry);
+    }
   }
+  result.emplace_back("LC_ALL=C.UTF-8");
+  if (std::getenv("TZ") == nullptr) {
+    result.emplace_back("TZ=:/etc/localtime");
+  }
+  return result;
 }
 
 }  // namespace
 
-int RunProgram(Device::ProgramStart start, const Cancel& cancel, const OutputReader& output_reader,
+int RunProgram(Device::ProgramStart start, const Report& report, const OutputReader& output_reader,
                const OutputReader& errors_reader) {
   Device::Pipe output;
   Device::Pipe errors;
   start.output = output.writer.Get();
   start.errors = errors.writer.Get();
   start.ends_with_caller = true;
-  Device::ChildProcess process = StartOrFail(start);
+  Device::ChildProcess process = Device::ChildProcess::Start(start);
   output.writer.Close();
   errors.writer.Close();
   while (output.reader || errors.reader) {
     pollfd watched[] = {{output.reader.Get(), POLLIN, 0},
                         {errors.reader.Get(), POLLIN, 0},
-                        {cancel.SignalFd(), POLLIN, 0},
-                        {cancel.ReportFd(), 0, 0}};
+                        {report.SignalFd(), POLLIN, 0},
+                        {report.Fd(), 0, 0}};
     if (poll(watched, 4, -1) < 0 && errno != EINTR) {
       throw SystemFailure("cannot read from", start.arguments.front(), errno);
     }
-    cancel.Check();
+    report.CheckCancelled();
     if (watched[0].revents != 0) {
       ReadSome(output.reader, output_reader);
     }
@@ -60,8 +78,30 @@ int RunProgram(Device::ProgramStart start, const Cancel& cancel, const OutputRea
     }
   }
   const int status = process.Wait();
-  cancel.Check();  // the whole group gets the signal, and the program may have been the first to go
+  report.CheckCancelled();  // the whole group gets the signal, and the program may have been the
+                            // first to go
   return status;
+}
+
+void Run7z(Device::ProgramStart start, const std::set<std::string>& left_out, const Report& report,
+           const OutputReader& reader) {
+  start.environment = Environment();
+  ErrorText text(left_out);
+  const int status = RunProgram(std::move(start), report, reader, [&](const std::string& bytes) {
+    text.Feed(bytes);
+    if (text.HasWarning()) {
+      throw Failure("not everything can be packed: " + text.Line());
+    }
+  });
+  if (WIFEXITED(status) && WEXITSTATUS(status) <= (text.HasPassedOver() ? kWarned : 0) &&
+      text.Empty()) {
+    return;
+  }
+  const std::string end =
+      WIFSIGNALED(status) ? "7z was killed by signal " + std::to_string(WTERMSIG(status)) +
+                                (WTERMSIG(status) == SIGKILL ? ", maybe for want of memory" : "")
+                          : "7z failed with status " + std::to_string(WEXITSTATUS(status));
+  throw Failure(text.Empty() ? end : end + ": " + text.Line());
 }
 
 }  // namespace Archiver

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <set>
 #include <string>
 #include <vector>
@@ -24,6 +25,13 @@ struct PackRun {
 
 // The argument vector of `run`, without the program's name.
 std::vector<std::string> SwitchesFor7z(const Request& request, const PackRun& run);
+
+// The switches with which a 7z archive of that level ("-mx6", or empty for 7z's own) takes so many
+// bytes of memory at most; none when the level takes no more as it is, and for a level that does
+// not compress. Fewer threads go before a smaller dictionary. Where the least is too much, the
+// least.
+std::vector<std::string> SwitchesWithin(std::uint64_t memory, const std::string& level,
+                                        unsigned int processors);
 
 // Whether the request leaves out `path`: some part of it bears an excluded name.
 bool IsExcluded(const Request& request, const std::string& path);
