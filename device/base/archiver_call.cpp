@@ -6,6 +6,7 @@
 #include <utility>
 
 #include "device/base/file_io.h"
+#include "device/base/for_each_part.h"
 #include "device/base/socket_message.h"
 
 namespace Device {
@@ -36,13 +37,9 @@ bool SendArchiverCall(int socket, const ArchiverCall& call) {
 }
 
 std::optional<ArchiverCall> ReceiveArchiverCall(int socket) {
-  const std::optional<std::string> frame = ReadFrame(socket);
+  const std::string frame = ReadFrame(socket).value_or("");
   std::vector<std::string> texts;
-  std::size_t begin = 0;
-  for (std::size_t end = 0; frame && (end = frame->find('\0', begin)) != std::string::npos;
-       begin = end + 1) {
-    texts.push_back(frame->substr(begin, end - begin));
-  }
+  ForEachPart(frame, {"\0", 1}, [&](std::string_view text) { texts.emplace_back(text); });
   constexpr std::size_t kHead = 4;  // before the folders
   if (texts.size() < kHead) {
     return std::nullopt;

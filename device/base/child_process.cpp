@@ -18,23 +18,6 @@ namespace {
 
 constexpr int kCannotStart = 127;
 
-// Holds every signal back, so that no handler of the caller's runs in a child that is to become
-// another program.
-class SignalsHeldBack {
- public:
-  SignalsHeldBack() {
-    sigset_t all;
-    sigfillset(&all);
-    sigprocmask(SIG_SETMASK, &all, &saved_);
-  }
-  ~SignalsHeldBack() { sigprocmask(SIG_SETMASK, &saved_, nullptr); }
-  SignalsHeldBack(const SignalsHeldBack&) = delete;
-  SignalsHeldBack& operator=(const SignalsHeldBack&) = delete;
-
- private:
-  sigset_t saved_{};
-};
-
 std::vector<char*> Pointers(const std::vector<std::string>& texts) {
   std::vector<char*> pointers;
   pointers.reserve(texts.size() + 1);
@@ -82,9 +65,14 @@ void Execute(const ProgramStart& start, int null, char* const* arguments, char* 
 }
 
 // The child shares the caller's memory until the program runs: a copy would cost more than a small
-// job. Why it does not run, it tells `failure`.
+// job. Every signal is held back, so that no handler of the caller's runs there. Why the program
+// does not run, the child tells `failure`.
 pid_t Spawn(const ProgramStart& start, int null, char* const* arguments, char* const* environment,
             int failure) {
+  sigset_t all;
+  sigset_t saved;
+  sigfillset(&all);
+  sigprocmask(SIG_SETMASK, &all, &saved);
   const pid_t parent = getpid();
   const pid_t pid = vfork();
   if (pid == 0) {
@@ -93,6 +81,7 @@ pid_t Spawn(const ProgramStart& start, int null, char* const* arguments, char* c
     [[maybe_unused]] const ssize_t told = write(failure, &error, sizeof error);
     _exit(kCannotStart);
   }
+  sigprocmask(SIG_SETMASK, &saved, nullptr);
   return pid;
 }
 
@@ -103,20 +92,17 @@ ChildProcess ChildProcess::Start(const ProgramStart& start) {
   const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   const std::vector<char*> arguments = Pointers(start.arguments);
   const std::vector<char*> variables = Pointers(start.environment);
-  ChildProcess child(0);
-  {
-    const SignalsHeldBack held_back;
-    child.pid_ =
-        Spawn(start, null.Get(), arguments.data(),
-              start.environment.empty() ? environ : variables.data(), failure.writer.Get());
-  }
+  ChildProcess child(Spawn(start, null.Get(), arguments.data(),
+                           start.environment.empty() ? environ : variables.data(),
+                           failure.writer.Get()));
   if (child.pid_ < 0) {
     ThrowErrno("vfork");
   }
   failure.writer.Close();
   int error = 0;
   if (read(failure.reader.Get(), &error, sizeof error) == sizeof error) {
-    throw std::system_error(error, std::generic_category(), start.program);
+    errno = error;
+    ThrowErrno("cannot start '" + start.program + "'");
   }
   return child;
 }

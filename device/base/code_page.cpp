@@ -47,36 +47,29 @@ std::optional<std::string> Convert(iconv_t converter, std::string text) {
 }  // namespace
 
 CodePage::CodePage(const std::string& name)
-    : encoder_(iconv_open(IconvName(name).c_str(), kUtf8)),
-      decoder_(iconv_open(kUtf8, IconvName(name).c_str())) {}
+    : encoder_(iconv_open(IconvName(name).c_str(), kUtf8), iconv_close),
+      decoder_(iconv_open(kUtf8, IconvName(name).c_str()), iconv_close) {}
 
 std::unique_ptr<CodePage> CodePage::Open(const std::string& name) {
   const std::string path = "/ABCXYZabcxyz0189.-_+@";
   std::unique_ptr<CodePage> page(new CodePage(name));
-  const bool is_known = page->encoder_ != Unopened() && page->decoder_ != Unopened();
+  const bool is_known = page->encoder_.get() != Unopened() && page->decoder_.get() != Unopened();
   return is_known && page->Encode(path) == path ? std::move(page) : nullptr;
 }
 
-CodePage::~CodePage() {
-  for (iconv_t converter : {encoder_, decoder_}) {
-    if (converter != Unopened()) {
-      iconv_close(converter);
-    }
-  }
-}
-
 std::optional<std::string> CodePage::Encode(const std::string& utf8) const {
-  std::optional<std::string> bytes = Convert(encoder_, utf8);
+  std::optional<std::string> bytes = Convert(encoder_.get(), utf8);
   // Some code pages have characters with a byte that would part the name where it has no part.
   const auto parts = [](const std::string& name) {
     return std::count(name.begin(), name.end(), '/') + std::count(name.begin(), name.end(), '\0');
   };
-  const bool is_held = bytes && Convert(decoder_, *bytes) == utf8 && parts(*bytes) == parts(utf8);
+  const bool is_held =
+      bytes && Convert(decoder_.get(), *bytes) == utf8 && parts(*bytes) == parts(utf8);
   return is_held ? bytes : std::nullopt;
 }
 
 std::optional<std::string> CodePage::Decode(const std::string& bytes) const {
-  return Convert(decoder_, bytes);
+  return Convert(decoder_.get(), bytes);
 }
 
 bool CodePage::IsUtf8(const std::string& name) {

@@ -15,9 +15,6 @@ class CodePage {
  public:
   // Null for a name that is unknown or cannot serve in file names.
   static std::unique_ptr<CodePage> Open(const std::string& name);
-  ~CodePage();
-  CodePage(const CodePage&) = delete;
-  CodePage& operator=(const CodePage&) = delete;
 
   // Nothing when `utf8` cannot go to the code page and come back unchanged.
   std::optional<std::string> Encode(const std::string& utf8) const;
@@ -29,8 +26,9 @@ class CodePage {
  private:
   explicit CodePage(const std::string& name);
 
-  iconv_t encoder_;
-  iconv_t decoder_;
+  using Converter = std::unique_ptr<void, int (*)(iconv_t)>;
+  Converter encoder_;
+  Converter decoder_;
 };
 
 }  // namespace Device

@@ -7,7 +7,9 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdint>
+#include <iterator>
 
 namespace Device {
 
@@ -15,13 +17,9 @@ namespace {
 
 // Newer than the distribution's header: by the version of Landlock that knows them first.
 constexpr std::uint64_t kTruncate = 1ULL << 14U;         // 3
-constexpr std::uint64_t kDeviceControl = 1ULL << 15U;    // 5
 constexpr std::uint64_t kBindAndConnectTcp = 3;          // 4
 constexpr std::uint64_t kAbstractSocketsAndSignals = 3;  // 6
-constexpr int kVersionOfRefer = 2;
-constexpr int kVersionOfTruncate = 3;
 constexpr int kVersionOfNetwork = 4;
-constexpr int kVersionOfDeviceControl = 5;
 constexpr int kVersionOfScopes = 6;
 
 struct Handled {
@@ -55,12 +53,10 @@ int Version() {
   return version < 0 ? 0 : static_cast<int>(version);
 }
 
+// All rights that the version knows: of the first version 13, and so on.
 std::uint64_t HandledFiles() {
-  std::uint64_t rights = LANDLOCK_ACCESS_FS_REFER - 1;  // all of the first version
-  rights |= Version() >= kVersionOfRefer ? LANDLOCK_ACCESS_FS_REFER : 0;
-  rights |= Version() >= kVersionOfTruncate ? kTruncate : 0;
-  rights |= Version() >= kVersionOfDeviceControl ? kDeviceControl : 0;
-  return rights;
+  constexpr unsigned int kRights[] = {0, 13, 14, 15, 15, 16};
+  return (1ULL << kRights[std::min<std::size_t>(Version(), std::size(kRights) - 1)]) - 1;
 }
 
 }  // namespace

@@ -28,8 +28,6 @@ class WorkFolder {
   // Makes it in the open folder `parent`. Throws std::system_error.
   WorkFolder(const FileDescriptor& parent, const std::string& name);
   ~WorkFolder();
-  WorkFolder(const WorkFolder&) = delete;
-  WorkFolder& operator=(const WorkFolder&) = delete;
 
   int Get() const { return folder_.Get(); }
 

@@ -60,10 +60,10 @@ std::string ReadPassword(const std::string& file, bool is_for_zip) {
 Json::Value StartParams(const Target& target, const CompressOptions& options) {
   const std::string& archive = options.paths.back();
   const ResolvedPath resolved = Resolve(target.user, archive);
-  if (resolved.error == 0 && resolved.user_path == "/" + resolved.share_name) {
+  if (resolved.error == 0 && resolved.share_path == "/" + resolved.share_name) {
     throw std::runtime_error("'" + archive +
                              "' is a shared folder: name an archive in it, such as '" +
-                             resolved.user_path + "/" + resolved.share_name + ".zip'");
+                             resolved.share_path + "/" + resolved.share_name + ".zip'");
   }
   // Paths as the text of a JSON array, so that a name may hold a comma.
   Json::Value params =

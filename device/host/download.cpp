@@ -41,7 +41,7 @@ void HandOverFile(int stream, const std::string& user, const std::string& path) 
   const ResolvedPath resolved = ResolveForUser(user, path);
   struct stat status {};
   const FileDescriptor file = OpenFileOf(user, resolved, status);
-  const std::string name = resolved.user_path.substr(resolved.user_path.rfind('/') + 1);
+  const std::string name = resolved.share_path.substr(resolved.share_path.rfind('/') + 1);
   std::ostringstream validator;  // changes with the content
   validator << '"' << status.st_ino << '-' << status.st_size << '-' << status.st_ctim.tv_sec << '-'
             << status.st_ctim.tv_nsec << '"';

@@ -89,7 +89,7 @@ std::string ListFolder(const std::string& user, const std::string& path) {
       AddEntry(entries, name, status);
     }
   }
-  return Body(folder.user_path, IsWritable(folder, fd), entries);
+  return Body(folder.share_path, IsWritable(folder, fd), entries);
 }
 
 }  // namespace Device

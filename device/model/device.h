@@ -56,6 +56,10 @@ OpenDevice& Open(const std::string& folder);
 // The device that is open.
 OpenDevice& TheDevice();
 
+// Bytes that this process and its children may have: what is installed or, if that is less, the
+// limit of a control group that it is in, or of its address space.
+std::uint64_t InstalledMemory();
+
 // Makes a device in a folder that is not there yet, or empty, from the text of a device.json.
 // Throws std::runtime_error.
 void Make(const std::string& folder, const std::string& config_text);

@@ -1,4 +1,4 @@
-#include "device/model/memory.h"
+// How much memory the machine has.
 
 #include <sys/resource.h>
 #include <sys/sysinfo.h>
@@ -7,6 +7,8 @@
 #include <filesystem>
 #include <fstream>
 #include <string>
+
+#include "device/model/device.h"
 
 namespace Device {
 

@@ -8,13 +8,11 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdio>
 #include <limits>
 #include <tuple>
 
 #include "device/base/file_descriptor.h"
 #include "device/model/device.h"
-#include "device/model/memory.h"
 #include "device/tasks/workers.h"
 
 namespace Device {
@@ -49,22 +47,14 @@ struct flock64 Range(short type, off64_t first, off64_t length) {
   return range;
 }
 
-// False when another process has the byte.
-bool TrySetLock(short type, off64_t place) {
+// False when another process has the byte, unless the command, F_SETLKW64, waits for it.
+bool SetLock(int command, short type, off64_t place) {
   struct flock64 range = Range(type, place, 1);
-  const bool is_set = fcntl(TheDevice().queue.Get(), F_SETLK64, &range) == 0;
+  const bool is_set = TEMP_FAILURE_RETRY(fcntl(TheDevice().queue.Get(), command, &range)) == 0;
   if (!is_set && errno != EACCES && errno != EAGAIN) {
     ThrowErrno("queue of jobs");
   }
   return is_set;
-}
-
-// Waits for the lock when the command is F_SETLKW64.
-void SetLock(int command, short type, off64_t place) {
-  struct flock64 range = Range(type, place, 1);
-  if (TEMP_FAILURE_RETRY(fcntl(TheDevice().queue.Get(), command, &range)) != 0) {
-    ThrowErrno("queue of jobs");
-  }
 }
 
 // A user can stop a worker of the user's own by SIGSTOP while it holds the byte. So nobody waits
@@ -74,11 +64,11 @@ class Change {
   Change() {
     constexpr int kTries = 250;
     constexpr int kPauseMs = 2;
-    for (int tries = 0; tries < kTries && !TrySetLock(F_WRLCK, kChange); ++tries) {
+    for (int tries = 0; tries < kTries && !SetLock(F_SETLK64, F_WRLCK, kChange); ++tries) {
       poll(nullptr, 0, kPauseMs);
     }
   }
-  ~Change() { TrySetLock(F_UNLCK, kChange); }
+  ~Change() { SetLock(F_SETLK64, F_UNLCK, kChange); }
   Change(const Change&) = delete;
   Change& operator=(const Change&) = delete;
 };
@@ -235,7 +225,7 @@ void EnterQueue(uid_t user) {
     ticket = std::max(ticket, job.ticket);
   }
   own_job = {getpid(), user, ticket + 1, false};
-  while (!TrySetLock(F_WRLCK, PlaceOf(own_job))) {
+  while (!SetLock(F_SETLK64, F_WRLCK, PlaceOf(own_job))) {
     ++own_job.ticket;
   }
 }

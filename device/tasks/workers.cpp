@@ -136,8 +136,7 @@ bool EndWorker(const std::string& user, pid_t pid) {
   // after, so that no other can slip in between.
   const FileDescriptor process(static_cast<int>(syscall(SYS_pidfd_open, pid, 0)));
   // Where there are no such descriptors, under emulators, the id itself must do.
-  const bool has_descriptor = static_cast<bool>(process);
-  const int error = has_descriptor ? 0 : errno;
+  const int error = process ? 0 : errno;
   if (error != 0 && error != ESRCH && error != ENOSYS) {
     return false;
   }
@@ -147,13 +146,11 @@ bool EndWorker(const std::string& user, pid_t pid) {
   // A store without room keeps no job from being stopped.
   TryOrLog("stop", [&] { StoreOf(user).NoteStop(pid); });
   const Clock::time_point deadline = Clock::now() + kGrace;
-  const bool is_told = has_descriptor
-                           ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0) == 0
-                           : kill(pid, SIGTERM) == 0;
-  if (!is_told) {
+  if ((process ? syscall(SYS_pidfd_send_signal, process.Get(), SIGTERM, nullptr, 0)
+               : kill(pid, SIGTERM)) != 0) {
     return errno == ESRCH;  // it has ended in this moment
   }
-  if (has_descriptor) {
+  if (process) {
     WaitForProcess(process, deadline);
   }
   if (WaitForGroup(pid, deadline)) {

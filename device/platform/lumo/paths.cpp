@@ -16,7 +16,6 @@
 #include "device/platform/lumo/errors.h"
 #include "device/platform/lumo/identity.h"
 #include "device/platform/operations.h"
-#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
@@ -132,17 +131,19 @@ ResolvedPath Resolve(const std::string& user, const std::string& path) {
   } else {
     resolved.share_name = parts.front();
     resolved.error = FindShareFolder(user, resolved) ? 0 : KAVO::kErrNotFound;
-    resolved.user_path = "/" + resolved.share_name;
+    resolved.share_path = "/" + resolved.share_name;
     resolved.real_path = resolved.share_real_path;
-    resolved.user_path.reserve(path.size());
+    resolved.share_path.reserve(path.size());
     resolved.real_path.reserve(resolved.real_path.size() + path.size());
     for (std::size_t part = 1; part < parts.size(); ++part) {
-      resolved.user_path.append("/").append(parts[part]);
+      resolved.share_path.append("/").append(parts[part]);
       resolved.real_path.append("/").append(parts[part]);
     }
     if (resolved.error == 0 && resolved.real_path.size() >= PATH_MAX) {
       resolved.error = KAVO::kErrNameTooLong;
     }
+    resolved.aux_1 = resolved.share_path.substr(1 + resolved.share_name.size());
+    resolved.aux_6 = user;
   }
   return resolved;
 }
@@ -175,13 +176,7 @@ int PathInfoFactory::create(const char* user, const std::string& path, PathInfo&
       Device::SetLastError(resolved.error);
       return 0;
     }
-    out.aux_1 = resolved.user_path.substr(1 + resolved.share_name.size());
-    out.share_path = std::move(resolved.user_path);
-    out.real_path = std::move(resolved.real_path);
-    out.share_name = std::move(resolved.share_name);
-    out.volume_path = std::move(resolved.volume_path);
-    out.share_real_path = std::move(resolved.share_real_path);
-    out.aux_6 = user;
+    out = std::move(resolved);
     return 1;
   });
 }

@@ -4,16 +4,13 @@
 #include <string>
 
 #include "device/model/device.h"
+#include "platform/lumo/file_manager.h"
 
 namespace Device {
 
-struct ResolvedPath {
-  int error = 0;          // a KAVO::ErrorCode; the rest counts when it is 0
-  std::string user_path;  // without ".", ".." and doubled slashes
-  std::string real_path;  // full path
-  std::string share_name;
-  std::string share_real_path;
-  std::string volume_path;
+// Its user path is without ".", ".." and doubled slashes.
+struct ResolvedPath : PathInfo {
+  int error = 0;                 // a KAVO::ErrorCode; the rest counts when it is 0
   const Share* share = nullptr;  // null for a home
 };
 
