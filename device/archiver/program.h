@@ -22,9 +22,9 @@ using OutputReader = std::function<void(const std::string& bytes)>;
 int RunProgram(Device::ProgramStart start, const Report& report, const OutputReader& output_reader,
                const OutputReader& errors_reader);
 
-// Runs 7z as above and passes on what it prints; the environment and the streams but for the input
-// are its own affair. About the names left out it may warn and do without them. Throws Failure when
-// it did not pack everything it was asked to, as soon as that is known.
+// Runs 7z as above and passes on what it prints; locale, time zone and the streams but for the
+// input are its own affair. About the names left out it may warn and do without them. Throws
+// Failure when it did not pack everything it was asked to, as soon as that is known.
 void Run7z(Device::ProgramStart start, const std::set<std::string>& left_out, const Report& report,
            const OutputReader& reader);
 

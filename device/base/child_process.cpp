@@ -28,6 +28,19 @@ std::vector<char*> Pointers(const std::vector<std::string>& texts) {
   return pointers;
 }
 
+// A user can read the environment of the user's own programs, and root's may hold secrets.
+std::vector<std::string> EnvironmentOf(const ProgramStart& start) {
+  std::vector<std::string> variables = start.environment;
+  for (char** entry = environ; *entry != nullptr; ++entry) {
+    const std::string variable = *entry;
+    if (variable.rfind("PATH=", 0) == 0 || variable.rfind("TZ=", 0) == 0 ||
+        variable.rfind("KAVO_", 0) == 0) {
+      variables.push_back(variable);
+    }
+  }
+  return variables;
+}
+
 void ResetSignals() {
   for (int number = 1; number < NSIG; ++number) {
     signal(number, SIG_DFL);
@@ -57,6 +70,7 @@ void Execute(const ProgramStart& start, int null, char* const* arguments, char* 
       Redirect(start.output, STDOUT_FILENO) &&
       Redirect(start.errors < 0 ? null : start.errors, STDERR_FILENO) &&
       (start.fence == nullptr || start.fence->Enter())) {
+    close_range(STDERR_FILENO + 1, ~0U, CLOSE_RANGE_CLOEXEC);  // what was there at our own start
     for (const int fd : start.kept) {
       fcntl(fd, F_SETFD, 0);
     }
@@ -91,10 +105,10 @@ ChildProcess ChildProcess::Start(const ProgramStart& start) {
   Pipe failure;  // gets the error number, or just closes when the program runs
   const FileDescriptor null(open("/dev/null", O_RDWR | O_CLOEXEC));
   const std::vector<char*> arguments = Pointers(start.arguments);
-  const std::vector<char*> variables = Pointers(start.environment);
-  ChildProcess child(Spawn(start, null.Get(), arguments.data(),
-                           start.environment.empty() ? environ : variables.data(),
-                           failure.writer.Get()));
+  const std::vector<std::string> environment = EnvironmentOf(start);
+  const std::vector<char*> variables = Pointers(environment);
+  ChildProcess child(
+      Spawn(start, null.Get(), arguments.data(), variables.data(), failure.writer.Get()));
   if (child.pid_ < 0) {
     ThrowErrno("vfork");
   }

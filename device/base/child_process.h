@@ -17,7 +17,7 @@ namespace Device {
 struct ProgramStart {
   std::string program;                   // path
   std::vector<std::string> arguments;    // with the program's name in front
-  std::vector<std::string> environment;  // "NAME=VALUE"; empty: the caller's
+  std::vector<std::string> environment;  // "NAME=VALUE", beside the caller's PATH, TZ and KAVO_...
   int folder = -1;                       // working directory; -1: the caller's
   int input = -1;                        // standard input; -1: /dev/null
   int output = -1;                       // standard output; -1: the caller's

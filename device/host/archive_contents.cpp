@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <array>
 #include <cstdint>
-#include <cstdlib>
 #include <ctime>
 #include <memory>
 #include <optional>
@@ -149,14 +148,12 @@ std::string ListArchive(const std::string& user, const std::string& path,
   fence.AllowReading(file.Get());
   Pipe output;
   Pipe errors;
-  const char* const zone = std::getenv("TZ");
   ProgramStart start;
   start.program = KAVO_STOCK_7Z;
   // With a password that is none: it would ask for one.
   start.arguments = {KAVO_STOCK_7Z, "l",  "-slt",        "-ba",
                      "-bsp0",       "-p", "-t" + format, PathOf(file.Get())};
-  start.environment = {"LC_ALL=C.UTF-8",
-                       std::string("TZ=") + (zone == nullptr ? ":/etc/localtime" : zone)};
+  start.environment = {"LC_ALL=C.UTF-8"};
   start.output = output.writer.Get();
   start.errors = errors.writer.Get();
   start.kept = {file.Get()};
