@@ -48,7 +48,7 @@ TEST(JobQueueTest, NextIsWhoseUserHasTheFewestAtWork) {
       {"AABab", "43", ""},
       {"AaabC", "312", "3"},
       {"aabbcc", "024135", "024"},
-      {"AAAab", "43", ""},  // after the setting was lowered
+      {"AAAab", "43", "4"},  // a job was stopped by a signal meanwhile, or the setting was lowered
   };
   for (const auto& row : rows) {
     std::vector<QueuedJob> order;
