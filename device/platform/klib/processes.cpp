@@ -155,6 +155,8 @@ int CloseProgram(FILE* stream) {
 // A session and a process group of its own, and nothing of the request's. Returns when it is the
 // worker's turn.
 void BecomeWorker(uid_t user, Pipe& entered) {
+  // A signal's handler ends it in the midst of anything: what it holds then is not waited for.
+  on_exit([](int status, void* /*none*/) { _exit(status); }, nullptr);
   setsid();                       // and no terminal: the user can make the archiver do anything
   std::signal(SIGTERM, SIG_DFL);  // the host may have a handler, which ends nothing
   EnterQueue(user);
