@@ -188,10 +188,16 @@ std::multimap<std::size_t, QueuedJob> WaitingInOrder(std::vector<QueuedJob> jobs
 
 std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t of_user,
                                  std::size_t of_device) {
-  const auto waiting = WaitingInOrder(jobs);
-  std::size_t at_work = jobs.size() - waiting.size();
+  // A user who stops jobs and lets them go on has more of them at work, and no more places.
+  std::map<uid_t, std::size_t> running;
+  std::size_t at_work = 0;
+  for (const QueuedJob& job : jobs) {
+    if (job.is_running && ++running[job.user] <= of_user) {
+      ++at_work;
+    }
+  }
   std::vector<QueuedJob> next;
-  for (const auto& [rank, job] : waiting) {
+  for (const auto& [rank, job] : WaitingInOrder(jobs)) {
     if (rank < of_user && at_work < of_device) {
       next.push_back(job);
       ++at_work;
@@ -212,10 +218,14 @@ std::uint64_t MemoryOfJob() {
 }
 
 bool MayEnterQueue(uid_t user) {
-  constexpr int kMostOfUser = 256;  // each is a process
+  constexpr std::size_t kMostOfUser = 256;  // each is a process
+  constexpr std::size_t kMostBytes = std::size_t{128} << 20U;
+  const struct mallinfo2 heap = mallinfo2();
+  const std::size_t own_bytes = heap.uordblks + heap.hblkhd;  // the worker keeps its request's
   const std::vector<QueuedJob> jobs = JobsOfOthers();
-  return std::count_if(jobs.begin(), jobs.end(),
-                       [&](const QueuedJob& job) { return job.user == user; }) < kMostOfUser;
+  const auto of_user = static_cast<std::size_t>(
+      std::count_if(jobs.begin(), jobs.end(), [&](const auto& job) { return job.user == user; }));
+  return of_user < std::min(kMostOfUser, kMostBytes / own_bytes);
 }
 
 void EnterQueue(uid_t user) {

@@ -40,7 +40,8 @@ std::vector<QueuedJob> NextToRun(const std::vector<QueuedJob>& jobs, std::size_t
 std::size_t MostJobs();
 std::uint64_t MemoryOfJob();
 
-// False when so many of the user's jobs wait or run that no further one may come.
+// False when so many of the user's jobs wait or run that no further one may come: 256, fewer before
+// one whose request takes more than half a MiB of memory, such as 20 before one of 6 MiB.
 bool MayEnterQueue(uid_t user);
 
 // To be called in this order, once in a worker's process: takes a place behind all others, and
