@@ -73,11 +73,11 @@ void Database::MakeSchema(const char* schema, int version) {
   constexpr char kVersion[] = "PRAGMA user_version";
   Execute(
       "PRAGMA synchronous = NORMAL; PRAGMA wal_autocheckpoint = 200;"
-      "PRAGMA temp_store = MEMORY");
+      "PRAGMA temp_store = MEMORY; PRAGMA journal_size_limit = 1048576");
   if (Number(kVersion) == version) {
     return;
   }
-  Execute("PRAGMA journal_mode = WAL");
+  Execute("PRAGMA auto_vacuum = FULL; PRAGMA journal_mode = WAL");
   InTransaction(true, [&] {
     if (Number(kVersion) == version) {
       return;  // another process was faster
