@@ -106,13 +106,14 @@ bool IsPassword(const std::string& user, const std::string& password) {
   return has_password && is_whole && result != nullptr && hash == result;
 }
 
-std::size_t SignInGate::CountOf(const std::string& user) {
+std::size_t SignInGate::CountOf(const std::string& user, const std::string& client) {
   constexpr std::size_t kCounts = std::size_t{1} << 16U;
-  return std::hash<std::string>()(user) % kCounts;
+  return std::hash<std::string>()(client + ' ' + user) % kCounts;
 }
 
-std::chrono::seconds SignInGate::Try(const std::string& user, Clock::time_point now) {
-  Tries& tries = tries_[CountOf(user)];
+std::chrono::seconds SignInGate::Try(const std::string& user, const std::string& client,
+                                     Clock::time_point now) {
+  Tries& tries = tries_[CountOf(user, client)];
   if (now < tries.open_again) {
     return std::chrono::ceil<std::chrono::seconds>(tries.open_again - now);
   }

@@ -28,22 +28,26 @@ std::string UserOfSession(const std::string& session_id);
 bool IsPassword(const std::string& user, const std::string& password);
 
 // Slows down who tries passwords: after ten wrong ones in a row the sign-in under that name is open
-// again only after a while, which doubles each time. It does not know which names there are: names
-// share so many counts, each by its hash, that made-up ones take no room.
+// to that client again only after a while, which doubles each time; others, the user among them, do
+// not notice. It does not know which names there are: names share so many counts, each by its hash,
+// that made-up ones take no room.
 class SignInGate {
  public:
   using Clock = std::chrono::steady_clock;
 
   // To be called before a password is looked at: 0, or how long to wait before the next try.
-  std::chrono::seconds Try(const std::string& user, Clock::time_point now);
-  void Succeeded(const std::string& user) { tries_.erase(CountOf(user)); }
+  std::chrono::seconds Try(const std::string& user, const std::string& client,
+                           Clock::time_point now);
+  void Succeeded(const std::string& user, const std::string& client) {
+    tries_.erase(CountOf(user, client));
+  }
 
  private:
   struct Tries {
     int count = 0;
     Clock::time_point open_again;
   };
-  static std::size_t CountOf(const std::string& user);
+  static std::size_t CountOf(const std::string& user, const std::string& client);
 
   std::map<std::size_t, Tries> tries_;
 };

@@ -227,18 +227,18 @@ void WebHost::Enqueue(const Asker& asker, FileDescriptor stream,
 }
 
 void WebHost::TakeSignIn(const Json::Value& asked, FileDescriptor stream) {
-  const std::chrono::seconds wait = gate_.Try(asked["user"].asString(), SignInGate::Clock::now());
-  if (wait.count() > 0) {
-    SendAnswer(stream.Get(),
-               Refusal(kHttpTooMany, "too many wrong passwords", std::to_string(wait.count())));
-    return;
-  }
   // Looking at a password takes its time, which is not the launcher's.
   Enqueue({AddressOf(asked), "", false}, std::move(stream), [this, asked](FileDescriptor& taken) {
     const std::string user = asked["user"].asString();
+    const std::chrono::seconds wait = gate_.Try(user, AddressOf(asked), SignInGate::Clock::now());
+    if (wait.count() > 0) {
+      SendAnswer(taken.Get(),
+                 Refusal(kHttpTooMany, "too many wrong passwords", std::to_string(wait.count())));
+      return -1;
+    }
     const pid_t pid = Fork([&] { return IsPassword(user, asked["password"].asString()) ? 0 : 1; });
     if (pid > 0) {
-      checks_.emplace(pid, SignInCheck{user, std::move(taken)});
+      checks_.emplace(pid, SignInCheck{user, AddressOf(asked), std::move(taken)});
     }
     return pid;
   });
@@ -256,7 +256,7 @@ void WebHost::FinishSignIn(const SignInCheck& check, bool is_password) {
     SendAnswer(check.stream.Get(), Refusal(kHttpUnauthorized, "wrong user name or password"));
     return;
   }
-  gate_.Succeeded(check.user);
+  gate_.Succeeded(check.user, check.client);
   try {
     Answer answer(kHttpOk, SessionBody(check.user));
     answer.headers = {SessionCookie(SignIn(check.user))};

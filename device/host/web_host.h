@@ -47,6 +47,7 @@ class WebHost {
  private:
   struct SignInCheck {
     std::string user;
+    std::string client;
     FileDescriptor stream;
   };
 

@@ -102,6 +102,7 @@ void Connection::BeginReading(const std::string& counted_for, std::chrono::secon
   deadline_ = Clock::now() + time;
   Connections& all = All();
   const std::lock_guard<std::mutex> lock(all.mutex);
+  all.reading.remove_if([this](const auto& each) { return each.connection == this; });
   const auto is_theirs = [&](const auto& each) {
     return !counted_for.empty() && each.counted_for == counted_for;
   };
@@ -115,6 +116,7 @@ void Connection::BeginReading(const std::string& counted_for, std::chrono::secon
 
 void Connection::BeginBody(bool is_users) {
   NotePart();
+  is_head_ = false;
   BeginReading(is_users ? "" : client_, kBodyTime);
 }
 
@@ -138,8 +140,23 @@ bool Connection::is_writable() const {
   return WaitFor(POLLOUT) && poll(&client, 1, 0) == 0;  // it is still there
 }
 
+ssize_t Connection::ReadOfHead(char* to) {
+  if (encoded_.empty() && (allowed_ == 0 || head_lines_ == kMostHeadLines)) {
+    return 0;
+  }
+  if (encoded_.empty()) {
+    encoded_ = buffer_[begin_++];
+    --allowed_;
+    head_lines_ += encoded_ == "\n" ? 1 : 0;
+    encoded_ += encoded_ == "%" && head_lines_ > 0 ? "25" : "";
+  }
+  *to = encoded_.front();
+  encoded_.erase(0, 1);
+  return 1;
+}
+
 ssize_t Connection::read(char* to, std::size_t size) {
-  if (begin_ == end_) {
+  if (begin_ == end_ && encoded_.empty()) {
     const ssize_t got =
         WaitFor(POLLIN) ? TEMP_FAILURE_RETRY(recv(socket_, buffer_.data(), buffer_.size(), 0)) : -1;
     if (got <= 0) {
@@ -147,6 +164,9 @@ ssize_t Connection::read(char* to, std::size_t size) {
     }
     begin_ = 0;
     end_ = static_cast<std::size_t>(got);
+  }
+  if (is_head_) {
+    return ReadOfHead(to);
   }
   const std::size_t taken = std::min({size, end_ - begin_, allowed_});
   std::memcpy(to, buffer_.data() + begin_, taken);

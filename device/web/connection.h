@@ -30,7 +30,7 @@ class Connection : public httplib::Stream {
   // a session, or there is no thread for a new one.
   void BeginBody(bool is_users);
   // A part of the body has come. Without that only so much is read as a head may have: the library
-  // keeps a line of any length, and any number of them.
+  // keeps a line of any length.
   void NotePart() { allowed_ = kMostHeadBytes; }
   // Nothing more is read, and the connection is not to be closed for another's sake.
   void EndReading();
@@ -38,7 +38,7 @@ class Connection : public httplib::Stream {
   void AllowForWriting(std::chrono::seconds time) { deadline_ = Clock::now() + time; }
   bool IsLate() const { return Clock::now() >= deadline_; }
 
-  bool is_readable() const override;
+  bool is_readable() const override;  // a part of the body
   bool is_writable() const override;
   ssize_t read(char* to, std::size_t size) override;
   using Stream::write;
@@ -49,9 +49,13 @@ class Connection : public httplib::Stream {
 
  private:
   using Clock = std::chrono::steady_clock;
-  static constexpr std::size_t kMostHeadBytes = std::size_t{64} << 10U;
+  static constexpr std::size_t kMostHeadBytes = std::size_t{32} << 10U;
+  static constexpr int kMostHeadLines = 100;  // the library keeps each in a place of its own
 
   void BeginReading(const std::string& counted_for, std::chrono::seconds time);
+  // As the library reads a head, byte by byte. It decodes what stands in fields, as if clients
+  // encoded it, and would find another cookie in the text of one: so that is encoded here.
+  ssize_t ReadOfHead(char* to);
   // False at the deadline.
   bool WaitFor(short event) const;
 
@@ -62,6 +66,9 @@ class Connection : public httplib::Stream {
   std::size_t begin_ = 0;          // and not read yet
   std::size_t end_ = 0;
   std::size_t allowed_ = kMostHeadBytes;
+  bool is_head_ = true;
+  int head_lines_ = 0;
+  std::string encoded_;  // what is left of a byte of the head
 };
 
 // The numeric address, and the port, at this machine's end.

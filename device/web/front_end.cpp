@@ -6,6 +6,7 @@
 #include <cerrno>
 #include <chrono>
 #include <memory>
+#include <mutex>
 #include <stdexcept>
 
 #include "device/base/json_text.h"
@@ -47,6 +48,12 @@ Json::Value Asked(const Request& request, const std::string& kind) {
                              {"client", Connection::OfThisThread().Client()}});
 }
 
+Json::Value ParseSignIn(const Request& request, std::string body) {
+  static std::mutex parsing;  // the values of many bodies at a time would take much memory
+  const std::lock_guard<std::mutex> lock(parsing);
+  return Device::ParseBody(request.get_header_value("Content-Type"), std::move(body));
+}
+
 void SignIn(const Request& request, Response& response, const httplib::ContentReader& reader) {
   std::string body;
   Connection::OfThisThread().BeginBody(false);
@@ -56,8 +63,7 @@ void SignIn(const Request& request, Response& response, const httplib::ContentRe
     return;
   }
   try {
-    const Json::Value asked =
-        Device::ParseBody(request.get_header_value("Content-Type"), std::move(body));
+    const Json::Value asked = ParseSignIn(request, std::move(body));
     const Json::Value sign_in =
         Device::JsonObject({{"kind", Device::kKindSignIn},
                             {"user", Device::TextField(asked, "user")},

@@ -66,6 +66,7 @@ test('each request is answered with its status and words, and guarded', async ()
     [200, '"alice"', '/session', cookie(`a=b; session=${id}; c=d`)],
     [401, 'no session', '/session', cookie(`xsession=${id}`)],
     [401, 'no session', '/session', cookie(`a=b; session2=${id}; csession=${id}`)],
+    [401, 'no session', '/session', cookie(`a=%3B%20session%3D${id}`)],
     [401, 'no session', '/events', cookie('')],
     [401, 'no session', ...post('{"api":"a","method":"b","version":1}', { Cookie: '' })],
     [401, 'no session', ...post(long.slice(0, 70000), { Cookie: 'session=stale' })],
