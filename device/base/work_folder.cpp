@@ -76,8 +76,9 @@ WorkFolder::WorkFolder(const FileDescriptor& parent, const std::string& name) {
   folder_ = FileDescriptor(openat(parent.Get(), name.c_str(), kOpenFolder));
   // Who can rename it may have put another in its place already.
   if (!folder_ || !IsOwn(folder_) || !fs::is_empty(PathOf(folder_.Get()))) {
-    errno = folder_ ? EPERM : errno;
-    folder_.Close();
+    const int error = folder_ ? EPERM : errno;
+    unlinkat(parent.Get(), name.c_str(), AT_REMOVEDIR);  // if it is empty
+    errno = error;
     ThrowErrno("cannot open the temporary folder");
   }
   mark_ = FileDescriptor(
