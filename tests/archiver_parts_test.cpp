@@ -23,7 +23,7 @@ TEST(CommandLine, RefusesWhatNoCallerSends) {
 
 TEST(ListFile, NamesEachSourceOnceWithoutItsDots) {
   EXPECT_EQ(WithoutNested(ReadSources("./b/\n./b/x\n./a b \n././b//.\n./bx\n./c/d/e\n./c/d\n", "l"),
-                          {"b", "c/d"}),
+                          {{"b", {}}, {"c/d", {}}}),
             (Strings{"b", "a b ", "bx", "c/d"}));
   for (const char* text : {"", "\n", "./\n", "/etc\n", "./a/../../b\n", "..\n"}) {
     EXPECT_THROW(ReadSources(text, "l"), Failure) << text;

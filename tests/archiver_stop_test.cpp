@@ -28,7 +28,7 @@ TEST_F(ArchiverTest, DoesNotOverwriteWhatAnotherRunHasMade) {
       WriteFile(share / "b", "b");
       Good("new", {"b"});
     }
-    const auto run = Pack({}, 50 << 20);
+    const auto run = Pack({}, 200 << 20);
     kill(run->Pid(), SIGSTOP);
     Good("new", {"a"});
     kill(run->Pid(), SIGCONT);
@@ -50,6 +50,23 @@ TEST_F(ArchiverTest, MakesNothingInAFolderThatHasMoved) {
   EXPECT_EQ(run->Wait(), 1);
   EXPECT_TRUE(run->ReadUntil("its folder has moved meanwhile"));
   EXPECT_TRUE(fs::is_empty(out) && fs::is_empty(root / "moved"));
+}
+
+TEST_F(ArchiverTest, FailsWhenTwoSourcesWereExchanged) {
+  for (const char* folder : {"one", "other"}) {
+    WriteFile(share / folder / "huge", "");
+    fs::resize_file(share / folder / "huge", 50 << 20);
+  }
+  Program run(CommandLine("new", {"one", "other"}, {}), share);
+  EXPECT_TRUE(run.ReadUntil("Progress: 0\n")) << run.Seen();
+  kill(run.Pid(), SIGSTOP);
+  fs::rename(share / "one", share / "between");
+  fs::rename(share / "other", share / "one");
+  fs::rename(share / "between", share / "other");
+  kill(run.Pid(), SIGCONT);
+  EXPECT_EQ(run.Wait(), 1);
+  EXPECT_TRUE(run.ReadUntil("it was exchanged meanwhile")) << run.Seen();
+  EXPECT_EQ(InOut(), Strings{});
 }
 
 TEST_F(ArchiverTest, SaysAHundredPercentWhenTheArchiveIsThere) {

@@ -47,7 +47,11 @@ void DeviceConfig(const std::string& input) try {
 
 void SourceList(const std::string& input) try {
   const std::vector<std::string> sources = Archiver::ReadSources(input, "list");
-  const auto packed = Archiver::WithoutNested(sources, {sources.begin(), sources.end()});
+  Archiver::Identities folders;
+  for (const std::string& source : sources) {
+    folders[source];
+  }
+  const auto packed = Archiver::WithoutNested(sources, folders);
   const Archiver::NamesFor7z divided = Archiver::DivideNames(packed);
   std::multiset<std::string> again(divided.arguments.begin(), divided.arguments.end());
   std::istringstream list(divided.list);

@@ -103,8 +103,12 @@ TEST_F(TrustTest, WhoeverExchangesNamesReadsNothingAndChangesNothing) {
   link_to(private_, trap + "/file");
   fs::create_directory(trap + "/job");
   link_to(private_, trap + "/job/new");
+  link_to("../@eaDir/private", trap + "/left-out");
+  Add("vol1/photo/trip/@eaDir/private", kSecret);
   constexpr char kStore[] = R"({"level":"store"})";
 
+  // A file, with a link to one that the job leaves out.
+  Withstand([&] { exchange(photo_ + "/trip/day/1", trap + "/left-out"); }, {"/photo/trip"}, kStore);
   // A selected folder, and one within.
   Withstand([&] { exchange(photo_ + "/trip", trap + "/home"); }, {"/photo/trip"}, kStore);
   Withstand([&] { exchange(photo_ + "/trip/day", trap + "/home"); }, {"/photo/trip"}, kStore);
@@ -166,17 +170,25 @@ TEST_F(TrustTest, WhatKilledJobsLeaveGoesWithTheNextAndNothingElseDoes) {
     }
     return found;
   };
+  setenv("ROOTS_TOKEN", "geheim", 1);
+  const Device::FileDescriptor roots(open(private_.c_str(), O_RDONLY));
   Call("start", JobParams({"/photo/zeros"}, "/photo/z.zip", R"({"password":"geheim"})"));
   ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).size() >= 3 && !jobs_folders().empty(); }));
   for (const auto& process : fs::directory_iterator("/proc")) {
     EXPECT_EQ(ReadFile(process.path() / "cmdline").find("geheim"), std::string::npos);
   }
-  // The user can make the archiver do anything, also with root's terminal.
+  // The user can make the archiver do anything, also with root's terminal, variables and files.
   const std::string own_errors = fs::read_symlink("/proc/self/fd/2");
   for (const pid_t pid : Group(Worker())) {
     EXPECT_EQ(getsid(pid), Worker());
     const std::string errors = fs::read_symlink("/proc/" + std::to_string(pid) + "/fd/2");
     EXPECT_TRUE(pid == Worker() || errors == "/dev/null" || errors != own_errors) << errors;
+    for (const auto& fd : fs::directory_iterator("/proc/" + std::to_string(pid) + "/fd")) {
+      EXPECT_TRUE(pid == Worker() || fs::read_symlink(fd) != private_);
+    }
+    EXPECT_TRUE(pid == Worker() ||
+                ReadFile("/proc/" + std::to_string(pid) + "/environ").find("geheim") ==
+                    std::string::npos);
   }
   kill(-Worker(), SIGKILL);
   ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));

@@ -30,9 +30,11 @@ Job::Job(const Request& asked, const Device::ArchiverCall& call, Report& lines)
       report(lines),
       target(asked.archive, call.fixed_folders),
       work(MakeWorkFolder(target, call.work_folder)),
-      zip_program(call.zip_program) {
+      zip_program(call.zip_program),
+      link_free(call.link_free) {
   fence.AllowWriting(work.Get());
   fence.AllowRunning(zip_program);
+  fence.AllowRunning(link_free);
   if (target.Old()) {
     fence.AllowReading(target.Old().Get());
   }

@@ -28,6 +28,7 @@ struct Job {
   const Target target;
   const Device::WorkFolder work;
   const int zip_program;
+  const int link_free;
   Device::Fence fence;
 };
 

@@ -15,7 +15,6 @@
 #include <limits>
 #include <optional>
 #include <set>
-#include <unordered_set>
 #include <utility>
 
 #include "device/archiver/command_line.h"
@@ -39,6 +38,7 @@ namespace Archiver {
 namespace {
 
 constexpr char kZipProgram[] = "kavo-zip";
+constexpr char kLinkFree[] = "kavo-link-free.so";
 
 std::vector<std::string> Sources(const Request& request) {
   std::vector<std::string> sources =
@@ -46,6 +46,11 @@ std::vector<std::string> Sources(const Request& request) {
   if (std::all_of(sources.begin(), sources.end(),
                   [&](const std::string& source) { return IsExcluded(request, source); })) {
     throw NamedFailure("nothing to pack", sources.front(), "all sources are excluded");
+  }
+  for (const std::string& source : sources) {
+    if (Device::IsWorkFolderName(source.substr(source.rfind('/') + 1))) {
+      throw NamedFailure("cannot pack", source, "it has the name of a job's own folder");
+    }
   }
   return sources;
 }
@@ -95,7 +100,13 @@ void Pack(Job& job, PackRun run, const Device::FileDescriptor& folder) {
   start.arguments.insert(start.arguments.begin(), kStock7z);
   start.folder = folder.Get();
   start.input = password.Get();
-  start.kept.insert(start.kept.end(), {sources.Get(), left_out.Get()});
+  start.kept.insert(start.kept.end(), {sources.Get(), left_out.Get(), job.link_free});
+  if (Device::Fence::IsSupported()) {
+    start.environment = {"LD_PRELOAD=" + Device::PathOf(job.link_free)};
+    if (run.follow_links) {
+      start.environment.emplace_back("KAVO_STAGED=1");
+    }
+  }
   OutputParser parser;
   try {
     Run7z(start, run.left_out_links, job.report,
@@ -173,7 +184,7 @@ Device::FileDescriptor PackArchive(const Request& request, const Device::Archive
   std::vector<std::string> listed = Sources(request);
   const WorkPlace place = FindWorkPlace(listed, request.list_path);
   Job job(request, call, report);
-  const std::unordered_set<std::string> no_files = AllowSources(place, listed, job.fence);
+  const Identities no_files = AllowSources(place, listed, job.fence);
   const std::vector<std::string> sources = WithoutNested(std::move(listed), no_files);
   const std::vector<std::string> suspects =
       Filter(sources, [&](const std::string& source) { return no_files.count(source) != 0; });
@@ -192,6 +203,7 @@ Device::FileDescriptor PackArchive(const Request& request, const Device::Archive
   if (recode) {
     PutNamesIntoCodePage(job);
   }
+  CheckIdentities(place, no_files);
   report.CheckCancelled();
   return job.target.Publish(job.work.Get());
 }
@@ -206,9 +218,12 @@ std::optional<Device::ArchiverCall> CallOfDevice() {
 }
 
 Device::ArchiverCall CallByHand() {
-  const int zip_program = Device::OpenBesideProgram(kZipProgram, O_PATH).Release();
-  return {
-      {}, Device::NewWorkFolderName(), zip_program, std::numeric_limits<std::uint64_t>::max(), {}};
+  return {{},
+          Device::NewWorkFolderName(),
+          Device::OpenBesideProgram(kZipProgram, O_PATH).Release(),
+          Device::OpenBesideProgram(kLinkFree, O_PATH).Release(),
+          std::numeric_limits<std::uint64_t>::max(),
+          {}};
 }
 
 // When memory runs out, it is this program and its 7z that the kernel kills.

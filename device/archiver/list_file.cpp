@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <string_view>
+#include <unordered_set>
 
 #include "device/archiver/failure.h"
 #include "device/base/for_each_part.h"
@@ -38,7 +39,7 @@ std::string Normalize(std::string_view line) {
   return path;
 }
 
-bool HasAncestorIn(const std::unordered_set<std::string>& names, const std::string& path) {
+bool HasAncestorIn(const Identities& names, const std::string& path) {
   for (size_t at = path.rfind('/'); at != std::string::npos; at = path.rfind('/', at - 1)) {
     if (names.count(path.substr(0, at)) != 0) {
       return true;
@@ -67,7 +68,7 @@ std::vector<std::string> ReadSources(const std::string& text, const std::string&
 }
 
 std::vector<std::string> WithoutNested(std::vector<std::string> sources,
-                                       const std::unordered_set<std::string>& folders) {
+                                       const Identities& folders) {
   if (!folders.empty()) {
     const auto is_nested = [&](const std::string& source) {
       return HasAncestorIn(folders, source);

@@ -8,7 +8,6 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdlib>
-#include <cstring>
 #include <utility>
 
 #include "device/archiver/failure.h"
@@ -30,23 +29,6 @@ void ReadSome(Device::FileDescriptor& fd, const OutputReader& reader) {
   } else {
     reader({buffer.data(), static_cast<size_t>(size)});
   }
-}
-
-// The caller's, with a locale under which 7z takes names for UTF-8 and speaks English. With the
-// zone that holds anyway, but named, the C library does not look at its file again for each time
-// of each source that 7z converts.
-std::vector<std::string> Environment() {
-  std::vector<std::string> result;
-  for (char** entry = environ; *entry != nullptr; ++entry) {
-    if (std::strncmp(*entry, "LC_", 3) != 0 && std::strncmp(*entry, "LANG", 4) != 0) {
-      result.emplace_back(*entry);
-    }
-  }
-  result.emplace_back("LC_ALL=C.UTF-8");
-  if (std::getenv("TZ") == nullptr) {
-    result.emplace_back("TZ=:/etc/localtime");
-  }
-  return result;
 }
 
 }  // namespace
@@ -85,7 +67,13 @@ int RunProgram(Device::ProgramStart start, const Report& report, const OutputRea
 
 void Run7z(Device::ProgramStart start, const std::set<std::string>& left_out, const Report& report,
            const OutputReader& reader) {
-  start.environment = Environment();
+  // Under this locale 7z takes names for UTF-8 and speaks English. With the zone that holds anyway,
+  // but named, the C library does not look at its file again for each time of each source that 7z
+  // converts.
+  start.environment.emplace_back("LC_ALL=C.UTF-8");
+  if (std::getenv("TZ") == nullptr) {
+    start.environment.emplace_back("TZ=:/etc/localtime");
+  }
   ErrorText text(left_out);
   const int status = RunProgram(std::move(start), report, reader, [&](const std::string& bytes) {
     text.Feed(bytes);

@@ -46,6 +46,14 @@ bool LeadsToFolder(const std::string& name) {
   return fs::is_symlink(name, ignored) && fs::is_directory(name, ignored);
 }
 
+struct stat StatusOf(const Device::FileDescriptor& opened, const std::string& source) {
+  struct stat info {};
+  if (fstat(opened.Get(), &info) != 0) {
+    throw SystemFailure(kCannotPack, source, errno);
+  }
+  return info;
+}
+
 // What follows `folder` and a slash in `path`; empty when `path` lies elsewhere.
 std::string Below(const std::string& folder, const std::string& path) {
   const std::string start = folder == "/" ? folder : folder + "/";
@@ -98,23 +106,19 @@ Device::FileDescriptor OpenSource(const WorkPlace& place, const std::string& sou
   return opened;
 }
 
-std::unordered_set<std::string> AllowSources(const WorkPlace& place,
-                                             const std::vector<std::string>& sources,
-                                             Device::Fence& fence) {
-  std::unordered_set<std::string> no_files;
+Identities AllowSources(const WorkPlace& place, const std::vector<std::string>& sources,
+                        Device::Fence& fence) {
+  Identities no_files;
   bool is_listed = false;
   for (const std::string& source : sources) {
     is_listed = is_listed || source.find_first_of(kWildcards) != std::string::npos;
     const Device::FileDescriptor opened = OpenSource(place, source);
-    struct stat info {};
-    if (fstat(opened.Get(), &info) != 0) {
-      throw SystemFailure(kCannotPack, source, errno);
-    }
+    const struct stat info = StatusOf(opened, source);
     if (S_ISREG(info.st_mode) || S_ISDIR(info.st_mode)) {
       fence.AllowReading(opened.Get());
     }
     if (!S_ISREG(info.st_mode)) {
-      no_files.insert(source);
+      no_files.emplace(source, std::pair(info.st_dev, info.st_ino));
     }
   }
   if (is_listed) {
@@ -124,6 +128,15 @@ std::unordered_set<std::string> AllowSources(const WorkPlace& place,
     }
   }
   return no_files;
+}
+
+void CheckIdentities(const WorkPlace& place, const Identities& sources) {
+  for (const auto& [source, identity] : sources) {
+    const struct stat info = StatusOf(OpenSource(place, source), source);
+    if (identity != std::pair(info.st_dev, info.st_ino)) {
+      throw NamedFailure(kCannotPack, source, "it was exchanged meanwhile");
+    }
+  }
 }
 
 std::vector<std::string> NamesOf(const WorkPlace& place, const Target& target) {

@@ -2,9 +2,9 @@
 
 #include <map>
 #include <string>
-#include <unordered_set>
 #include <vector>
 
+#include "device/archiver/list_file.h"
 #include "device/archiver/target.h"
 #include "device/base/fence.h"
 #include "device/base/file_descriptor.h"
@@ -30,12 +30,15 @@ WorkPlace FindWorkPlace(const std::vector<std::string>& sources, const std::stri
 Device::FileDescriptor OpenSource(const WorkPlace& place, const std::string& source);
 
 // Opens each source and allows it to 7z: nothing that takes its place afterwards is allowed.
-// Returns the sources that are no plain files. Throws Failure for a source that is missing or lies
+// Returns those that are no plain files. Throws Failure for a source that is missing or lies
 // behind a link other than those of a staging folder. 7z overlooks both when the name has a '*' or
 // '?', for all that it matches literally.
-std::unordered_set<std::string> AllowSources(const WorkPlace& place,
-                                             const std::vector<std::string>& sources,
-                                             Device::Fence& fence);
+Identities AllowSources(const WorkPlace& place, const std::vector<std::string>& sources,
+                        Device::Fence& fence);
+
+// Throws Failure when one of the sources was exchanged since: what 7z has packed under its name can
+// be another one's.
+void CheckIdentities(const WorkPlace& place, const Identities& sources);
 
 // The names, relative to the place, under which 7z can come across the target.
 std::vector<std::string> NamesOf(const WorkPlace& place, const Target& target);

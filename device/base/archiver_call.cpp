@@ -21,7 +21,8 @@ constexpr std::size_t kMostCallBytes = 128 << 10U;  // what the socket holds bef
 
 bool SendArchiverCall(int socket, const ArchiverCall& call) {
   std::vector<std::string> fields = {call.password, call.work_folder,
-                                     std::to_string(call.zip_program), std::to_string(call.memory)};
+                                     std::to_string(call.zip_program),
+                                     std::to_string(call.link_free), std::to_string(call.memory)};
   fields.insert(fields.end(), call.fixed_folders.begin(), call.fixed_folders.end());
   std::string texts;
   for (const std::string& field : fields) {
@@ -40,7 +41,7 @@ std::optional<ArchiverCall> ReceiveArchiverCall(int socket) {
   const std::string frame = ReadFrame(socket).value_or("");
   std::vector<std::string> texts;
   ForEachPart(frame, {"\0", 1}, [&](std::string_view text) { texts.emplace_back(text); });
-  constexpr std::size_t kHead = 4;  // before the folders
+  constexpr std::size_t kHead = 5;  // before the folders
   if (texts.size() < kHead) {
     return std::nullopt;
   }
@@ -49,7 +50,8 @@ std::optional<ArchiverCall> ReceiveArchiverCall(int socket) {
   return ArchiverCall{texts[0],
                       texts[1],
                       std::atoi(texts[2].c_str()),
-                      std::strtoull(texts[3].c_str(), nullptr, kDecimal),
+                      std::atoi(texts[3].c_str()),
+                      std::strtoull(texts[4].c_str(), nullptr, kDecimal),
                       {texts.begin() + kHead, texts.end()}};
 }
 

@@ -19,6 +19,7 @@ struct ArchiverCall {
   std::string password;                    // empty for none
   std::string work_folder;                 // name of the hidden folder to make beside the target
   int zip_program = -1;                    // kavo-zip, open in the archiver under this number
+  int link_free = -1;                      // likewise kavo-link-free.so
   std::uint64_t memory = 0;                // bytes that 7z may take
   std::vector<std::string> fixed_folders;  // see OpenUserPath
 };

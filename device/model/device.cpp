@@ -23,6 +23,7 @@ namespace fs = std::filesystem;
 
 constexpr char kArchiverName[] = "kavo-7z";
 constexpr char kZipProgramName[] = "kavo-zip";
+constexpr char kLinkFreeName[] = "kavo-link-free.so";
 constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
 
 std::unique_ptr<OpenDevice>& Instance() {
@@ -107,6 +108,7 @@ std::unique_ptr<OpenDevice> OpenFolder(const std::string& folder) {
   // Opened at once: later there may be no way to walk there.
   device->archiver = OpenBesideProgram(kArchiverName, O_PATH);
   device->zip_program = OpenBesideProgram(kZipProgramName, O_PATH);
+  device->link_free = OpenBesideProgram(kLinkFreeName, O_PATH);
   device->module = OpenBesideProgram(kModuleName, O_RDONLY);
   constexpr mode_t kPrivate = 0600;
   const std::string queue = device->root + "/" + kQueueFile;

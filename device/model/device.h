@@ -33,6 +33,7 @@ struct OpenDevice {
   bool switches_identity = false;         // false: not root, all users are the caller
   FileDescriptor archiver;                // the program that runs in place of /usr/bin/7z
   FileDescriptor zip_program;             // which the archiver asks about zips
+  FileDescriptor link_free;               // the library that keeps 7z from following links
   FileDescriptor module;                  // the shared library that serves the requests
   FileDescriptor queue;                   // that jobs are queued by locks on
 

@@ -105,8 +105,9 @@ void TakeArchiverLine(const std::string& line) {
 
 ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun& run) {
   const Arguments arguments = TakeApart(argument_vector);
-  const ArchiverCall call = {arguments.password, NewWorkFolderName(), TheDevice().zip_program.Get(),
-                             MemoryOfJob(), TheDevice().FixedFolders(CurrentUser())};
+  const ArchiverCall call = {
+      arguments.password,          NewWorkFolderName(), TheDevice().zip_program.Get(),
+      TheDevice().link_free.Get(), MemoryOfJob(),       TheDevice().FixedFolders(CurrentUser())};
   const std::string& folder = SourcesFolder();
   if (!folder.empty() &&
       !IsSameFolder(OpenUserPath(call.fixed_folders, folder, O_PATH | O_DIRECTORY))) {
@@ -131,7 +132,7 @@ ChildProcess StartArchiver(char* const* argument_vector, int output, ArchiverRun
   start.arguments = arguments.shown;
   start.input = input.Get();
   start.output = output;
-  start.kept = {call.zip_program};
+  start.kept = {call.zip_program, call.link_free};
   return ChildProcess::Start(start);
 }
 
