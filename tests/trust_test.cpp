@@ -21,8 +21,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr uid_t kAlice = 65001;
-constexpr uid_t kBob = 65002;
+constexpr uid_t kAlice = 65001, kBob = 65002;
 constexpr char kSecret[] = "alice's private words";
 
 struct stat Status(const std::string& path) {
@@ -181,14 +180,14 @@ TEST_F(TrustTest, WhatKilledJobsLeaveGoesWithTheNextAndNothingElseDoes) {
   const std::string own_errors = fs::read_symlink("/proc/self/fd/2");
   for (const pid_t pid : Group(Worker())) {
     EXPECT_EQ(getsid(pid), Worker());
-    const std::string errors = fs::read_symlink("/proc/" + std::to_string(pid) + "/fd/2");
-    EXPECT_TRUE(pid == Worker() || errors == "/dev/null" || errors != own_errors) << errors;
-    for (const auto& fd : fs::directory_iterator("/proc/" + std::to_string(pid) + "/fd")) {
-      EXPECT_TRUE(pid == Worker() || fs::read_symlink(fd) != private_);
+    const std::string process = "/proc/" + std::to_string(pid);
+    for (const auto& fd : fs::directory_iterator(process + "/fd")) {
+      const std::string file = fs::read_symlink(fd);
+      EXPECT_TRUE(pid == Worker() || file == "/dev/null" ||
+                  (file != own_errors && file != private_));
     }
     EXPECT_TRUE(pid == Worker() ||
-                ReadFile("/proc/" + std::to_string(pid) + "/environ").find("geheim") ==
-                    std::string::npos);
+                ReadFile(process + "/environ").find("geheim") == std::string::npos);
   }
   kill(-Worker(), SIGKILL);
   ASSERT_TRUE(WaitUntil([&] { return Group(Worker()).empty(); }));
@@ -210,8 +209,7 @@ TEST_F(TrustTest, WhatKilledJobsLeaveGoesWithTheNextAndNothingElseDoes) {
 // another device.
 TEST_F(TrustTest, OldListsAreRemovedWithTheNextJob) {
   const auto unused = [] { return "/tmp/lumozip" + Device::RandomId(1).substr(2); };
-  const std::string of_links = unused();
-  const std::string of_bob = unused();
+  const std::string of_links = unused(), of_bob = unused();
   const struct {
     std::string path;
     int age;  // seconds
@@ -252,13 +250,11 @@ TEST_F(TrustTest, AFailedJobTouchesNothingThatIsNoArchive) {
     chown((photo_ + name).c_str(), kAlice, 65100);
     const struct stat before = Status(photo_ + name);
     EXPECT_EQ(FailJob(JobParams({"/photo/beside"}, std::string("/photo") + name)).size(), 1U);
-    const struct stat after = Status(photo_ + name);
-    EXPECT_EQ(after.st_gid, before.st_gid) << name;
-    EXPECT_EQ(after.st_mode, before.st_mode) << name;
+    EXPECT_EQ(Status(photo_ + name).st_gid, before.st_gid) << name;
+    EXPECT_EQ(Status(photo_ + name).st_mode, before.st_mode) << name;
   }
 }
 
-// What a program in the fence can do to what was not allowed.
 TEST(Fence, HoldsAProgramToWhatWasAllowed) {
   if (!Device::Fence::IsSupported()) {
     GTEST_SKIP() << "the kernel has no Landlock";
@@ -295,7 +291,6 @@ TEST(Fence, HoldsAProgramToWhatWasAllowed) {
     start.program = "/bin/bash";
     start.arguments = {"bash", "-c", row.script};
     start.folder = folder.Get();
-    start.errors = Device::FileDescriptor(open("/dev/null", O_WRONLY | O_CLOEXEC)).Release();
     start.fence = &fence;
     EXPECT_EQ(Device::ChildProcess::Start(start).Wait() == 0, row.is_allowed) << row.script;
   }
