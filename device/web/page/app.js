@@ -104,7 +104,6 @@ function endSession() {
 function leave(message, userName) {
   session = null;
   events.close();
-  dialog.close();
   for (const open of document.querySelectorAll('dialog[open]')) open.close();
   tray.clear();
   tasks.clear();

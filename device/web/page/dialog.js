@@ -29,7 +29,6 @@ export class CompressDialog {
   #sources = [];
   #proposed = HOME;  // the folder that the field shows as long as nobody types there
   #wantsPassword = false;  // the draft had one, which is not kept
-  #isSending = false;
   #destination = new Destination(showPlaceError);
   #picker = new FolderPicker();
   #size = new TreeSize(byId('compress-size'));
@@ -106,10 +105,6 @@ export class CompressDialog {
     this.#size.ask(this.#sources);
   }
 
-  close() {
-    dialog.close();
-  }
-
   #propose(path) {
     this.#proposed = path;
     folder.value = shown(path);
@@ -136,10 +131,9 @@ export class CompressDialog {
 
   async #submit() {
     clearErrors();
-    if (this.#isSending) return;
+    if (form.hasAttribute('aria-busy')) return;
     completeName();
     if (!this.#isFilledIn()) return;
-    this.#isSending = true;
     form.setAttribute('aria-busy', 'true');
     try {
       await this.#start();
@@ -147,7 +141,6 @@ export class CompressDialog {
       if (!(refusal instanceof Refusal)) throw refusal;
       showRefusal(refusal);
     } finally {
-      this.#isSending = false;
       form.removeAttribute('aria-busy');
     }
   }

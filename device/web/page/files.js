@@ -103,12 +103,7 @@ export class Files {
   async openLocation() {
     const hash = location.hash.slice(HASH.length);
     this.#wanted = hash.startsWith(ROOT) ? decodePath(hash).replace(/(.)\/+$/s, '$1') : ROOT;
-    if (await this.#list() && document.activeElement === document.body) this.focus();
-  }
-
-  // Lists the folder as it is now.
-  async reload() {
-    await this.#list();
+    if (await this.reload() && document.activeElement === document.body) this.focus();
   }
 
   // Shows a file in its folder, selected and with the focus.
@@ -118,8 +113,8 @@ export class Files {
     else this.#go(parentOf(path));
   }
 
-  // False when a later request has overtaken this one.
-  async #list() {
+  // Lists the folder as it is now. False when a later request has overtaken this one.
+  async reload() {
     this.#asked.abort();
     const asked = this.#asked = new AbortController();
     const late = setTimeout(() => this.#drawLoading(), PATIENCE_MS);

@@ -13,7 +13,6 @@ const password = byId('sign-in-password');
 
 export class SignIn {
   #onSignedIn;
-  #isSending = false;
 
   constructor({ onSignedIn }) {
     this.#onSignedIn = onSignedIn;
@@ -41,14 +40,13 @@ export class SignIn {
   }
 
   async #submit() {
-    if (this.#isSending) return;
+    if (form.hasAttribute('aria-busy')) return;
     setText(error, '');
     if (!user.value || !password.value) {
       setText(error, 'Give your user name and password.');
       (user.value ? password : user).focus();
       return;
     }
-    this.#isSending = true;
     form.setAttribute('aria-busy', 'true');
     try {
       this.#onSignedIn(await signIn(user.value, password.value));
@@ -58,7 +56,6 @@ export class SignIn {
       password.select();
       password.focus();
     } finally {
-      this.#isSending = false;
       form.removeAttribute('aria-busy');
     }
   }

@@ -93,7 +93,7 @@ export class TaskItem {
       make('Show in folder', () => this.#on.show(path)),
       make('Look inside', () => this.#on.look(path)),
     ] : []), ...(job ? [make('Retry', () => this.#on.retry(job))] : []),
-    this.isAtWork ? make('Stop', () => this.stop()) : make('Dismiss', () => this.dismiss()));
+    this.isAtWork ? make('Stop', () => this.#end(stopTask, true)) : make('Dismiss', () => this.dismiss()));
     if (hadFocus) this.#buttons.firstElementChild.focus();
   }
 
@@ -105,10 +105,6 @@ export class TaskItem {
     if (reason) lines.push(element('li', { class: 'reason' }, shown(reason)));
     this.#errors.replaceChildren(...lines);
     this.#errors.hidden = lines.length === 0;
-  }
-
-  stop() {
-    return this.#end(stopTask, true);
   }
 
   // The report of an ended task removes it from the device.
