@@ -56,6 +56,7 @@ class Start {
     if (!kIsEmulated || !IsForThisKind(program)) {
       return;
     }
+    KeepOpen(kSysroot);
     const char* const name = *arguments;
     for (const char* part : {KAVO_EMULATOR, "-L", libraries_.c_str(), "-0", name, program}) {
       whole_.push_back(const_cast<char*>(part));

@@ -39,8 +39,11 @@ bool IsForeignHost(const Request& request) {
 bool IsForeign(const Request& request) {
   const std::string origin = request.get_header_value("Origin");
   const std::size_t host = origin.find("://");
-  return !origin.empty() &&
-         (host == std::string::npos || origin.substr(host + 3) != request.get_header_value("Host"));
+  const auto is_host = [&](const char* field) {
+    return host != std::string::npos && origin.substr(host + 3) == request.get_header_value(field);
+  };
+  // The latter is a proxy's: before another site's page may send it, browsers ask, and are refused.
+  return !origin.empty() && !is_host("Host") && !is_host("X-Forwarded-Host");
 }
 
 void ChooseEncoding(httplib::Headers& headers, const std::string& version) {

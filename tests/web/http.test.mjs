@@ -72,6 +72,7 @@ test('each request is answered with its status and words, and guarded', async ()
     [401, 'no session', ...post(long.slice(0, 70000), { Cookie: 'session=stale' })],
     [401, 'wrong user', '/session', { method: 'POST', body: '{"user":"bob","password":"bob\\u0000x"}' }],
     [200, '"tasks"', '/tasks', { headers: { Origin: device.url } }],
+    [200, '"tasks"', '/tasks', { headers: { Origin: 'https://nas.example', 'X-Forwarded-Host': 'nas.example' } }],
     [403, "another site's page", '/tasks', { headers: { Origin: 'http://evil.example' } }],
     [403, "another site's page", '/tasks', { headers: { Origin: `http://evil.example${device.url}` } }],
     [404, 'no such route', '/none', { headers: { Range: 'bytes=0-1' } }],
