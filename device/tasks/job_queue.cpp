@@ -225,7 +225,7 @@ bool MayEnterQueue(uid_t user) {
   const std::vector<QueuedJob> jobs = JobsOfOthers();
   const auto of_user = static_cast<std::size_t>(
       std::count_if(jobs.begin(), jobs.end(), [&](const auto& job) { return job.user == user; }));
-  return of_user < std::min(kMostOfUser, kMostBytes / own_bytes);
+  return of_user < std::min(kMostOfUser, kMostBytes / std::max<std::size_t>(own_bytes, 1));
 }
 
 void EnterQueue(uid_t user) {
