@@ -6,6 +6,7 @@
 // In a staging folder (KAVO_STAGED is set) the first part of a path is one of the folder's own
 // links.
 #include <dirent.h>
+#include <dlfcn.h>
 #include <fcntl.h>
 #include <linux/openat2.h>
 #include <sys/stat.h>
@@ -101,7 +102,12 @@ int stat64(const char* path, struct stat64* status) noexcept {
 }
 
 int fstatat64(int folder, const char* path, struct stat64* status, int flags) noexcept {
-  return Status(folder, path, status, flags);
+  if (folder == AT_FDCWD || strchr(path, '/') != nullptr) {
+    return Status(folder, path, status, flags);
+  }
+  using Function = int(int, const char*, struct stat64*, int);
+  static auto* const real = reinterpret_cast<Function*>(dlsym(RTLD_NEXT, "fstatat64"));
+  return real(folder, path, status, flags | AT_SYMLINK_NOFOLLOW);
 }
 
 ssize_t readlink(const char* path, char* text, size_t size) noexcept {
