@@ -31,7 +31,7 @@ void Close(int fd) {
 
 int OpenLinkFree(int folder, const char* path, int flags, mode_t mode) {
   open_how how = {};
-  how.flags = static_cast<unsigned int>(flags);
+  how.flags = static_cast<unsigned int>(flags | O_LARGEFILE);
   how.mode = (flags & (O_CREAT | __O_TMPFILE)) != 0 ? mode : 0;
   how.resolve = RESOLVE_NO_SYMLINKS;
   return static_cast<int>(syscall(SYS_openat2, folder, path, &how, sizeof how));
@@ -58,7 +58,7 @@ int OpenStaged(const char* path, int flags, mode_t mode) {
 
 int Open(int folder, const char* path, int flags, mode_t mode) {
   if (*path == '/') {
-    return openat(folder, path, flags, mode);
+    return openat64(folder, path, flags, mode);
   }
   return folder == AT_FDCWD && getenv("KAVO_STAGED") != nullptr
              ? OpenStaged(path, flags, mode)

@@ -10,21 +10,20 @@
 #include <cerrno>
 #include <climits>
 #include <cstring>
-#include <filesystem>
 #include <memory>
 #include <utility>
 
 #include "device/archiver/failure.h"
+#include "device/base/for_each_part.h"
 #include "device/base/open_below.h"
 #include "device/base/work_folder.h"
 
 namespace Archiver {
 
-namespace fs = std::filesystem;
-
 namespace {
 
 constexpr char kCannotRead[] = "cannot read";
+constexpr char kCannotCopy[] = "cannot copy";
 constexpr int kOpenFolder = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
 
 struct stat Status(int folder, const char* path, int flags) {
@@ -43,6 +42,17 @@ std::string TextOfLink(const Device::FileDescriptor& link) {
     throw SystemFailure(kCannotRead, "link", errno);
   }
   return {text.data(), static_cast<size_t>(length)};
+}
+
+// A folder of the mirror, made if it is not there. Never behind a link: by what others exchange
+// while it is listed, a folder can hold what was found as a link.
+Device::FileDescriptor FolderIn(int parent, const std::string& name) {
+  mkdirat(parent, name.c_str(), S_IRWXU);
+  Device::FileDescriptor folder = Device::OpenBelow(parent, name, O_PATH | O_DIRECTORY);
+  if (!folder) {
+    throw SystemFailure(kCannotCopy, name, errno);
+  }
+  return folder;
 }
 
 class Scan {
@@ -109,22 +119,29 @@ std::vector<std::string> FindSpecials(const WorkPlace& place,
 
 Device::FileDescriptor MirrorSpecials(const WorkPlace& place,
                                       const std::vector<std::string>& specials, int work_folder) {
-  const fs::path mirror = Device::PathOf(work_folder) + "/" + Device::kWorkMirror;
-  fs::create_directory(mirror);
+  Device::FileDescriptor mirror = FolderIn(work_folder, Device::kWorkMirror);
   for (const std::string& special : specials) {
     const Device::FileDescriptor original = OpenSource(place, special);
-    const fs::path copy = mirror / special;
     const struct stat info = Status(original.Get(), "", AT_EMPTY_PATH);
-    fs::create_directories(copy.parent_path());
-    if (S_ISLNK(info.st_mode)) {
-      fs::create_symlink(TextOfLink(original), copy);
-    } else if (mknod(copy.c_str(), S_IFREG | (info.st_mode & ACCESSPERMS), 0) != 0) {
-      throw SystemFailure("cannot copy", special, errno);
+    Device::FileDescriptor folder = FolderIn(mirror.Get(), ".");
+    const size_t slash = special.rfind('/');
+    if (slash != std::string::npos) {
+      Device::ForEachPart(special.substr(0, slash), "/", [&](std::string_view part) {
+        folder = FolderIn(folder.Get(), std::string(part));
+      });
+    }
+    const std::string name = special.substr(slash + 1);
+    const bool is_copied =
+        S_ISLNK(info.st_mode)
+            ? symlinkat(TextOfLink(original).c_str(), folder.Get(), name.c_str()) == 0
+            : mknodat(folder.Get(), name.c_str(), S_IFREG | (info.st_mode & ACCESSPERMS), 0) == 0;
+    if (!is_copied) {
+      throw SystemFailure(kCannotCopy, special, errno);
     }
     const timespec times[] = {info.st_atim, info.st_mtim};
-    utimensat(AT_FDCWD, copy.c_str(), times, AT_SYMLINK_NOFOLLOW);
+    utimensat(folder.Get(), name.c_str(), times, AT_SYMLINK_NOFOLLOW);
   }
-  return Device::OpenBelow(work_folder, Device::kWorkMirror, O_PATH | O_DIRECTORY);
+  return mirror;
 }
 
 }  // namespace Archiver

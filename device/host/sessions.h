@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <map>
 #include <string>
+#include <utility>
 
 namespace Device {
 
@@ -29,8 +30,7 @@ bool IsPassword(const std::string& user, const std::string& password);
 
 // Slows down who tries passwords: after ten wrong ones in a row the sign-in under that name is open
 // to that client again only after a while, which doubles each time; others, the user among them, do
-// not notice. It does not know which names there are: names share so many counts, each by its hash,
-// that made-up ones take no room.
+// not notice. It does not know which names there are, and keeps so many counts at the most.
 class SignInGate {
  public:
   using Clock = std::chrono::steady_clock;
@@ -39,7 +39,7 @@ class SignInGate {
   std::chrono::seconds Try(const std::string& user, const std::string& client,
                            Clock::time_point now);
   void Succeeded(const std::string& user, const std::string& client) {
-    tries_.erase(CountOf(user, client));
+    tries_.erase(Counted(user, client));
   }
 
  private:
@@ -47,9 +47,10 @@ class SignInGate {
     int count = 0;
     Clock::time_point open_again;
   };
-  static std::size_t CountOf(const std::string& user, const std::string& client);
+  using Pair = std::pair<std::string, std::string>;  // the client and the name
+  static Pair Counted(const std::string& user, const std::string& client);
 
-  std::map<std::size_t, Tries> tries_;
+  std::map<Pair, Tries> tries_;
 };
 
 }  // namespace Device
