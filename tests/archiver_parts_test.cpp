@@ -7,12 +7,15 @@
 #include "device/archiver/list_file.h"
 #include "device/archiver/output_of_7z.h"
 #include "device/archiver/program.h"
+#include "device/archiver/special_files.h"
 #include "device/archiver/switches.h"
 #include "device/base/code_page.h"
 #include "tests/programs.h"
 
 namespace Archiver {
 namespace {
+
+namespace fs = std::filesystem;
 
 TEST(CommandLine, RefusesWhatNoCallerSends) {
   for (const char* arguments : {"", "x /a @l", "a rel @l", "a @l", "a /a", "a /a @l -mx",
@@ -83,6 +86,21 @@ TEST(OutputParser, ReadsTheSameEventsHoweverTheOutputIsCut) {
   }
 }
 
+// A name that is a link when it is mirrored, and a folder when what is in it is.
+TEST(SpecialFiles, AreNotMadeBehindALink) {
+  const TempFolder temp;
+  for (const char* folder : {"/share", "/work"}) {
+    fs::create_directory(temp.Path() + folder);
+  }
+  const Device::FileDescriptor work(open((temp.Path() + "/work").c_str(), O_PATH));
+  const WorkPlace place{Device::FileDescriptor(open((temp.Path() + "/share").c_str(), O_PATH)), {}};
+  fs::create_symlink("/tmp", temp.Path() + "/share/a");
+  MirrorSpecials(place, {"a"}, work.Get());
+  fs::remove(temp.Path() + "/share/a");
+  WriteFile(temp.Path() + "/share/a/x", "");
+  EXPECT_THROW(MirrorSpecials(place, {"a/x"}, work.Get()), Failure);
+}
+
 TEST(CodePage, ConvertsOnlyWhatComesBackUnchanged) {
   const struct {
     const char *page, *utf8, *bytes;
@@ -131,8 +149,6 @@ TEST(Run7z, TellsCauseAndObjectInOneLine) {
     Device::ProgramStart start;
     start.program = *row.script == '/' ? row.script : "/bin/sh";
     start.arguments = {start.program, "-c", row.script};
-    const Device::FileDescriptor root(open("/", O_PATH | O_DIRECTORY | O_CLOEXEC));
-    start.folder = root.Get();
     try {
       Run7z(start, {"left out"}, report, [](const std::string& /*output*/) {});
       ADD_FAILURE() << "succeeded: " << row.script;

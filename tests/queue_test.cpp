@@ -192,14 +192,4 @@ TEST_F(QueueTest, WhoStopsAWorkerKeepsNobodysJobWaiting) {
   EXPECT_TRUE(Finish(job));
 }
 
-TEST_F(QueueTest, KillingAllLeavesAnEmptyQueue) {
-  for (const Job& job : {Start(), Start(), Start()}) {
-    kill(job.worker, SIGKILL);
-  }
-  const Job job = Start();
-  EXPECT_TRUE(IsAtWork(job));
-  EXPECT_TRUE(Finish(job));
-  EXPECT_TRUE(Device::WaitingWorkers().empty());
-}
-
 }  // namespace
