@@ -84,6 +84,7 @@ TEST(OutputParser, ReadsTheSameEventsHoweverTheOutputIsCut) {
     EXPECT_EQ(found, "T5000000000 P0 P7 Fa/50% P84 F1 + b P85 Fc\b\b/d\b P99 P3 ")
         << "in steps of " << step;
   }
+  EXPECT_THROW(OutputParser().Feed("\nWARNINGS:\nHeaders Error\n"), Failure);
 }
 
 // A name that is a link when it is mirrored, and a folder when what is in it is.

@@ -121,7 +121,7 @@ bool IsReadable(zip_file_t* member) {
 // Throws when a member is protected by another password, or by one where none is given: new members
 // would lie under another password than the old ones, or in clear beside them.
 void CheckMembers(const std::string& archive, const std::string& password) {
-  const Zip zip = Open(archive, ZIP_RDONLY | ZIP_CHECKCONS);
+  const Zip zip = Open(archive, ZIP_RDONLY);
   std::optional<zip_stat_t> smallest;
   for (zip_int64_t i = zip_get_num_entries(zip.get(), 0); --i >= 0;) {
     zip_stat_t member{};

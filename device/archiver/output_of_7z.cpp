@@ -12,6 +12,7 @@ namespace {
 
 constexpr char kWipe = '\b';
 constexpr char kTotal[] = "Add new data to archive: ";
+constexpr char kDamaged[] = "Headers Error";  // among the warnings about the old archive
 
 // The number that ends right before `end`; false when there is none.
 bool NumberBefore(std::string_view text, size_t end, uint64_t* number) {
@@ -124,6 +125,10 @@ size_t OutputParser::TakeProgress(std::string_view line, std::vector<Event>* eve
 }
 
 void OutputParser::TakeLine(const std::string& line, std::vector<Event>* events) {
+  // It would go on: members that it has not found are kept beside new ones of their names.
+  if (line == kDamaged) {
+    throw Failure("cannot update the archive: its headers contradict each other");
+  }
   uint64_t bytes = 0;
   if (line.compare(0, std::strlen(kTotal), kTotal) == 0 &&
       NumberBefore(line, line.find(" byte"), &bytes)) {

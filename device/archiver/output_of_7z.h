@@ -23,7 +23,8 @@ struct Event {
 // but costs a job of many small files a twentieth of its time.
 class OutputParser {
  public:
-  // Takes the next bytes, however they were cut, and returns what they complete.
+  // Takes the next bytes, however they were cut, and returns what they complete. Throws Failure
+  // when 7z finds the old archive damaged.
   std::vector<Event> Feed(const std::string& bytes);
 
  private:
