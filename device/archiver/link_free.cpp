@@ -38,22 +38,22 @@ int OpenLinkFree(int folder, const char* path, int flags, mode_t mode) {
 }
 
 int OpenStaged(const char* path, int flags, mode_t mode) {
-  char first[NAME_MAX + 1];
+  // One path is mostly of the same share as the path before.
+  static thread_local char first[NAME_MAX + 1];
+  static thread_local int share = -1;
   const size_t length = strcspn(path, "/");
   if (length > NAME_MAX) {
     errno = ENAMETOOLONG;
     return -1;
   }
-  memcpy(first, path, length);
-  first[length] = '\0';
-  const int share = openat(AT_FDCWD, first, O_PATH | O_DIRECTORY | O_CLOEXEC);
-  if (share < 0) {
-    return -1;
+  if (share < 0 || strncmp(path, first, length) != 0 || first[length] != '\0') {
+    Close(share);
+    memcpy(first, path, length);
+    first[length] = '\0';
+    share = openat(AT_FDCWD, first, O_PATH | O_DIRECTORY | O_CLOEXEC);
   }
   const char* const rest = path + length + strspn(path + length, "/");
-  const int opened = OpenLinkFree(share, *rest == '\0' ? "." : rest, flags, mode);
-  Close(share);
-  return opened;
+  return share < 0 ? -1 : OpenLinkFree(share, *rest == '\0' ? "." : rest, flags, mode);
 }
 
 int Open(int folder, const char* path, int flags, mode_t mode) {
