@@ -157,7 +157,7 @@ std::vector<std::string> MemorySwitches(const Request& request, std::uint64_t me
     return {};  // takes little
   }
   const auto processors = static_cast<unsigned int>(sysconf(_SC_NPROCESSORS_ONLN));
-  const std::vector<std::string> switches = SwitchesWithin(memory, request.level, processors);
+  std::vector<std::string> switches = SwitchesWithin(memory, request.level, processors);
   std::string text;
   for (const std::string& each : switches) {
     text += " " + each;
