@@ -20,6 +20,7 @@
 #include "device/archiver/command_line.h"
 #include "device/archiver/failure.h"
 #include "device/archiver/job.h"
+#include "device/archiver/link_free.h"
 #include "device/archiver/list_file.h"
 #include "device/archiver/old_archive.h"
 #include "device/archiver/output_of_7z.h"
@@ -36,9 +37,6 @@
 
 namespace Archiver {
 namespace {
-
-constexpr char kZipProgram[] = "kavo-zip";
-constexpr char kLinkFree[] = "kavo-link-free.so";
 
 std::vector<std::string> Sources(const Request& request) {
   std::vector<std::string> sources =
@@ -104,7 +102,7 @@ void Pack(Job& job, PackRun run, const Device::FileDescriptor& folder) {
   if (Device::Fence::IsSupported()) {
     start.environment = {"LD_PRELOAD=" + Device::PathOf(job.link_free)};
     if (run.follow_links) {
-      start.environment.emplace_back("KAVO_STAGED=1");
+      start.environment.push_back(std::string(kStagedVariable) + "=1");
     }
   }
   OutputParser parser;
@@ -220,8 +218,8 @@ std::optional<Device::ArchiverCall> CallOfDevice() {
 Device::ArchiverCall CallByHand() {
   return {{},
           Device::NewWorkFolderName(),
-          Device::OpenBesideProgram(kZipProgram, O_PATH).Release(),
-          Device::OpenBesideProgram(kLinkFree, O_PATH).Release(),
+          Device::OpenBesideProgram(Device::kZipProgramName, O_PATH).Release(),
+          Device::OpenBesideProgram(Device::kLinkFreeName, O_PATH).Release(),
           std::numeric_limits<std::uint64_t>::max(),
           {}};
 }

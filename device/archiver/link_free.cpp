@@ -3,8 +3,10 @@
 // on the way, and one at its end is looked at itself, so that 7z finds nothing but what bears the
 // name. Absolute paths are the archiver's own, through /proc/self/fd, or the system's.
 //
-// In a staging folder (KAVO_STAGED is set) the first part of a path is one of the folder's own
+// In a staging folder (kStagedVariable is set) the first part of a path is one of the folder's own
 // links.
+#include "device/archiver/link_free.h"
+
 #include <dirent.h>
 #include <dlfcn.h>
 #include <fcntl.h>
@@ -60,7 +62,7 @@ int Open(int folder, const char* path, int flags, mode_t mode) {
   if (*path == '/') {
     return openat64(folder, path, flags, mode);
   }
-  return folder == AT_FDCWD && getenv("KAVO_STAGED") != nullptr
+  return folder == AT_FDCWD && getenv(Archiver::kStagedVariable) != nullptr
              ? OpenStaged(path, flags, mode)
              : OpenLinkFree(folder, path, flags, mode);
 }

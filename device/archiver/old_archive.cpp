@@ -43,7 +43,7 @@ bool RunZip(const Job& job, const std::string& command, const std::string& archi
   const Device::FileDescriptor password = UnnamedFile(job.request.password);
   Device::ProgramStart start = ProgramOf(job);
   start.program = Device::PathOf(job.zip_program);
-  start.arguments = {"kavo-zip", command, archive, job.request.code_page};
+  start.arguments = {Device::kZipProgramName, command, archive, job.request.code_page};
   start.input = password.Get();
   std::string reason;
   const int status = RunProgram(

@@ -15,6 +15,10 @@
 
 namespace Device {
 
+// What the archiver needs beside itself: files in its own folder.
+inline constexpr char kZipProgramName[] = "kavo-zip";
+inline constexpr char kLinkFreeName[] = "kavo-link-free.so";
+
 struct ArchiverCall {
   std::string password;                    // empty for none
   std::string work_folder;                 // name of the hidden folder to make beside the target

@@ -12,6 +12,7 @@
 #include <memory>
 #include <stdexcept>
 
+#include "device/base/archiver_call.h"
 #include "device/base/file_io.h"
 #include "device/base/open_below.h"
 
@@ -22,8 +23,6 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr char kArchiverName[] = "kavo-7z";
-constexpr char kZipProgramName[] = "kavo-zip";
-constexpr char kLinkFreeName[] = "kavo-link-free.so";
 constexpr char kModuleName[] = "KAVO.Zantro.Compress.so";
 
 std::unique_ptr<OpenDevice>& Instance() {

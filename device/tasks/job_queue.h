@@ -41,7 +41,7 @@ std::size_t MostJobs();
 std::uint64_t MemoryOfJob();
 
 // False when so many of the user's jobs wait or run that no further one may come: 256, fewer before
-// one whose request takes more than half a MiB of memory, such as 20 before one of 6 MiB.
+// one whose request takes more than half a MiB of memory, such as 21 before one of 6 MiB.
 bool MayEnterQueue(uid_t user);
 
 // To be called in this order, once in a worker's process: takes a place behind all others, and
